@@ -1,0 +1,17 @@
+# Turns exports.txt (one symbol a line: a C name, or a demangled C++ signature) into a linker
+# version script that exports exactly those symbols.
+file(STRINGS ${IN} lines)
+set(c_names "")
+set(cxx_names "")
+foreach(line IN LISTS lines)
+  string(STRIP "${line}" line)
+  if(line STREQUAL "" OR line MATCHES "^#")
+    continue()
+  endif()
+  if(line MATCHES "[(:]")
+    string(APPEND cxx_names "      \"${line}\";\n")
+  else()
+    string(APPEND c_names "    ${line};\n")
+  endif()
+endforeach()
+file(WRITE ${OUT} "NORVO_0 {\n  global:\n${c_names}    extern \"C++\" {\n${cxx_names}    };\n  local: *;\n};\n")

@@ -1,0 +1,7 @@
+// The whole interface of libnorvo.
+#pragma once
+#include "norvo/errors.h"
+#include "norvo/norvodir.h"
+#include "norvo/norvomisc.h"
+#include "norvo/nvoman.h"
+#include "norvo/pathinfo.h"

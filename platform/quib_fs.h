@@ -1,0 +1,96 @@
+// File systems: type of the file system holding a path, the mount table, volumes, the
+// platform's hidden names, directory creation and ACL permission masks.
+#pragma once
+#include <sys/types.h>
+#include "platform_export.h"
+
+// Indexes into rgszFsType, and the two values outside the table.
+enum {
+    FSTYPE_EXT4 = 0,
+    FSTYPE_FAT = 1,
+    FSTYPE_EXT3 = 2,
+    FSTYPE_BTRFS = 3,
+    FSTYPE_TMPFS = 4,
+    FSTYPE_XFS = 5,
+    FSTYPE_EXFAT = 6,
+    FSTYPE_ISO = 7,     // disk images
+    FSTYPE_REMOTE = 8,  // network file systems
+    FSTYPE_NOT_MOUNT_POINT = 10,
+    FSTYPE_UNKNOWN = 11,
+};
+
+#define QUIB_FSTYPE_COUNT 9
+#define QUIB_FSTYPE_NAME_LEN 10
+
+// Volume kinds reported by VolumePathParse.
+enum {
+    VOLUME_KIND_INTERNAL = 1,  // /volumeN
+    VOLUME_KIND_USB = 4,       // /volumeUSBN
+    VOLUME_KIND_ESATA = 8,     // /volumeSATAN
+};
+
+typedef struct _tag_VOLUME_INFO_ {
+    char szVolumePath[64];  // e.g. /volume1
+    int kind;               // VOLUME_KIND_*
+} VOLUME_INFO, *PVOLUME_INFO;
+
+// ACL permission bits of QUIBACLPermGet.
+enum {
+    ACL_PERM_EXECUTE = 0x0001,
+    ACL_PERM_WRITE = 0x0002,
+    ACL_PERM_READ = 0x0004,
+    ACL_PERM_APPEND = 0x0008,
+    ACL_PERM_READ_XATTR = 0x0010,
+    ACL_PERM_WRITE_XATTR = 0x0020,
+    ACL_PERM_DELETE_CHILD = 0x0040,
+    ACL_PERM_READ_ATTR = 0x0080,
+    ACL_PERM_WRITE_ATTR = 0x0100,
+    ACL_PERM_DELETE = 0x0200,
+    ACL_PERM_READ_ACL = 0x0400,
+    ACL_PERM_WRITE_ACL = 0x0800,
+    ACL_PERM_CHANGE_OWNER = 0x1000,
+    ACL_PERM_ALL = 0x1FFF,
+};
+
+QUIB_BEGIN_C
+
+// The platform's table of file-system type names, indexed by FSTYPE_*.
+QUIB_API extern const char rgszFsType[QUIB_FSTYPE_COUNT][QUIB_FSTYPE_NAME_LEN];
+
+// Type index of the file system holding path (from statfs and the mount table).
+// With flags 0 any path; with flags 1 only a mount directory (FSTYPE_NOT_MOUNT_POINT otherwise).
+// -1 with errno set when path can't be examined.
+QUIB_API int QUIBGetFSType(const char *path, int flags);
+// Type index of the mount that holds path (the deepest mount directory that is path or a
+// parent of it), from /proc/self/mounts; -1 when no mount holds it.
+QUIB_API int QUIBFSIsInMountTable(const char *path);
+// 1 for a network file system index, else 0.
+QUIB_API int QUIBFSIsRemoteFS(int fstype);
+// 1 for a disk-image file system index, else 0.
+QUIB_API int QUIBFSIsImageFS(int fstype);
+
+// Parses the volume of path: 1 and *info filled when path lies on /volumeN, /volumeUSBN or
+// /volumeSATAN; 0 when it lies on no volume; -1 on bad argument (0x0D00).
+QUIB_API int VolumePathParse(const char *path, PVOLUME_INFO info);
+
+// 1 when name is one of the platform's extended-attribute directories ("@eaDir"), else 0.
+QUIB_API int QUIBEAIsHiddenDir(const char *name);
+// 1 when name is a hidden platform entry no listing shows ("@eaDir", "@tmp", "@sharebin",
+// ".DS_Store", "#snapshot", ...), else 0.
+QUIB_API int QUIBEAIsHiddenFile(const char *name);
+
+// Creates path and its missing parents (when recursive), each new one with mode, uid and gid.
+// 0 on success. -1 on failure with errno set; stopAt (if not null, stopAtSize bytes) receives
+// the path of the component that could not be created.
+QUIB_API int QUIBFSMkdirP(const char *path, char *stopAt, int stopAtSize, int recursive, uid_t uid,
+                          gid_t gid, mode_t mode);
+
+// The ACL_PERM_* mask the effective identity holds on path, judged by the kernel (POSIX ACLs
+// and modes count). 0 on success; -1 with 0x0600 (no such file), 0x0700 (a parent is not a
+// directory), 0x0300 (a parent can't be searched), 0x8400 (read-only fs), 0xD800 (the file
+// system does not support ACLs), 0x0D00 (bad argument), 0x8100 (other).
+QUIB_API int QUIBACLPermGet(const char *path, unsigned int *mask);
+// 1 when the file system holding path supports POSIX ACLs, 0 when not, -1 on failure.
+QUIB_API int QUIBACLIsSupport(const char *path);
+
+QUIB_END_C

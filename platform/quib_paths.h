@@ -1,0 +1,10 @@
+// Where the appliance keeps its settings. The sandbox and a real installation provide them;
+// NORVO_ROOT_PREFIX (environment) is not consulted: the paths are those of the appliance.
+#pragma once
+
+#define QUIB_INFO_CONF "/etc/quibinfo.conf"                  // appliance settings
+#define QUIB_INFO_DEFAULTS_CONF "/etc.defaults/quibinfo.conf" // factory defaults
+#define QUIB_SHARE_CONF "/usr/quib/etc/shares.conf"          // shared folders, smb.conf syntax
+#define QUIB_APP_PRIVILEGE_CONF "/usr/quib/etc/app_privilege.conf"  // application privileges
+#define QUIB_LOGIN_DB "/tmp/quib_login.db"                   // login records (SQLite)
+#define QUIB_ADMIN_GROUP "administrators"

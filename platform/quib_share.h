@@ -1,0 +1,53 @@
+// Shared folders, read from QUIB_SHARE_CONF (format in platform/README.md).
+#pragma once
+#include "platform_export.h"
+#include "vlibc_szlist.h"
+
+// Share status flags.
+enum {
+    SHARE_STATUS_HIDDEN = 0x1,     // "browseable = no": kept out of share lists
+    SHARE_STATUS_ENCRYPTED = 0x2,  // "encrypted = yes"
+};
+
+// Share restriction flags (reported to non-administrators only).
+enum {
+    SHARE_RESTRICT_NO_BROWSE = 0x1,    // "disable browsing = yes": no listing, no download
+    SHARE_RESTRICT_NO_MODIFY = 0x2,    // "disable modify = yes"
+    SHARE_RESTRICT_NO_DOWNLOAD = 0x4,  // "disable download = yes"
+};
+
+typedef struct _tag_QUIBSHARE_ {
+    char *szName;
+    char *szPath;          // the share's real path, e.g. /volume1/photo
+    char *szComment;
+    char *szNoAccessList;  // comma-separated users and @groups
+    char *szRWList;
+    char *szROList;
+    unsigned int fStatus;    // SHARE_STATUS_*
+    unsigned int fRestrict;  // SHARE_RESTRICT_*
+    int ftpPrivilege;        // 0 none, 1 read-only, 2 read-write
+    int blAclMode;           // 1 when the share uses ACL permissions
+} QUIBSHARE, *PQUIBSHARE;
+
+typedef struct _tag_QUIBSHARE_DB_ QUIBSHARE_DB, *PQUIBSHARE_DB;
+
+QUIB_BEGIN_C
+
+// Looks the share up by name (case-insensitive, as SMB share names are).
+// 0 and *pshare set (free with QUIBShareFree); -1 with 0x1400 when there is no such share,
+// 0x0900 when the configuration can't be read, 0x0D00 on bad argument.
+QUIB_API int QUIBShareGet(const char *name, PQUIBSHARE *pshare);
+QUIB_API void QUIBShareFree(PQUIBSHARE share);
+
+// A cursor over every share in file order. Open returns null on failure (error set).
+QUIB_API PQUIBSHARE_DB QUIBShareDBOpen(void);
+// 0 with *pshare refilled (the previous record passed in is freed or reused), 1 at the end,
+// -1 on failure. Start with *pshare == NULL; free the last record with QUIBShareFree.
+QUIB_API int QUIBShareDBCursorGet(PQUIBSHARE_DB db, PQUIBSHARE *pshare);
+QUIB_API void QUIBShareDBClose(PQUIBSHARE_DB db);
+
+// 1 when user is named in list (comma-separated; names compare case-insensitively; "@group"
+// entries match members of that group, through NSS), 0 when not, -1 on bad argument.
+QUIB_API int BlSDKUserIsInList(const char *user, const char *list);
+
+QUIB_END_C

@@ -1,0 +1,71 @@
+// Users and groups through NSS (so winbind and sssd accounts count), the administrators
+// group, account expiry from shadow, the home service, and application privileges.
+#pragma once
+#include <sys/types.h>
+#include "platform_export.h"
+#include "vlibc_szlist.h"
+
+// Account kinds, told by the name: "DOMAIN\user" is a domain account, "user@realm" a
+// directory (LDAP) account, anything else local.
+typedef enum _tag_AUTH_TYPE_ {
+    AUTH_LOCAL = 1,
+    AUTH_DOMAIN = 2,
+    AUTH_LDAP = 4,
+    AUTH_ALL = 7,
+} AUTH_TYPE;
+
+typedef struct _tag_QUIBUSER_ {
+    char *szName;
+    uid_t nUID;
+    gid_t nGID;     // primary group
+    char *szGecos;
+    char *szHome;   // home directory as NSS gives it
+    char *szShell;
+    AUTH_TYPE authType;
+} QUIBUSER, *PQUIBUSER;
+
+typedef struct _tag_QUIBGROUP_ {
+    char *szName;
+    gid_t nGID;
+    PSZLIST pMembers;  // explicit members (not users whose primary group this is)
+} QUIBGROUP, *PQUIBGROUP;
+
+QUIB_BEGIN_C
+
+// The kind of account a name denotes (AUTH_LOCAL, AUTH_DOMAIN or AUTH_LDAP).
+QUIB_API AUTH_TYPE QUIBUserAuthTypeOf(const char *name);
+
+// 0 and *puser (free with QUIBUserFree); -1 with 0x1D00 when unknown, 0x0D00 on bad argument,
+// 0x8100 when NSS fails.
+QUIB_API int QUIBUserGet(const char *name, PQUIBUSER *puser);
+QUIB_API int QUIBUserGetByUID(uid_t uid, PQUIBUSER *puser, int blNoCache);
+QUIB_API void QUIBUserFree(PQUIBUSER user);
+// 0 with the ids; -1 with 0x1D00 when the user is unknown.
+QUIB_API int QUIBUserGetUGID(const char *name, uid_t *uid, gid_t *gid);
+// 1 expired (shadow's expiry date has passed), 0 not (or no shadow entry), -1 on failure.
+QUIB_API int QUIBUserIsExpired(const char *name);
+
+QUIB_API int QUIBGroupGet(const char *name, PQUIBGROUP *pgroup);
+QUIB_API int QUIBGroupGetByGID(gid_t gid, PQUIBGROUP *pgroup, int blNoCache);
+QUIB_API int QUIBGroupGetGID(const char *name, gid_t *gid);
+QUIB_API void QUIBGroupFree(PQUIBGROUP group);
+// 1 when user belongs to group (primary or supplementary, via getgrouplist), 0 not, -1 failure.
+QUIB_API int QUIBGroupIsMember(const char *group, const char *user);
+
+// 1 when user is a member of the administrators group, 0 not, -1 failure (0x1D00 when the
+// user is unknown).
+QUIB_API int QUIBGroupIsAdminGroupMem(const char *user);
+// As above; with blWithDomain 0 only local accounts can be administrators, with 1 domain and
+// directory accounts count too.
+QUIB_API int QUIBGroupIsAdminGroupMemEx(const char *user, int blWithDomain);
+
+// 1 when the home service is on for this user's kind of account and the user's home lies below
+// the homes root, 0 when not.
+QUIB_API int QUIBServiceUserHomeIsEnabled(const PQUIBUSER user);
+// The homes root ("/volume1/homes") into buf. 0 on success, -1 when the service is off or unset.
+QUIB_API int QUIBServiceHomePathGet(char *buf, int size);
+
+// 1 when user holds the application privilege priv (see platform/README.md), 0 when not.
+QUIB_API int VLIBUserPrivilegeHas(const char *user, const char *priv);
+
+QUIB_END_C

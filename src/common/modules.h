@@ -1,0 +1,9 @@
+// The source names that lead every log line and platform error of a module.
+#pragma once
+
+namespace norvo {
+inline constexpr char kNorvoDir[] = "norvodir.cpp";
+inline constexpr char kNvoMan[] = "nvoman.cpp";
+inline constexpr char kNorvoMisc[] = "norvomisc.cpp";
+inline constexpr char kNorvoEnum[] = "norvoenum.cpp";
+}  // namespace norvo
