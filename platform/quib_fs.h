@@ -64,6 +64,10 @@ QUIB_API int QUIBGetFSType(const char *path, int flags);
 // Type index of the mount that holds path (the deepest mount directory that is path or a
 // parent of it), from /proc/self/mounts; -1 when no mount holds it.
 QUIB_API int QUIBFSIsInMountTable(const char *path);
+// Type index of a mount-table type name ("ext4", "fuse.sshfs", ...; aliases in
+// platform/README.md); source (may be null) names the driver of FUSE mounts without subtype.
+// FSTYPE_UNKNOWN when the name is of no known family; -1 (0x0D00) when type is null.
+QUIB_API int QUIBFSTypeFromName(const char *type, const char *source);
 // 1 for a network file system index, else 0.
 QUIB_API int QUIBFSIsRemoteFS(int fstype);
 // 1 for a disk-image file system index, else 0.
@@ -75,20 +79,24 @@ QUIB_API int VolumePathParse(const char *path, PVOLUME_INFO info);
 
 // 1 when name is one of the platform's extended-attribute directories ("@eaDir"), else 0.
 QUIB_API int QUIBEAIsHiddenDir(const char *name);
-// 1 when name is a hidden platform entry no listing shows ("@eaDir", "@tmp", "@sharebin",
-// ".DS_Store", "#snapshot", ...), else 0.
+// 1 when name is an entry no listing or walk shows: ".", "..", "@eaDir", "@tmp", "@sharebin",
+// "#snapshot", ".DS_Store"; else 0 (also for null).
 QUIB_API int QUIBEAIsHiddenFile(const char *name);
 
-// Creates path and its missing parents (when recursive), each new one with mode, uid and gid.
-// 0 on success. -1 on failure with errno set; stopAt (if not null, stopAtSize bytes) receives
-// the path of the component that could not be created.
+// Creates path and its missing parents (when recursive), each new one owned by uid:gid
+// ((uid_t)-1 or (gid_t)-1 keep the creator's) with exactly mode (umask does not apply);
+// existing directories, and links to them, are left untouched. 0 on success. -1 on failure
+// with errno and the error slot set; stopAt (if not null, stopAtSize bytes) receives the path
+// of the component that could not be created (EEXIST: it is not a directory).
 QUIB_API int QUIBFSMkdirP(const char *path, char *stopAt, int stopAtSize, int recursive, uid_t uid,
                           gid_t gid, mode_t mode);
 
-// The ACL_PERM_* mask the effective identity holds on path, judged by the kernel (POSIX ACLs
-// and modes count). 0 on success; -1 with 0x0600 (no such file), 0x0700 (a parent is not a
-// directory), 0x0300 (a parent can't be searched), 0x8400 (read-only fs), 0xD800 (the file
-// system does not support ACLs), 0x0D00 (bad argument), 0x8100 (other).
+// The ACL_PERM_* mask the effective identity holds on path (a final link is not followed),
+// judged by the kernel (POSIX ACLs and modes count). 0 and *mask on success; -1 with 0x0600
+// (no such file), 0x0700 (a parent is not a directory), 0x0300 (a parent can't be searched),
+// 0xD800 (the file system does not support ACLs), 0x0D00 (bad argument), 0xC300 (path of
+// 4096 bytes or more), 0x8100 (other, EIO among them). A read-only file system is no error:
+// its mask lacks the writing bits.
 QUIB_API int QUIBACLPermGet(const char *path, unsigned int *mask);
 // 1 when the file system holding path supports POSIX ACLs, 0 when not, -1 on failure.
 QUIB_API int QUIBACLIsSupport(const char *path);

@@ -28,6 +28,9 @@ const char *TailAfterShare(const char *path, const char *share) {
 
 int NvoLibTransFullPath(const char *path, char *out, int size) {
     if (path == nullptr || out == nullptr || size <= 0) {
+        if (out != nullptr && size > 0) {
+            out[0] = '\0';  // the log prints it
+        }
         NVO_SET_QUIB_ERR(kNorvoDir, QUIB_ERR_BAD_PARAMETER);
         NVO_LOG(kNorvoDir, "%s(%d) bad parameter, oldpath=%s, new path=%s", norvo::OrNull(path),
                 norvo::OrNull(out));

@@ -7,6 +7,7 @@
 #include <sys/types.h>
 
 #include <functional>
+#include <ostream>
 #include <string>
 #include <vector>
 
@@ -43,9 +44,18 @@ struct ShareSpec {
 
 // One captured syslog line.
 struct LogLine {
-    int priority;      // LOG_ERR, ...
-    std::string text;  // the formatted message
+    int priority;      // LOG_ERR, ...; -1 for a datagram not in syslog form (text is all of it)
+    std::string text;  // the formatted message, without timestamp and ident
 };
+
+inline bool operator==(const LogLine &a, const LogLine &b) {
+    return a.priority == b.priority && a.text == b.text;
+}
+inline bool operator!=(const LogLine &a, const LogLine &b) { return !(a == b); }
+// Readable in test failure messages.
+inline void PrintTo(const LogLine &line, std::ostream *out) {
+    *out << "{" << line.priority << ", \"" << line.text << "\"}";
+}
 
 class Appliance {
 public:
@@ -77,10 +87,14 @@ public:
     Appliance &SetDirectory(const std::string &server);
     // key="value" into /etc/quibinfo.conf.
     Appliance &SetSetting(const std::string &key, const std::string &value);
+    // key="value" into /etc.defaults/quibinfo.conf (the factory defaults).
+    Appliance &SetDefaultSetting(const std::string &key, const std::string &value);
     // Grants an application privilege to a comma-separated list of users and @groups.
     Appliance &SetAppPrivilege(const std::string &privilege, const std::string &holders);
 
-    // Files with owner and mode; parents are created as root:root 0755 when missing.
+    // Files with owner ("user", group: the user's primary; or "user:group") and exactly mode;
+    // parents are created as root:root 0755 when missing. An existing file or directory is
+    // overwritten or kept, and takes the owner and mode.
     Appliance &WriteFile(const std::string &path, const std::string &content = "",
                          const std::string &owner = "root", mode_t mode = 0644);
     Appliance &MakeDir(const std::string &path, const std::string &owner = "root", mode_t mode = 0755);
@@ -95,17 +109,27 @@ public:
     // and the platform classes its type as remote.
     Appliance &MountDeadRemote(const std::string &path);
 
-    // Every syslog line received so far, in order; Clear forgets them.
+    // Every syslog line received so far, in order; Clear forgets them. Lines logged by any
+    // process of the appliance count, whatever its identity. Call from the test's own process
+    // only (not inside RunAs).
     std::vector<LogLine> Logs();
     void ClearLogs();
+    // From now on each line goes to sink as it arrives (on the capture's own thread) instead of
+    // being kept for Logs(); lines kept so far are passed first. For long runs (the
+    // norvo-sandbox command, benchmarks).
+    void ForwardLogs(std::function<void(const LogLine &)> sink);
     // The error-level lines with the source line numbers replaced by "#": "norvodir.cpp:# x" and
     // "nvoman.cpp(#) y", so tests can compare whole messages.
     std::vector<std::string> ErrorLines();
 
     // Runs fn in a child process whose real and effective identity is user's (initgroups,
-    // setgid, setuid) and returns fn's result (or -1000 - signal when the child died).
+    // setgid, setuid) and returns fn's result, which must lie in -100..100 (it travels as the
+    // exit status; others are clamped to that range), or -1000 - signal when the child died
+    // (an abort gives -1006). Test assertions made inside fn are lost with the child: return a
+    // value and check it in the parent. Aborts when user is not an appliance user.
     int RunAs(const std::string &user, const std::function<int()> &fn);
 
+    // The ids the appliance gave; aborts when the name is unknown.
     uid_t Uid(const std::string &user) const;
     gid_t Gid(const std::string &group) const;
 

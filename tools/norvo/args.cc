@@ -1,0 +1,155 @@
+#include "args.h"
+
+#include <string.h>
+
+namespace norvo::cli {
+namespace {
+
+ParseOutcome UsageError(const CommandSpec *command, std::string message) {
+    ParseOutcome outcome;
+    outcome.kind = ParseOutcome::kUsageError;
+    outcome.topic = command;
+    outcome.error = std::move(message);
+    return outcome;
+}
+
+ParseOutcome Help(const CommandSpec *command) {
+    ParseOutcome outcome;
+    outcome.kind = ParseOutcome::kHelp;
+    outcome.topic = command;
+    return outcome;
+}
+
+bool IsHelp(const std::string &arg) {
+    return arg == "--help" || arg == "-h";
+}
+
+const OptionSpec *FindOption(const CommandSpec &command, const std::string &name) {
+    for (const OptionSpec &option : command.options) {
+        if (name == option.name) {
+            return &option;
+        }
+    }
+    return nullptr;
+}
+
+// Parses what follows the command name into outcome.invocation.
+ParseOutcome ParseCommandArgs(const CommandSpec &command, bool json, int argc, const char *const *argv, int first) {
+    ParseOutcome outcome;
+    outcome.kind = ParseOutcome::kRun;
+    Invocation &inv = outcome.invocation;
+    inv.command = &command;
+    inv.json = json;
+    bool optionsEnded = false;
+    for (int i = first; i < argc; ++i) {
+        const std::string arg = argv[i];
+        if (optionsEnded || arg == "-" || arg.empty() || arg[0] != '-') {
+            inv.arguments.push_back(arg);
+            continue;
+        }
+        if (arg == "--") {
+            optionsEnded = true;
+            continue;
+        }
+        if (IsHelp(arg)) {
+            return Help(&command);
+        }
+        if (arg.compare(0, 2, "--") != 0) {
+            return UsageError(&command, "unknown option " + arg);
+        }
+        const size_t equals = arg.find('=');
+        const std::string name = arg.substr(2, equals == std::string::npos ? std::string::npos : equals - 2);
+        if (name == "json") {
+            if (equals != std::string::npos) {
+                return UsageError(&command, "option --json takes no value");
+            }
+            inv.json = true;
+            continue;
+        }
+        const OptionSpec *spec = FindOption(command, name);
+        if (spec == nullptr) {
+            return UsageError(&command, "unknown option --" + name);
+        }
+        if (inv.Has(name)) {
+            return UsageError(&command, "option --" + name + " given twice");
+        }
+        if (spec->valueName == nullptr) {
+            if (equals != std::string::npos) {
+                return UsageError(&command, "option --" + name + " takes no value");
+            }
+            inv.options[name] = "";
+            continue;
+        }
+        std::string value;
+        if (equals != std::string::npos) {
+            value = arg.substr(equals + 1);
+        } else if (i + 1 < argc && strncmp(argv[i + 1], "--", 2) != 0) {
+            value = argv[++i];
+        } else {
+            return UsageError(&command, "option --" + name + " needs a value (" + spec->valueName + ")");
+        }
+        if (value.empty()) {
+            return UsageError(&command, "option --" + name + " needs a non-empty value");
+        }
+        inv.options[name] = value;
+    }
+    for (const OptionSpec &option : command.options) {
+        if (option.required && !inv.Has(option.name)) {
+            return UsageError(&command, std::string("option --") + option.name + " is required");
+        }
+    }
+    const size_t wanted = command.arguments.size();
+    if (inv.arguments.size() < wanted) {
+        return UsageError(&command, std::string("missing argument ") + command.arguments[inv.arguments.size()].name);
+    }
+    if (inv.arguments.size() > wanted) {
+        return UsageError(&command, "unexpected argument " + inv.arguments[wanted]);
+    }
+    for (size_t i = 0; i < wanted; ++i) {
+        if (inv.arguments[i].empty()) {
+            return UsageError(&command, std::string("argument ") + command.arguments[i].name + " is empty");
+        }
+    }
+    return outcome;
+}
+
+}  // namespace
+
+ParseOutcome ParseCommandLine(int argc, const char *const *argv) {
+    bool json = false;
+    int i = 1;
+    for (; i < argc && argv[i][0] == '-'; ++i) {
+        const std::string arg = argv[i];
+        if (IsHelp(arg)) {
+            return Help(nullptr);
+        }
+        if (arg != "--json") {
+            return UsageError(nullptr, "unknown option " + arg + " (options follow the command)");
+        }
+        json = true;
+    }
+    if (i >= argc) {
+        return UsageError(nullptr, "no command given");
+    }
+    const std::string name = argv[i];
+    if (name == "help") {
+        if (i + 1 >= argc) {
+            return Help(nullptr);
+        }
+        const CommandSpec *topic = FindCommand(argv[i + 1]);
+        if (topic == nullptr) {
+            return UsageError(nullptr, std::string("unknown command ") + argv[i + 1]);
+        }
+        if (i + 2 < argc) {
+            return UsageError(nullptr, std::string("unexpected argument ") + argv[i + 2]);
+        }
+        return Help(topic);
+    }
+    const CommandSpec *command = FindCommand(name);
+    if (command == nullptr) {
+        return UsageError(nullptr, "unknown command " + name);
+    }
+    return ParseCommandArgs(*command, json, argc, argv, i + 1);
+}
+
+}  // namespace norvo::cli

@@ -1,0 +1,14 @@
+// One handler per subcommand; each returns the exit status. The table is in commands.cc.
+#pragma once
+#include "command.h"
+
+namespace norvo::cli {
+
+int RunResolve(const Invocation &inv);     // cmd_paths.cc
+int RunCheckName(const Invocation &inv);   // cmd_paths.cc
+int RunCheckPath(const Invocation &inv);   // cmd_paths.cc
+int RunPrivilege(const Invocation &inv);   // cmd_privilege.cc
+int RunShares(const Invocation &inv);      // cmd_shares.cc
+int RunLogin(const Invocation &inv);       // cmd_login.cc
+
+}  // namespace norvo::cli
