@@ -32,40 +32,49 @@ typedef struct _tag_QUIBGROUP_ {
 
 QUIB_BEGIN_C
 
-// The kind of account a name denotes (AUTH_LOCAL, AUTH_DOMAIN or AUTH_LDAP).
+// The kind of account a name denotes (AUTH_LOCAL, AUTH_DOMAIN or AUTH_LDAP); a backslash wins
+// over "@". AUTH_LOCAL with 0x0D00 for null.
 QUIB_API AUTH_TYPE QUIBUserAuthTypeOf(const char *name);
 
-// 0 and *puser (free with QUIBUserFree); -1 with 0x1D00 when unknown, 0x0D00 on bad argument,
-// 0x8100 when NSS fails.
+// 0 and *puser (free with QUIBUserFree); -1 with 0x1D00 when unknown, 0x0D00 on bad argument
+// (null, empty, over 256 bytes, control characters, invalid UTF-8), 0x8100 when NSS fails.
+// Nothing is cached, so blNoCache changes nothing.
 QUIB_API int QUIBUserGet(const char *name, PQUIBUSER *puser);
 QUIB_API int QUIBUserGetByUID(uid_t uid, PQUIBUSER *puser, int blNoCache);
 QUIB_API void QUIBUserFree(PQUIBUSER user);
-// 0 with the ids; -1 with 0x1D00 when the user is unknown.
+// 0 with the ids (either pointer may be null, not both); -1 with 0x1D00 when the user is unknown.
 QUIB_API int QUIBUserGetUGID(const char *name, uid_t *uid, gid_t *gid);
-// 1 expired (shadow's expiry date has passed), 0 not (or no shadow entry), -1 on failure.
+// 1 expired (today, in days since 1970, is at or past shadow's expiry day; day 0 counts), 0 not
+// (or no shadow entry, as for domain accounts), -1 on failure: 0x1D00 unknown user, 0x0300 when
+// shadow can't be read (callers other than root).
 QUIB_API int QUIBUserIsExpired(const char *name);
 
+// Group lookups, as the user lookups: -1 with 0x1E00 when unknown.
 QUIB_API int QUIBGroupGet(const char *name, PQUIBGROUP *pgroup);
 QUIB_API int QUIBGroupGetByGID(gid_t gid, PQUIBGROUP *pgroup, int blNoCache);
 QUIB_API int QUIBGroupGetGID(const char *name, gid_t *gid);
 QUIB_API void QUIBGroupFree(PQUIBGROUP group);
-// 1 when user belongs to group (primary or supplementary, via getgrouplist), 0 not, -1 failure.
+// 1 when user belongs to group (primary or supplementary, via getgrouplist), 0 not, -1 failure
+// (0x1D00 unknown user, 0x1E00 unknown group).
 QUIB_API int QUIBGroupIsMember(const char *group, const char *user);
 
 // 1 when user is a member of the administrators group, 0 not, -1 failure (0x1D00 when the
-// user is unknown).
+// user is unknown). Domain and directory accounts count (as the Ex call with blWithDomain 1).
 QUIB_API int QUIBGroupIsAdminGroupMem(const char *user);
-// As above; with blWithDomain 0 only local accounts can be administrators, with 1 domain and
-// directory accounts count too.
+// As above; with blWithDomain 0 only local accounts can be administrators (others are 0 without
+// a lookup), with 1 domain and directory accounts count too.
 QUIB_API int QUIBGroupIsAdminGroupMemEx(const char *user, int blWithDomain);
 
 // 1 when the home service is on for this user's kind of account and the user's home lies below
-// the homes root, 0 when not.
+// the homes root (whole components), 0 when not (0x0D00 for a null user). The kind is the
+// record's authType, or told by szName when authType is not one of the three.
 QUIB_API int QUIBServiceUserHomeIsEnabled(const PQUIBUSER user);
-// The homes root ("/volume1/homes") into buf. 0 on success, -1 when the service is off or unset.
+// The homes root ("/volume1/homes") into buf. 0 on success; -1 with 0x0900 when the service is
+// off for every kind of account or the root is unset, 0x0D00 when buf is null or too small.
 QUIB_API int QUIBServiceHomePathGet(char *buf, int size);
 
-// 1 when user holds the application privilege priv (see platform/README.md), 0 when not.
+// 1 when user holds the application privilege priv (see platform/README.md), 0 when not: also
+// for unknown users, a missing file, and on failure (the error slot then says why).
 QUIB_API int VLIBUserPrivilegeHas(const char *user, const char *priv);
 
 QUIB_END_C

@@ -161,7 +161,10 @@ int QUIBACLPermGet(const char *path, unsigned int *mask) {
         if (write == Access::kGranted) {
             // An append-only file takes appends but refuses any other write.
             result |= ACL_PERM_APPEND | ACL_PERM_WRITE_XATTR | (appendOnly ? 0u : static_cast<unsigned int>(ACL_PERM_WRITE));
-            if (S_ISDIR(info.stx_mode) && exec == Access::kGranted && !appendOnly) {
+            // One request for both: an ACL grants only what a single matching group entry
+            // holds, so write and search may each pass alone and fail together.
+            if (S_ISDIR(info.stx_mode) && exec == Access::kGranted && !appendOnly &&
+                Check(path, W_OK | X_OK, AT_SYMLINK_NOFOLLOW) == Access::kGranted) {
                 result |= ACL_PERM_DELETE_CHILD;
             }
         }

@@ -55,8 +55,7 @@ PasswordCheck CheckPassword(const char *user, const char *password, int *err) {
     if (found == nullptr || !IsUsableHash(entry.sp_pwdp)) {
         return PasswordCheck::kRefused;
     }
-    auto data = std::make_unique<struct crypt_data>();
-    memset(data.get(), 0, sizeof *data);
+    auto data = std::make_unique<struct crypt_data>();  // zeroed, as crypt_r requires
     const char *hashed = crypt_r(password, entry.sp_pwdp, data.get());
     // libxcrypt reports failure as null or as a token starting with '*'.
     if (hashed == nullptr || hashed[0] == '*') {

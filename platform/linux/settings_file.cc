@@ -60,15 +60,6 @@ bool IsReadableKey(const char *key) {
     return IsValidUtf8(view) && TrimSpace(view).size() == len;
 }
 
-const SettingsLine *FindEntry(const Lines &lines, std::string_view key, bool ignoreCase) {
-    for (const SettingsLine &line : lines) {
-        if (KeyMatches(line, key, ignoreCase)) {
-            return &line;
-        }
-    }
-    return nullptr;
-}
-
 // Reads and parses a settings file for the readers; false with 0x0900 when it can't be read.
 bool LoadForReading(const char *file, Lines *lines) {
     std::string text;
@@ -323,7 +314,7 @@ int VLIBCFileGetKeyValue(const char *file, const char *key, char *buf, size_t si
         if (!np::LoadForReading(file, &lines)) {
             return -1;
         }
-        const np::SettingsLine *entry = np::FindEntry(lines, key, flags == 1);
+        const np::SettingsLine *entry = np::FindSettingsEntry(lines, key, flags == 1);
         if (entry == nullptr) {
             QUIB_SET_ERR(QUIB_ERR_OPEN_FAILED);
             return 0;
@@ -382,7 +373,7 @@ int VLIBCFileCheckKeyValue(const char *file, const char *key, const char *value,
         if (!np::LoadForReading(file, &lines)) {
             return -1;
         }
-        const np::SettingsLine *entry = np::FindEntry(lines, key, flags == 1);
+        const np::SettingsLine *entry = np::FindSettingsEntry(lines, key, flags == 1);
         if (entry == nullptr) {
             return 0;
         }

@@ -151,4 +151,14 @@ bool KeyMatches(const SettingsLine &line, std::string_view key, bool ignoreCase)
     return ignoreCase ? EqualsIgnoreCase(line.key, key) : line.key == key;
 }
 
+const SettingsLine *FindSettingsEntry(const std::vector<SettingsLine> &lines, std::string_view key,
+                                      bool ignoreCase) {
+    for (const SettingsLine &line : lines) {
+        if (KeyMatches(line, key, ignoreCase)) {
+            return &line;
+        }
+    }
+    return nullptr;
+}
+
 }  // namespace norvo::platform

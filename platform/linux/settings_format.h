@@ -42,4 +42,8 @@ struct SettingsLine {
 // True when the key of line matches key (ignoring ASCII case when ignoreCase).
 [[nodiscard]] bool KeyMatches(const SettingsLine &line, std::string_view key, bool ignoreCase);
 
+// The first entry for key, which is the one readers see; null when absent.
+[[nodiscard]] const SettingsLine *FindSettingsEntry(const std::vector<SettingsLine> &lines,
+                                                    std::string_view key, bool ignoreCase);
+
 }  // namespace norvo::platform

@@ -162,7 +162,7 @@ TEST(UserHome, DisabledServiceAndUncreatableHomes) {
 
     app.ClearLogs();
     app.SetHomeService(true, "/volume1/homes");
-    app.AddUser({.name = "frank", .home = "/volume1/homes/file/frank"});
+    app.AddUser(norvo::testing::UserSpec{.name = "frank", .home = "/volume1/homes/file/frank"});
     app.WriteFile("/volume1/homes/file", "not a directory");
     EXPECT_EQ(NvoUserHomeFullPathGet(home, "frank"), 0);
     EXPECT_EQ(NvoLibGetErr(), 408);
@@ -218,9 +218,9 @@ TEST(HomeDetection, LocalUsersAndNoUser) {
 TEST(HomeDetection, DomainAndDirectoryUsersUseTheirNssHome) {
     Appliance app;
     app.Basic();
-    app.AddUser({.name = "CORP\\dave", .home = "/volume1/homes/@DH-CORP/1/dave"});
-    app.AddUser({.name = "erin@corp.example", .home = "/volume1/homes/@LH-CORP.EXAMPLE/erin"});
-    app.AddUser({.name = "CORP\\nohome", .home = "/var/empty/nohome"});
+    app.AddUser(norvo::testing::UserSpec{.name = "CORP\\dave", .home = "/volume1/homes/@DH-CORP/1/dave"});
+    app.AddUser(norvo::testing::UserSpec{.name = "erin@corp.example", .home = "/volume1/homes/@LH-CORP.EXAMPLE/erin"});
+    app.AddUser(norvo::testing::UserSpec{.name = "CORP\\nohome", .home = "/var/empty/nohome"});
 
     EXPECT_EQ(IsDirUserHome("/homes/@DH-CORP/1/dave/docs", "CORP\\dave"), 1);
     EXPECT_EQ(IsDirUserHome("/homes/@dh-corp/1/DAVE", "CORP\\dave"), 1);

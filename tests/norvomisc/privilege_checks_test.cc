@@ -1,3 +1,4 @@
+#include <stdio.h>
 #include <sys/acl.h>
 #include <sys/mount.h>
 #include <sys/stat.h>
@@ -71,7 +72,9 @@ TEST(AclAccess, RequestBitsAreJudgedForTheCaller) {
 TEST(AclAccess, FileSystemsWithoutAclsLeaveItToTheKernel) {
     Appliance app;
     app.MountFat("/volumeUSB1");
-    app.WriteFile("/volumeUSB1/a.txt", "x");
+    FILE *file = fopen("/volumeUSB1/a.txt", "w");  // FAT keeps no modes to set
+    ASSERT_NE(file, nullptr);
+    fclose(file);
     EXPECT_EQ(ACLAccess("/volumeUSB1/a.txt", 0x1), 0);
     EXPECT_EQ(GetACLPrivilege("/volumeUSB1/a.txt"), 8191u);
     EXPECT_EQ(GetACLPrivilege("/volume1/missing"), 8191u);
@@ -198,7 +201,7 @@ TEST(FileSystems, ExternalDisksMustCarryANativeFileSystem) {
     mkdir("/volumeSATA1", 0755);
     ASSERT_EQ(mount("ramfs", "/volumeSATA1", "ramfs", 0, nullptr), 0);
     EXPECT_EQ(NvoLibFileSystemSupported("/volume1/anything"), 1);
-    EXPECT_EQ(NvoLibFileSystemSupported("/volumeUSB1/a"), 1);
+    EXPECT_EQ(NvoLibFileSystemSupported("/volumeUSB1"), 1);
     EXPECT_EQ(NvoLibFileSystemSupported("/volumeUSB2/a"), 0);
     EXPECT_EQ(NvoLibFileSystemSupported("/volumeSATA1"), 0);
     EXPECT_EQ(NvoLibFileSystemSupported("/srv/x"), 1);

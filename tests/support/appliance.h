@@ -17,7 +17,7 @@ struct UserSpec {
     std::string name;                 // "alice", "CORP\\dave" (domain), "erin@corp.example" (directory)
     uid_t uid = 0;                    // 0: the next free id from 1026 up
     std::string password = "secret";  // hashed into shadow with crypt
-    std::vector<std::string> groups;  // supplementary groups (created if missing)
+    std::vector<std::string> groups;  // supplementary groups (created if missing); primary: "users"
     std::string home;                 // "": <homes root>/<name>
     long expireDay = -1;              // shadow expiry, days since 1970; -1 none
 };
@@ -62,8 +62,10 @@ public:
     // Enters a private mount namespace and builds an empty appliance: tmpfs volumes /volume1 and
     // /volume2 (read-write), private /etc (users root and the "administrators" and "users"
     // groups), /etc.defaults, /usr/quib/etc, /tmp, and the syslog capture on /dev/log.
-    // Call once per process (each test runs in its own). Aborts the test on failure.
+    // One appliance at a time per process (each test runs in its own). Aborts on failure.
     Appliance();
+    // Stops the FUSE servers and returns the process to the mount namespace it came from; the
+    // appliance's namespace and everything in it vanish with its last process.
     ~Appliance();
     Appliance(const Appliance &) = delete;
     Appliance &operator=(const Appliance &) = delete;
@@ -74,7 +76,11 @@ public:
     Appliance &Basic();
 
     Appliance &AddUser(const UserSpec &user);
-    Appliance &AddUser(const std::string &name) { return AddUser(UserSpec{name}); }
+    Appliance &AddUser(const std::string &name) {
+        UserSpec user;
+        user.name = name;
+        return AddUser(user);
+    }
     Appliance &AddGroup(const GroupSpec &group);
     Appliance &AddAdmin(const std::string &name);  // a user in "administrators"
     // Creates the share's directory (mode 0777, root) and its configuration section.

@@ -37,7 +37,7 @@ ChildProcess &ChildProcess::operator=(ChildProcess &&other) noexcept {
     return *this;
 }
 
-ChildProcess ChildProcess::Start(const std::vector<std::string> &argv) {
+ChildProcess ChildProcess::Start(const std::vector<std::string> &argv, bool quiet) {
     // Everything the child needs is prepared before fork: the parent may have threads.
     std::vector<char *> args;
     for (const auto &arg : argv) args.push_back(const_cast<char *>(arg.c_str()));
@@ -53,6 +53,7 @@ ChildProcess ChildProcess::Start(const std::vector<std::string> &argv) {
         if (null >= 0) {
             dup2(null, STDIN_FILENO);
             dup2(null, STDOUT_FILENO);
+            if (quiet) dup2(null, STDERR_FILENO);
         }
         execv(args[0], args.data());
         _exit(127);

@@ -20,9 +20,9 @@ public:
     ChildProcess &operator=(const ChildProcess &) = delete;
     ~ChildProcess() { Stop(); }
 
-    // Starts argv[0] (an absolute path) with argv, stdin and stdout on /dev/null, stderr kept.
-    // Fails (aborts) when it can't fork; an exec failure shows as exit status 127.
-    static ChildProcess Start(const std::vector<std::string> &argv);
+    // Starts argv[0] (an absolute path) with argv, stdin and stdout on /dev/null, and stderr
+    // too when quiet. Fails (aborts) when it can't fork; an exec failure shows as status 127.
+    static ChildProcess Start(const std::vector<std::string> &argv, bool quiet = false);
 
     pid_t pid() const { return pid_; }
     // True and *status (a waitpid status) when the child has ended; false while it runs.

@@ -33,9 +33,12 @@ fuse_operations DeadOperations() {
 
 int main(int argc, char *argv[]) {
     std::vector<char *> args(argv, argv + argc);
+    // Single-threaded: nothing here is worth threads, and libfuse 3.14's multi-threaded loop
+    // warns about its own default thread limit.
+    static char single[] = "-s";
     static char option[] = "-o";
     static char names[] = "fsname=deadremote,subtype=norvo-deadremote";
-    args.insert(args.begin() + 1, {option, names});
+    args.insert(args.begin() + 1, {single, option, names});
     static const fuse_operations ops = DeadOperations();
     return fuse_main(int(args.size()), args.data(), &ops, nullptr);
 }

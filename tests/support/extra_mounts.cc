@@ -84,7 +84,8 @@ ChildProcess MountFat(const std::string &path) {
     }
     RunProgram({mkfs, image});
     MakeDirectory(path, 0, 0, 0755);
-    ChildProcess server = ChildProcess::Start({fusefat, "-f", "-o", "rw+,allow_other", image, path});
+    // fusefat traces every call on stdout and stderr; its failure shows as its exit status.
+    ChildProcess server = ChildProcess::Start({fusefat, "-f", "-o", "rw+,allow_other", image, path}, true);
     WaitForMount(server, path, "fuse.fusefat", "fusefat");
     return server;
 }

@@ -13,6 +13,7 @@
 #include <climits>
 #include <memory>
 #include <string>
+#include <utility>
 
 #include "fail.h"
 #include "fs_util.h"

@@ -42,7 +42,8 @@ std::string ShareFile::Add(const ShareSpec &share) {
     if (added.path.empty()) added.path = added.volume + "/" + added.name;
     for (const std::string *value : {&added.path, &added.comment, &added.noAccess, &added.readWrite,
                                      &added.readOnly})
-        if (value->find('\n') != std::string::npos) Fail("share %s: a value holds a line break", share.name.c_str());
+        if (value->find('\n') != std::string::npos)
+            Fail("share %s: a value holds a line break", share.name.c_str());
     shares_.push_back(added);
     Write();
     return added.path;

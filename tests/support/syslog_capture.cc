@@ -142,15 +142,14 @@ void SyslogCapture::Run() {
 }
 
 void SyslogCapture::DrainLocked() {
-    static char buffer[1 << 16];  // only ever used under mutex_
     for (;;) {
-        const ssize_t n = recv(socket_.get(), buffer, sizeof buffer, MSG_TRUNC);
+        const ssize_t n = recv(socket_.get(), buffer_.data(), buffer_.size(), MSG_TRUNC);
         if (n < 0) {
             if (errno == EINTR) continue;
             if (errno == EAGAIN || errno == EWOULDBLOCK) return;
             FailErrno("can't read the syslog socket");
         }
-        const std::string_view datagram(buffer, std::min(size_t(n), sizeof buffer));
+        const std::string_view datagram(buffer_.data(), std::min(size_t(n), buffer_.size()));
         LogLine line{};
         if (!ParseSyslogDatagram(datagram, &line)) {
             // Kept rather than dropped, so a test sees that something unexpected was logged.

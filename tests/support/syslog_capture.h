@@ -42,6 +42,7 @@ private:
     std::mutex mutex_;
     std::vector<LogLine> lines_;
     std::function<void(const LogLine &)> sink_;
+    std::vector<char> buffer_ = std::vector<char>(1 << 16);  // used under mutex_
     std::thread thread_;
 };
 

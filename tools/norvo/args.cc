@@ -5,7 +5,7 @@
 namespace norvo::cli {
 namespace {
 
-ParseOutcome UsageError(const CommandSpec *command, std::string message) {
+ParseOutcome UsageError(const CommandDef *command, std::string message) {
     ParseOutcome outcome;
     outcome.kind = ParseOutcome::kUsageError;
     outcome.topic = command;
@@ -13,7 +13,7 @@ ParseOutcome UsageError(const CommandSpec *command, std::string message) {
     return outcome;
 }
 
-ParseOutcome Help(const CommandSpec *command) {
+ParseOutcome Help(const CommandDef *command) {
     ParseOutcome outcome;
     outcome.kind = ParseOutcome::kHelp;
     outcome.topic = command;
@@ -24,8 +24,8 @@ bool IsHelp(const std::string &arg) {
     return arg == "--help" || arg == "-h";
 }
 
-const OptionSpec *FindOption(const CommandSpec &command, const std::string &name) {
-    for (const OptionSpec &option : command.options) {
+const OptionDef *FindOption(const CommandDef &command, const std::string &name) {
+    for (const OptionDef &option : command.options) {
         if (name == option.name) {
             return &option;
         }
@@ -34,7 +34,7 @@ const OptionSpec *FindOption(const CommandSpec &command, const std::string &name
 }
 
 // Parses what follows the command name into outcome.invocation.
-ParseOutcome ParseCommandArgs(const CommandSpec &command, bool json, int argc, const char *const *argv, int first) {
+ParseOutcome ParseCommandArgs(const CommandDef &command, bool json, int argc, const char *const *argv, int first) {
     ParseOutcome outcome;
     outcome.kind = ParseOutcome::kRun;
     Invocation &inv = outcome.invocation;
@@ -66,14 +66,14 @@ ParseOutcome ParseCommandArgs(const CommandSpec &command, bool json, int argc, c
             inv.json = true;
             continue;
         }
-        const OptionSpec *spec = FindOption(command, name);
-        if (spec == nullptr) {
+        const OptionDef *option = FindOption(command, name);
+        if (option == nullptr) {
             return UsageError(&command, "unknown option --" + name);
         }
         if (inv.Has(name)) {
             return UsageError(&command, "option --" + name + " given twice");
         }
-        if (spec->valueName == nullptr) {
+        if (option->valueName == nullptr) {
             if (equals != std::string::npos) {
                 return UsageError(&command, "option --" + name + " takes no value");
             }
@@ -86,14 +86,14 @@ ParseOutcome ParseCommandArgs(const CommandSpec &command, bool json, int argc, c
         } else if (i + 1 < argc && strncmp(argv[i + 1], "--", 2) != 0) {
             value = argv[++i];
         } else {
-            return UsageError(&command, "option --" + name + " needs a value (" + spec->valueName + ")");
+            return UsageError(&command, "option --" + name + " needs a value (" + option->valueName + ")");
         }
         if (value.empty()) {
             return UsageError(&command, "option --" + name + " needs a non-empty value");
         }
         inv.options[name] = value;
     }
-    for (const OptionSpec &option : command.options) {
+    for (const OptionDef &option : command.options) {
         if (option.required && !inv.Has(option.name)) {
             return UsageError(&command, std::string("option --") + option.name + " is required");
         }
@@ -136,7 +136,7 @@ ParseOutcome ParseCommandLine(int argc, const char *const *argv) {
         if (i + 1 >= argc) {
             return Help(nullptr);
         }
-        const CommandSpec *topic = FindCommand(argv[i + 1]);
+        const CommandDef *topic = FindCommand(argv[i + 1]);
         if (topic == nullptr) {
             return UsageError(nullptr, std::string("unknown command ") + argv[i + 1]);
         }
@@ -145,7 +145,7 @@ ParseOutcome ParseCommandLine(int argc, const char *const *argv) {
         }
         return Help(topic);
     }
-    const CommandSpec *command = FindCommand(name);
+    const CommandDef *command = FindCommand(name);
     if (command == nullptr) {
         return UsageError(nullptr, "unknown command " + name);
     }

@@ -10,29 +10,29 @@ struct Invocation;
 // Runs a parsed invocation; returns the exit status (see exit_status.h).
 using Handler = int (*)(const Invocation &);
 
-struct OptionSpec {
+struct OptionDef {
     const char *name;       // without the leading "--"
     const char *valueName;  // "USER"; null for a flag
     bool required;
     const char *help;
 };
 
-struct ArgumentSpec {
+struct ArgumentDef {
     const char *name;  // "PATH"; every argument is required
     const char *help;
 };
 
-struct CommandSpec {
+struct CommandDef {
     const char *name;
     const char *summary;  // one line for "norvo --help"
     const char *details;  // paragraphs for "norvo NAME --help"
-    std::vector<OptionSpec> options;
-    std::vector<ArgumentSpec> arguments;
+    std::vector<OptionDef> options;
+    std::vector<ArgumentDef> arguments;
     Handler handler;
 };
 
 struct Invocation {
-    const CommandSpec *command = nullptr;
+    const CommandDef *command = nullptr;
     bool json = false;
     std::map<std::string, std::string> options;  // given options; flags map to ""
     std::vector<std::string> arguments;
@@ -51,7 +51,7 @@ struct Invocation {
 };
 
 // Every subcommand, in the order "norvo --help" lists them.
-const std::vector<CommandSpec> &Commands();
-const CommandSpec *FindCommand(const std::string &name);
+const std::vector<CommandDef> &Commands();
+const CommandDef *FindCommand(const std::string &name);
 
 }  // namespace norvo::cli

@@ -17,7 +17,7 @@ constexpr char kOutputNote[] =
     "  0 success; 1 the library (or the system) refused or failed, with its code and key;\n"
     "  2 wrong command line (message on stderr, nothing asked).\n";
 
-std::string OptionLabel(const OptionSpec &option) {
+std::string OptionLabel(const OptionDef &option) {
     std::string label = std::string("--") + option.name;
     if (option.valueName != nullptr) {
         label += std::string(" ") + option.valueName;
@@ -37,30 +37,30 @@ void PrintRows(std::ostream &out, const std::vector<std::pair<std::string, std::
 
 }  // namespace
 
-void PrintUsageLine(std::ostream &out, const CommandSpec &command) {
+void PrintUsageLine(std::ostream &out, const CommandDef &command) {
     out << "usage: norvo " << command.name << " [--json]";
-    for (const OptionSpec &option : command.options) {
+    for (const OptionDef &option : command.options) {
         out << ' ' << (option.required ? "" : "[") << OptionLabel(option) << (option.required ? "" : "]");
     }
-    for (const ArgumentSpec &argument : command.arguments) {
+    for (const ArgumentDef &argument : command.arguments) {
         out << ' ' << argument.name;
     }
     out << '\n';
 }
 
-void PrintCommandHelp(std::ostream &out, const CommandSpec &command) {
+void PrintCommandHelp(std::ostream &out, const CommandDef &command) {
     PrintUsageLine(out, command);
     out << '\n' << command.summary << "\n\n" << command.details << '\n';
     if (!command.arguments.empty()) {
         std::vector<std::pair<std::string, std::string>> rows;
-        for (const ArgumentSpec &argument : command.arguments) {
+        for (const ArgumentDef &argument : command.arguments) {
             rows.emplace_back(argument.name, argument.help);
         }
         out << "\narguments:\n";
         PrintRows(out, rows);
     }
     std::vector<std::pair<std::string, std::string>> rows;
-    for (const OptionSpec &option : command.options) {
+    for (const OptionDef &option : command.options) {
         rows.emplace_back(OptionLabel(option), std::string(option.help) + (option.required ? " (required)" : ""));
     }
     rows.emplace_back("--json", "print one JSON object instead of text");
@@ -79,7 +79,7 @@ void PrintOverview(std::ostream &out) {
            "\n"
            "commands:\n";
     std::vector<std::pair<std::string, std::string>> rows;
-    for (const CommandSpec &command : Commands()) {
+    for (const CommandDef &command : Commands()) {
         rows.emplace_back(command.name, command.summary);
     }
     rows.emplace_back("help COMMAND", "the same as norvo COMMAND --help");

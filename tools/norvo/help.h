@@ -7,8 +7,8 @@
 namespace norvo::cli {
 
 void PrintOverview(std::ostream &out);
-void PrintCommandHelp(std::ostream &out, const CommandSpec &command);
+void PrintCommandHelp(std::ostream &out, const CommandDef &command);
 // "usage: norvo NAME ..." alone, for the line after a usage error.
-void PrintUsageLine(std::ostream &out, const CommandSpec &command);
+void PrintUsageLine(std::ostream &out, const CommandDef &command);
 
 }  // namespace norvo::cli

@@ -63,7 +63,7 @@ void TextTable::Print(std::ostream &out) const {
 
 std::string WriteJson(const Json::Value &value) {
     Json::StreamWriterBuilder builder;
-    builder["indentation"] = "  ";
+    builder["indentation"] = "";  // one line: easy to grep and to split
     // With the strings already valid, this escapes every non-ASCII character: the output is
     // plain ASCII whatever the names hold.
     builder["emitUTF8"] = false;
@@ -120,7 +120,7 @@ int ReportLibraryFailure(const Invocation &inv, const std::string &message) {
     return ReportFailure(inv, code, message);
 }
 
-int ReportUsageError(const CommandSpec *command, const std::string &message) {
+int ReportUsageError(const CommandDef *command, const std::string &message) {
     const std::string prefix = command != nullptr ? std::string("norvo ") + command->name : "norvo";
     std::cerr << prefix << ": " << TerminalSafe(message) << '\n';
     if (command != nullptr) {

@@ -43,7 +43,7 @@ int ReportFailure(const Invocation &inv, int code, const std::string &message = 
 // (the call failed without saying why) is reported as 401, the system failure.
 int ReportLibraryFailure(const Invocation &inv, const std::string &message = std::string());
 // The message and the usage line on stderr, in text whatever --json says; returns kExitUsage.
-int ReportUsageError(const CommandSpec *command, const std::string &message);
+int ReportUsageError(const CommandDef *command, const std::string &message);
 
 // The JSON text of value with every string made valid UTF-8, written as ASCII.
 std::string WriteJson(const Json::Value &value);

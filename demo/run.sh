@@ -1,0 +1,21 @@
+#!/bin/sh
+# Builds norvo and the sandbox when needed, then runs the guided tour inside the demo appliance.
+#   demo/run.sh        build directory: $NORVO_BUILD_DIR, default build/ in the repository
+# Needs root: the sandbox builds the appliance in private namespaces; the host is not changed.
+set -eu
+root=$(cd "$(dirname "$0")/.." && pwd)
+build=${NORVO_BUILD_DIR:-$root/build}
+
+# The build's chatter only when it fails, so the tour stays readable.
+log=$(mktemp)
+trap 'rm -f "$log"' EXIT
+if ! { [ -f "$build/CMakeCache.txt" ] || cmake -S "$root" -B "$build" -DCMAKE_BUILD_TYPE=RelWithDebInfo; } >"$log" 2>&1 ||
+   ! cmake --build "$build" --target norvo-cli norvo-sandbox -j2 >>"$log" 2>&1; then
+    cat "$log" >&2
+    echo "run.sh: the build failed" >&2
+    exit 1
+fi
+
+# --no-log: the library's syslog lines would mix with the tour.
+"$build/tools/norvo-sandbox" --no-log "$root/demo/appliance.conf" -- \
+    /usr/bin/env NORVO_IN_SANDBOX=1 NORVO="$build/tools/norvo" /bin/sh "$root/demo/tour.sh"

@@ -1,0 +1,75 @@
+#!/bin/sh
+# A guided tour of norvo against demo/appliance.conf. Run it through demo/run.sh, which starts
+# it inside the sandboxed appliance: on the host it would make home folders and logins.
+set -u
+if [ "${NORVO_IN_SANDBOX:-}" != 1 ]; then
+    echo "tour.sh: run demo/run.sh, which starts this tour inside the demo appliance" >&2
+    exit 2
+fi
+NORVO=${NORVO:-norvo}
+
+step=0
+
+# "$@" as a reader would type it: plain words bare, anything else in single quotes.
+print_command() {
+    printf '$ norvo'
+    for arg in "$@"; do
+        case $arg in
+        *[!A-Za-z0-9_./@=:,+-]* | '') printf " '%s'" "$arg" ;;
+        *) printf ' %s' "$arg" ;;
+        esac
+    done
+    printf '\n'
+}
+
+# show EXPLANATION ARGS...: one line saying what the call shows, the call, its answer. A refusal
+# is part of the tour, so a failing call does not stop it.
+show() {
+    step=$((step + 1))
+    printf '\n== %d. %s\n' "$step" "$1"
+    shift
+    print_command "$@"
+    "$NORVO" "$@" 2>&1 | sed 's/^/   /'
+}
+
+show "A share path leads to the share's folder on its volume" \
+    resolve --user alice /photo/2024/beach.jpg
+show "/home is each user's own folder under the homes root (made when missing)" \
+    resolve --user bob /home/notes.txt
+show "Two users, one share: alice may write in photo ..." \
+    privilege --user alice /photo/2024
+show "... bob may only read there, so uploads are refused" \
+    privilege --user bob /photo/2024
+show "The ACL mask is asked as the user: alice may not even enter root's private folder" \
+    privilege --user alice /photo/private
+show "carol is on photo's no-access list: the share refuses everything" \
+    privilege --user carol /photo
+show "vault is an encrypted share" \
+    resolve --user alice /vault/keys.txt
+show "bob is on vault's no-access list" \
+    privilege --user bob /vault
+show "archive is on the read-only /volume2: the share grants read-write, the ACL mask has no write" \
+    privilege --user alice /archive/2019
+show "... so the path check of a write there fails" \
+    check-path --user alice --mode 2 /volume2/archive/2019
+show "The shares alice's file manager lists, sorted (backup is hidden)" \
+    shares --user alice --sort
+show "The shares bob may write to" \
+    shares --user bob --writable
+show "A name beginning with ._ is reserved" \
+    check-name /volume1/photo ._thumbs
+show "Before making new/sub/dir: the longest existing part is what gets checked" \
+    check-path --find-existing /volume1/photo/new/sub/dir
+
+step=$((step + 1))
+printf '\n== %d. %s\n' "$step" "A domain account logs in; the sid is kept for the next calls"
+printf "\$ sid=\$(echo secret | norvo login --user 'CORP\\\\dave' --password-stdin --remote-addr 192.0.2.10)\n"
+sid=$(echo secret | "$NORVO" login --user 'CORP\dave' --password-stdin --remote-addr 192.0.2.10)
+printf '   sid=%s\n' "$sid"
+show "With the sid, CORP\\dave's privilege on projects, where downloads are switched off" \
+    privilege --user 'CORP\dave' --sid "$sid" /projects/plan.txt
+show "Without a valid sid the domain is not asked: the library refuses" \
+    privilege --user 'CORP\dave' --sid not-a-sid /projects
+show "Every command answers in JSON too, for scripts" \
+    --json resolve --user alice /photo/2024/beach.jpg
+printf '\nEnd of the tour.\n'

@@ -1,0 +1,100 @@
+// Application privileges, from QUIB_APP_PRIVILEGE_CONF in the settings-file form:
+//   QUIB.TVQ.App.Tovana3.Instance="alice,@staff,!bob,!@interns"
+// A holder is a user or "@group"; "!" denies, and a denial wins over any grant. Members of the
+// administrators group hold every privilege, whatever the file says (intended).
+#include <errno.h>
+#include <string.h>
+
+#include <string>
+#include <vector>
+
+#include "api_guard.h"
+#include "locked_file.h"
+#include "name_list.h"
+#include "nss.h"
+#include "quib_paths.h"
+#include "quib_user.h"
+#include "settings_format.h"
+#include "text_util.h"
+
+namespace norvo::platform {
+namespace {
+
+bool IsAcceptablePrivilege(const char *priv) {
+    if (priv == nullptr || priv[0] == '\0') {
+        return false;
+    }
+    size_t len = strnlen(priv, kMaxSettingsKeyLength + 1);
+    return len <= kMaxSettingsKeyLength && IsValidUtf8(std::string_view(priv, len));
+}
+
+// 1 granted, 0 not granted or denied, -1 when a holder could not be checked (slot set):
+// the caller then refuses, since that holder might have been a denial.
+int Decide(const std::string &holders, ListMatcher *matcher) {
+    bool granted = false;
+    bool failed = false;
+    for (const std::string &entry : SplitNameList(holders)) {
+        bool deny = entry.front() == '!';
+        int match = matcher->Matches(deny ? std::string_view(entry).substr(1) : std::string_view(entry));
+        if (match < 0) {
+            failed = true;
+        } else if (match == 1 && deny) {
+            return 0;
+        } else if (match == 1) {
+            granted = true;
+        }
+    }
+    if (failed) {
+        return -1;
+    }
+    return granted ? 1 : 0;
+}
+
+int HasPrivilege(const char *userName, const char *priv) {
+    NssUser user;
+    int err = 0;
+    switch (FindUserByName(userName, &user, &err)) {
+    case NssStatus::kFound:
+        break;
+    case NssStatus::kNotFound:
+        return 0;
+    case NssStatus::kFailed:
+        QUIB_SET_ERR(NssFailureCode(err));
+        return 0;
+    }
+    ListMatcher matcher(userName);
+    std::string adminEntry = std::string("@") + QUIB_ADMIN_GROUP;
+    if (matcher.Matches(adminEntry) == 1) {
+        return 1;
+    }
+    std::string text;
+    if (int readErr = ReadLockedFile(QUIB_APP_PRIVILEGE_CONF, &text); readErr != 0) {
+        if (readErr != ENOENT) {
+            QUIB_SET_ERR(QUIB_ERR_OPEN_FAILED);
+        }
+        return 0;
+    }
+    std::vector<SettingsLine> lines = ParseSettings(text);
+    const SettingsLine *entry = FindSettingsEntry(lines, priv, false);
+    if (entry == nullptr) {
+        return 0;
+    }
+    return Decide(entry->value, &matcher) == 1 ? 1 : 0;
+}
+
+}  // namespace
+}  // namespace norvo::platform
+
+namespace np = norvo::platform;
+
+extern "C" {
+
+int VLIBUserPrivilegeHas(const char *user, const char *priv) {
+    if (!np::IsAcceptableName(user) || !np::IsAcceptablePrivilege(priv)) {
+        QUIB_SET_ERR(QUIB_ERR_BAD_PARAMETER);
+        return 0;
+    }
+    return np::Guarded(0, [&] { return np::HasPrivilege(user, priv); });
+}
+
+}  // extern "C"

@@ -1,0 +1,97 @@
+// Share privileges of domain and directory-service accounts, valid only for a live login.
+// The share lists are read exactly as for a local account; the account service itself is
+// not asked (this Linux build has no domain controller or directory server to ask).
+#include <strings.h>
+
+#include <memory>
+#include <string>
+
+#include "api_guard.h"
+#include "login_session.h"
+#include "quib_login.h"
+#include "quib_paths.h"
+#include "quib_share.h"
+#include "quib_user.h"
+#include "text_util.h"
+#include "vlibc_file.h"
+
+namespace norvo::platform {
+namespace {
+
+struct ShareFree {
+    void operator()(PQUIBSHARE share) const { QUIBShareFree(share); }
+};
+
+struct Service {
+    AUTH_TYPE kind;
+    const char *nameKey;     // must be non-empty
+    const char *enabledKey;  // must be "yes"
+};
+
+constexpr Service kDomain = {AUTH_DOMAIN, "workgroup", "domain_joined"};
+constexpr Service kDirectory = {AUTH_LDAP, "ldap_server", "ldap_enabled"};
+
+bool IsConfigured(const Service &service) {
+    char name[256];
+    return VLIBCFileGetKeyValue(QUIB_INFO_CONF, service.nameKey, name, sizeof name, 0) > 1 &&
+           VLIBCFileCheckKeyValue(QUIB_INFO_CONF, service.enabledKey, "yes", 1) == 1;
+}
+
+bool InList(const char *user, const char *list) {
+    return list != nullptr && BlSDKUserIsInList(user, list) == 1;
+}
+
+int GetPrivilege(const Service &service, const char *share, const char *user, const char *sid, int *priv) {
+    if (!IsConfigured(service)) {
+        QUIB_SET_ERR(QUIB_ERR_OPEN_FAILED);
+        return -2;
+    }
+    if (share == nullptr || !IsAcceptableName(user) || sid == nullptr || priv == nullptr ||
+        QUIBUserAuthTypeOf(user) != service.kind) {
+        QUIB_SET_ERR(QUIB_ERR_BAD_PARAMETER);
+        return -1;
+    }
+    std::string loggedIn;
+    int code = QUIB_ERR_NONE;
+    if (FindLogin(sid, &loggedIn, &code) != LoginState::kLive) {
+        QUIB_SET_ERR(code);
+        return -1;
+    }
+    // Windows and directory names are case-insensitive; ASCII folding is what they share.
+    if (!EqualsIgnoreCase(loggedIn, user)) {
+        QUIB_SET_ERR(QUIB_ERR_ACCESS_DENIED);
+        return -1;
+    }
+    PQUIBSHARE raw = nullptr;
+    if (QUIBShareGet(share, &raw) != 0) {
+        return -1;  // the slot holds the reason: 0x1400 for an unknown share
+    }
+    const std::unique_ptr<QUIBSHARE, ShareFree> record(raw);
+    if (InList(user, record->szNoAccessList)) {
+        *priv = 0;
+    } else if (InList(user, record->szRWList)) {
+        *priv = 2;
+    } else if (InList(user, record->szROList)) {
+        *priv = 1;
+    } else {
+        *priv = 0;
+    }
+    return 0;
+}
+
+}  // namespace
+}  // namespace norvo::platform
+
+using namespace norvo::platform;
+
+extern "C" {
+
+int QuibCgiDomGetPrivilege(const char *share, const char *user, const char *sid, int *priv) {
+    return Guarded(-1, [&] { return GetPrivilege(kDomain, share, user, sid, priv); });
+}
+
+int QuibCgiLDAPGetPrivilege(const char *share, const char *user, const char *sid, int *priv) {
+    return Guarded(-1, [&] { return GetPrivilege(kDirectory, share, user, sid, priv); });
+}
+
+}  // extern "C"

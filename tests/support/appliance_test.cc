@@ -1,0 +1,313 @@
+// The sandbox itself: isolation from the host, accounts through NSS, the syslog capture,
+// identity switching, the extra mounts and the appliance-file parser.
+#include <crypt.h>
+#include <errno.h>
+#include <fcntl.h>
+#include <grp.h>
+#include <mntent.h>
+#include <pwd.h>
+#include <shadow.h>
+#include <signal.h>
+#include <sys/stat.h>
+#include <sys/statvfs.h>
+#include <sys/wait.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <fstream>
+#include <sstream>
+#include <string>
+#include <vector>
+
+#include <gtest/gtest.h>
+
+#include "appliance.h"
+#include "appliance_file.h"
+
+namespace norvo::testing {
+namespace {
+
+std::string Slurp(const std::string &path) {
+    std::ifstream in(path);
+    std::ostringstream out;
+    out << in.rdbuf();
+    return out.str();
+}
+
+bool Exists(const std::string &path) {
+    struct stat st;
+    return lstat(path.c_str(), &st) == 0;
+}
+
+// The type of the mount on top at path, "" when none.
+std::string MountType(const std::string &path) {
+    std::string type;
+    FILE *table = setmntent("/proc/self/mounts", "re");
+    while (const mntent *entry = getmntent(table))
+        if (path == entry->mnt_dir) type = entry->mnt_type;
+    endmntent(table);
+    return type;
+}
+
+// The mount lines about places the appliance mounts over; the host's other mounts may change
+// under a concurrent build.
+std::string SandboxRelevantMounts() {
+    std::string lines;
+    FILE *table = setmntent("/proc/self/mounts", "re");
+    while (const mntent *entry = getmntent(table)) {
+        const std::string dir = entry->mnt_dir;
+        for (const char *prefix : {"/mnt", "/volume", "/etc", "/usr", "/tmp", "/run", "/dev"})
+            if (dir.rfind(prefix, 0) == 0) lines += dir + " " + entry->mnt_type + "\n";
+    }
+    endmntent(table);
+    return lines;
+}
+
+TEST(ApplianceTest, LeavesTheHostUntouched) {
+    ASSERT_FALSE(Exists("/etc/quibinfo.conf")) << "the host itself has appliance settings";
+    const std::string passwd = Slurp("/etc/passwd");
+    const std::string mounts = SandboxRelevantMounts();
+
+    const pid_t pid = fork();
+    ASSERT_GE(pid, 0);
+    if (pid == 0) {
+        int failures = 0;
+        {
+            Appliance appliance;
+            appliance.Basic().SetSetting("probe", "1").SetDefaultSetting("probe", "1");
+            appliance.WriteFile("/volume1/norvo-probe", "x").WriteFile("/tmp/norvo-probe", "x");
+            appliance.WriteFile("/usr/norvo-probe", "x").WriteFile("/etc/norvo-probe", "x");
+            appliance.MountDeadRemote("/volume1/dead");
+            if (getpwnam("alice") == nullptr) failures |= 1;
+            if (!Exists("/etc/quibinfo.conf") || !Exists("/volume1/norvo-probe")) failures |= 2;
+        }
+        // Back in the host's namespace once the appliance is gone.
+        if (Exists("/etc/quibinfo.conf") || Exists("/volume1/norvo-probe")) failures |= 4;
+        _exit(failures);
+    }
+    int status = 0;
+    ASSERT_EQ(waitpid(pid, &status, 0), pid);
+    ASSERT_TRUE(WIFEXITED(status)) << "signal " << WTERMSIG(status);
+    EXPECT_EQ(WEXITSTATUS(status), 0);
+
+    EXPECT_EQ(Slurp("/etc/passwd"), passwd);
+    EXPECT_EQ(SandboxRelevantMounts(), mounts);
+    for (const char *path : {"/etc/quibinfo.conf", "/etc.defaults", "/usr/quib", "/volume1/norvo-probe",
+                             "/tmp/norvo-probe", "/usr/norvo-probe", "/etc/norvo-probe", "/volume1/dead",
+                             "/mnt/.norvo-sandbox"})
+        EXPECT_FALSE(Exists(path)) << path;
+}
+
+TEST(ApplianceTest, AccountsAreSeenThroughNss) {
+    Appliance appliance;
+    appliance.Basic().AddUser("CORP\\dave");
+    UserSpec erin;
+    erin.name = "erin@corp.example";
+    erin.uid = 5000;
+    erin.expireDay = 100;
+    appliance.AddUser(erin);
+
+    const passwd *alice = getpwnam("alice");
+    ASSERT_NE(alice, nullptr);
+    EXPECT_EQ(alice->pw_uid, appliance.Uid("alice"));
+    EXPECT_EQ(alice->pw_gid, 100u);
+    EXPECT_STREQ(alice->pw_dir, "/volume1/homes/alice");
+    EXPECT_FALSE(Exists("/volume1/homes/alice"));
+    EXPECT_TRUE(Exists("/volume1/homes"));
+    ASSERT_NE(getpwnam("CORP\\dave"), nullptr);
+    EXPECT_EQ(getpwnam("CORP\\dave")->pw_uid, appliance.Uid("CORP\\dave"));
+    ASSERT_NE(getpwnam("erin@corp.example"), nullptr);
+    EXPECT_EQ(getpwnam("erin@corp.example")->pw_uid, 5000u);
+    EXPECT_EQ(getpwnam("daemon"), nullptr) << "a host account leaks into the appliance";
+
+    const group *staff = getgrnam("staff");
+    ASSERT_NE(staff, nullptr);
+    EXPECT_EQ(staff->gr_gid, appliance.Gid("staff"));
+    std::vector<std::string> members(staff->gr_mem, staff->gr_mem + 2);
+    EXPECT_EQ(members, (std::vector<std::string>{"alice", "bob"}));
+    ASSERT_NE(getgrnam("administrators"), nullptr);
+    EXPECT_EQ(getgrnam("administrators")->gr_gid, 101u);
+    EXPECT_STREQ(getgrnam("administrators")->gr_mem[0], "admin");
+
+    const spwd *shadow = getspnam("alice");
+    ASSERT_NE(shadow, nullptr);
+    EXPECT_EQ(std::string(shadow->sp_pwdp).rfind("$6$", 0), 0u);
+    EXPECT_STREQ(crypt("secret", shadow->sp_pwdp), shadow->sp_pwdp);
+    ASSERT_NE(getspnam("erin@corp.example"), nullptr);
+    EXPECT_EQ(getspnam("erin@corp.example")->sp_expire, 100);
+}
+
+TEST(ApplianceTest, SyslogCapturesTheProcessAndRunAsChildren) {
+    Appliance appliance;
+    appliance.Basic();
+    syslog(LOG_ERR, "%s:%d parent %s", "norvodir", 12, "speaks");
+    // More lines than a datagram socket queues by default: the capture must keep draining.
+    const int result = appliance.RunAs("alice", [] {
+        openlog("child", LOG_PID, LOG_USER);
+        for (int i = 0; i < 40; ++i) syslog(LOG_DEBUG, "line %d", i);
+        syslog(LOG_WARNING, "child as %d", int(geteuid()));
+        return 0;
+    });
+    ASSERT_EQ(result, 0);
+    syslog(LOG_INFO, "parent again");
+
+    std::vector<LogLine> expected{{LOG_ERR, "norvodir:12 parent speaks"}};
+    for (int i = 0; i < 40; ++i) expected.push_back({LOG_DEBUG, "line " + std::to_string(i)});
+    expected.push_back({LOG_WARNING, "child as " + std::to_string(appliance.Uid("alice"))});
+    expected.push_back({LOG_INFO, "parent again"});
+    EXPECT_EQ(appliance.Logs(), expected);
+    appliance.ClearLogs();
+    EXPECT_TRUE(appliance.Logs().empty());
+}
+
+TEST(ApplianceTest, ErrorLinesHideSourceLineNumbers) {
+    Appliance appliance;
+    syslog(LOG_ERR, "%s:%d Failed to get ddns_update of %s", "norvomisc.cpp", 788, "/etc/quibinfo.conf");
+    syslog(LOG_ERR, "%s(%d) %s", "nvoman.cpp", 45, "no scratch dir");
+    syslog(LOG_ERR, "%s (%d) %s", "norvodir", 7, "bad path");
+    syslog(LOG_WARNING, "%s:%d %s", "norvodir.cpp", 1, "only a warning");
+    syslog(LOG_ERR, "stat /volume1/a (2) failed at x.cc:99");
+    EXPECT_EQ(appliance.ErrorLines(),
+              (std::vector<std::string>{"norvomisc.cpp:# Failed to get ddns_update of /etc/quibinfo.conf",
+                                        "nvoman.cpp(#) no scratch dir", "norvodir (#) bad path",
+                                        "stat /volume1/a (2) failed at x.cc:#"}));
+}
+
+TEST(ApplianceTest, RunAsTakesTheUsersIdentity) {
+    Appliance appliance;
+    appliance.Basic();
+    const uid_t alice = appliance.Uid("alice");
+    const gid_t staff = appliance.Gid("staff");
+    const gid_t administrators = appliance.Gid("administrators");
+    EXPECT_EQ(appliance.RunAs("alice", [&] {
+        if (getuid() != alice || geteuid() != alice || getgid() != 100 || getegid() != 100) return 1;
+        gid_t groups[64];
+        const int count = getgroups(64, groups);
+        const auto has = [&](gid_t gid) { return std::find(groups, groups + count, gid) != groups + count; };
+        if (!has(staff) || !has(100) || has(administrators) || has(0)) return 2;
+        return 42;
+    }), 42);
+    EXPECT_EQ(appliance.RunAs("admin", [&] {
+        gid_t groups[64];
+        const int count = getgroups(64, groups);
+        return std::find(groups, groups + count, administrators) != groups + count ? -7 : 3;
+    }), -7);
+    EXPECT_EQ(appliance.RunAs("bob", [] { return 1000; }), 100);
+    EXPECT_EQ(appliance.RunAs("bob", [] {
+        raise(SIGKILL);
+        return 0;
+    }), -1000 - SIGKILL);
+}
+
+TEST(ApplianceTest, FatAndDeadRemoteMounts) {
+    Appliance appliance;
+    appliance.Basic().MountFat("/volumeUSB1").MountDeadRemote("/volume1/photo/nas2");
+    EXPECT_EQ(MountType("/volumeUSB1"), "fuse.fusefat");
+    EXPECT_EQ(MountType("/volume1/photo/nas2"), "fuse.norvo-deadremote");
+
+    EXPECT_EQ(appliance.RunAs("alice", [] {
+        std::ofstream("/volumeUSB1/by-alice.txt") << "on fat";
+        return 0;
+    }), 0);
+    EXPECT_EQ(Slurp("/volumeUSB1/by-alice.txt"), "on fat");
+
+    struct stat st;
+    errno = 0;
+    EXPECT_EQ(stat("/volume1/photo/nas2/2012", &st), -1);
+    EXPECT_EQ(errno, EIO);
+    errno = 0;
+    EXPECT_EQ(stat("/volume1/photo/nas2", &st), -1);
+    EXPECT_EQ(errno, EIO);
+}
+
+TEST(ApplianceTest, RemountReadOnly) {
+    Appliance appliance;
+    appliance.WriteFile("/volume2/kept.txt", "kept").MakeDir("/volume1/archive");
+    appliance.RemountReadOnly("/volume2").RemountReadOnly("/volume1/archive");
+
+    EXPECT_EQ(Slurp("/volume2/kept.txt"), "kept");
+    errno = 0;
+    EXPECT_EQ(open("/volume2/new.txt", O_WRONLY | O_CREAT | O_CLOEXEC, 0644), -1);
+    EXPECT_EQ(errno, EROFS);
+    errno = 0;
+    EXPECT_EQ(mkdir("/volume1/archive/new", 0755), -1);
+    EXPECT_EQ(errno, EROFS);
+    EXPECT_EQ(mkdir("/volume1/still-writable", 0755), 0);
+    struct statvfs fs;
+    ASSERT_EQ(statvfs("/volume2", &fs), 0);
+    EXPECT_NE(fs.f_flag & ST_RDONLY, 0u);
+}
+
+TEST(ApplianceFileTest, RejectsBadLinesWithTheirNumber) {
+    const std::pair<const char *, const char *> cases[] = {
+        {"frob x", "t:1: unknown directive 'frob'"},
+        {"user alice\n\ndir /x mode=0999", "t:3: bad mode '0999' (octal, such as 0755)"},
+        {"file /x owner=zed", "t:1: unknown owner 'zed'"},
+        {"basic\nfile /x owner=alice:nogrp", "t:2: unknown group 'nogrp'"},
+        {"file /x owner=alice\nuser alice", "t:1: unknown owner 'alice'"},
+        {"user alice\nadmin alice", "t:2: user 'alice' is already defined on line 1"},
+        {"share x bogus=1", "t:1: unknown option 'bogus' for share"},
+        {"share x restrict=nowrite", "t:1: unknown restriction 'nowrite' (nobrowse, nomodify, nodownload)"},
+        {"share x comment=\"open", "t:1: unterminated quote"},
+        {"dir relative/x", "t:1: 'relative/x' is not an absolute path"},
+        {"file /x size=1 content=a", "t:1: give either size or content, not both"},
+        {"home maybe", "t:1: bad home state 'maybe' (on or off)"},
+        {"privilege QUIB.X", "t:1: privilege needs 2 arguments"},
+        {"user bob uid=12ab", "t:1: bad uid '12ab' (a decimal number)"},
+    };
+    for (const auto &[text, message] : cases) {
+        ApplianceFile file;
+        file.steps.resize(1);
+        std::string error;
+        EXPECT_FALSE(ParseApplianceFile(text, "t", &file, &error)) << text;
+        EXPECT_EQ(error, message) << text;
+        EXPECT_EQ(file.steps.size(), 1u) << "a failed parse changed its output";
+    }
+}
+
+TEST(ApplianceFileTest, BuildsWhatItDescribes) {
+    const char *text = R"(# read-only remounts wait until everything else is built
+basic
+readonly /volume2
+user CORP\dave uid=3000 groups=staff
+share media volume=/volume2 rw=alice,@staff hidden restrict=nobrowse,nodownload acl=no comment="Family \"pics\""
+dir /volume1/photo/2012 owner=alice mode=0750   # trailing comment
+file /volume1/photo/2012/a.jpg owner=alice:staff mode=0640 size=10
+setting FB_SHARING_SETTING="on off"
+privilege QUIB.TVQ.App.Tovana3.Instance @users,admin
+)";
+    ApplianceFile file;
+    std::string error;
+    ASSERT_TRUE(ParseApplianceFile(text, "t", &file, &error)) << error;
+    ASSERT_EQ(file.steps.size(), 8u);
+    EXPECT_EQ(file.steps[2].user.name, "CORP\\dave");
+    EXPECT_EQ(file.steps[3].share.comment, "Family \"pics\"");
+    EXPECT_EQ(file.steps[3].line, 5);
+
+    Appliance appliance;
+    BuildAppliance(appliance, file);
+    EXPECT_EQ(appliance.Uid("CORP\\dave"), 3000u);
+    struct stat st;
+    ASSERT_EQ(stat("/volume1/photo/2012/a.jpg", &st), 0);
+    EXPECT_EQ(st.st_uid, appliance.Uid("alice"));
+    EXPECT_EQ(st.st_gid, appliance.Gid("staff"));
+    EXPECT_EQ(st.st_mode & 07777, 0640u);
+    EXPECT_EQ(st.st_size, 10);
+    ASSERT_EQ(stat("/volume2/media", &st), 0);
+    EXPECT_EQ(st.st_mode & 07777, 0777u);
+    EXPECT_EQ(mkdir("/volume2/media/x", 0755), -1);
+    EXPECT_EQ(errno, EROFS);
+
+    const std::string shares = Slurp("/usr/quib/etc/shares.conf");
+    EXPECT_NE(shares.find("[media]\n\tpath = /volume2/media\n\tcomment = Family \"pics\"\n"
+                          "\twrite list = alice,@staff\n\tbrowseable = no\n\tdisable browsing = yes\n"
+                          "\tdisable download = yes\n\tacl = no\n"),
+              std::string::npos)
+        << shares;
+    EXPECT_NE(Slurp("/etc/quibinfo.conf").find("FB_SHARING_SETTING=\"on off\"\n"), std::string::npos);
+    EXPECT_EQ(Slurp("/usr/quib/etc/app_privilege.conf"), "QUIB.TVQ.App.Tovana3.Instance=\"@users,admin\"\n");
+}
+
+}  // namespace
+}  // namespace norvo::testing
