@@ -140,11 +140,10 @@ TEST_F(MkdirP, AnOrdinaryUserIsJudgedByTheKernel) {
                    : 0;
     });
     EXPECT_EQ(denied, 1);
-    const uid_t rootUid = 0;
-    const int giveAway = appliance_.RunAs("alice", [rootUid] {
+    const int giveAway = appliance_.RunAs("alice", [] {
         char stop[64] = "";
         errno = 0;
-        const int rc = QUIBFSMkdirP("/volume1/mine/gift", stop, sizeof stop, 1, rootUid, -1, 0755);
+        const int rc = QUIBFSMkdirP("/volume1/mine/gift", stop, sizeof stop, 1, 0, -1, 0755);
         return rc == -1 && errno == EPERM && strcmp(stop, "/volume1/mine/gift") == 0 ? 1 : 0;
     });
     EXPECT_EQ(giveAway, 1);
