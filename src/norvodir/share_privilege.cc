@@ -12,10 +12,15 @@ namespace {
 
 enum { kNoAccess = 0, kReadOnly = 1, kReadWrite = 2 };
 
+// A no-access list that can't be checked (the account service failed) keeps the user out.
+bool NoAccessListed(const char *user, const QUIBSHARE &share) {
+    return BlSDKUserIsInList(user, share.szNoAccessList) != 0;
+}
+
 // The share's own lists, in precedence order: no access wins over both others, read-write over
 // read-only.
 int ListPrivilege(const char *user, const QUIBSHARE &share) {
-    if (BlSDKUserIsInList(user, share.szNoAccessList) == 1) {
+    if (NoAccessListed(user, share)) {
         return kNoAccess;
     }
     if (BlSDKUserIsInList(user, share.szRWList) == 1) {
@@ -115,7 +120,7 @@ PSZLIST NvoLibValidShareGen(const char *user, int sort, int writableOnly) {
     int step = 0;
     while ((step = QUIBShareDBCursorGet(db.get(), &cursor)) == 0) {
         const QUIBSHARE &share = *cursor;
-        if ((share.fStatus & SHARE_STATUS_HIDDEN) != 0 || BlSDKUserIsInList(user, share.szNoAccessList) == 1) {
+        if ((share.fStatus & SHARE_STATUS_HIDDEN) != 0 || NoAccessListed(user, share)) {
             continue;
         }
         const bool granted = BlSDKUserIsInList(user, share.szRWList) == 1 ||

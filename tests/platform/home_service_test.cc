@@ -42,10 +42,10 @@ std::string HomePath(int *code = nullptr) {
 }
 
 UserSpec WithHome(const std::string &name, const std::string &home) {
-    UserSpec spec;
-    spec.name = name;
-    spec.home = home;
-    return spec;
+    UserSpec account;
+    account.name = name;
+    account.home = home;
+    return account;
 }
 
 class HomeService : public ::testing::Test {
@@ -103,7 +103,8 @@ TEST_F(HomeService, OffOrUnconfigured) {
     EXPECT_EQ(Enabled("alice"), 0);
     EXPECT_EQ(HomePath(&code), "<none>");
     for (const char *root : {"relative/homes", "/", ""}) {
-        app_.WriteFile(QUIB_INFO_CONF, std::string("userHomeEnable=\"yes\"\nuserHomeRoot=\"") + root + "\"\n");
+        app_.WriteFile(QUIB_INFO_CONF,
+                       std::string("userHomeEnable=\"yes\"\nuserHomeRoot=\"") + root + "\"\n");
         EXPECT_EQ(Enabled("alice"), 0) << root;
         EXPECT_EQ(HomePath(&code), "<none>") << root;
     }

@@ -222,7 +222,8 @@ TEST_F(ShareConfig, BrokenSectionsAreSkippedAndTheRestIsRead) {
          "[last]\n"
          "path = /volume1/last\n");
     EXPECT_EQ(AllNames(), (Strings{"first", "spaced name", "last"}));
-    for (const char *name : {"nopath", "relative", "root", "typo", "badbool", "badftp", "unclosed", "twice"}) {
+    for (const char *name :
+         {"nopath", "relative", "root", "typo", "badbool", "badftp", "unclosed", "twice"}) {
         int code = 0;
         EXPECT_EQ(Lookup(name, &code), nullptr) << name;
         EXPECT_EQ(code, QUIB_ERR_NO_SUCH_SHARE) << name;

@@ -63,11 +63,11 @@ long Today() {
     return static_cast<long>(time(nullptr) / 86400);
 }
 
-UserSpec Spec(const std::string &name, Strings groups = {}) {
-    UserSpec spec;
-    spec.name = name;
-    spec.groups = std::move(groups);
-    return spec;
+UserSpec Account(const std::string &name, Strings groups = {}) {
+    UserSpec account;
+    account.name = name;
+    account.groups = std::move(groups);
+    return account;
 }
 
 class UsersAndGroups : public ::testing::Test {
@@ -143,7 +143,8 @@ TEST_F(UsersAndGroups, UnknownIsNotFoundAndBadInputIsRejected) {
     EXPECT_EQ(VLIBCErrGet(), QUIB_ERR_NO_SUCH_GROUP);
 
     std::string longName(300, 'a');
-    for (const char *bad : {static_cast<const char *>(nullptr), "", longName.c_str(), "\xff\xfe", "a\nb", "tab\tname"}) {
+    const char *badNames[] = {nullptr, "", longName.c_str(), "\xff\xfe", "a\nb", "tab\tname"};
+    for (const char *bad : badNames) {
         EXPECT_EQ(GetUser(bad, &code), nullptr);
         EXPECT_EQ(code, QUIB_ERR_BAD_PARAMETER);
         EXPECT_EQ(GetGroup(bad, &code), nullptr);
@@ -197,9 +198,9 @@ TEST_F(UsersAndGroups, Expiry) {
         {"epoch", 0, 1},
     };
     for (const auto &c : cases) {
-        UserSpec spec = Spec(c.name);
-        spec.expireDay = c.expireDay;
-        app_.AddUser(spec);
+        UserSpec account = Account(c.name);
+        account.expireDay = c.expireDay;
+        app_.AddUser(account);
     }
     for (const auto &c : cases) {
         EXPECT_EQ(QUIBUserIsExpired(c.name), c.expected) << c.name;
@@ -246,7 +247,7 @@ TEST_F(UsersAndGroups, GroupWithManyMembers) {
 }
 
 TEST_F(UsersAndGroups, Membership) {
-    app_.AddUser(Spec("CORP\\dave", {"CORP\\domain users"}));
+    app_.AddUser(Account("CORP\\dave", {"CORP\\domain users"}));
     const struct {
         const char *group;
         const char *user;
@@ -290,9 +291,9 @@ TEST_F(UsersAndGroups, PrimaryGroupCountsWithoutBeingListed) {
 }
 
 TEST_F(UsersAndGroups, Administrators) {
-    app_.AddUser(Spec("CORP\\boss", {"administrators"}));
-    app_.AddUser(Spec("chief@corp.example", {"administrators"}));
-    app_.AddUser(Spec("CORP\\worker"));
+    app_.AddUser(Account("CORP\\boss", {"administrators"}));
+    app_.AddUser(Account("chief@corp.example", {"administrators"}));
+    app_.AddUser(Account("CORP\\worker"));
     const struct {
         const char *user;
         int plain;
@@ -316,7 +317,7 @@ TEST_F(UsersAndGroups, Administrators) {
 }
 
 TEST_F(UsersAndGroups, UserLists) {
-    app_.AddUser(Spec("CORP\\dave", {"CORP\\domain users"}));
+    app_.AddUser(Account("CORP\\dave", {"CORP\\domain users"}));
     const struct {
         const char *user;
         const char *list;
