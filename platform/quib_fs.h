@@ -61,8 +61,11 @@ QUIB_API extern const char rgszFsType[QUIB_FSTYPE_COUNT][QUIB_FSTYPE_NAME_LEN];
 // With flags 0 any path; with flags 1 only a mount directory (FSTYPE_NOT_MOUNT_POINT otherwise).
 // -1 with errno set when path can't be examined.
 QUIB_API int QUIBGetFSType(const char *path, int flags);
-// Type index of the mount that holds path (the deepest mount directory that is path or a
-// parent of it), from /proc/self/mounts; -1 when no mount holds it.
+// Type index of the data mount that holds path: the deepest mount, among those whose directory
+// is a volume (/volumeN, /volumeUSBN, /volumeSATAN) or lies below one, whose directory is path
+// or a parent of it. Read from /proc/self/mounts without examining path itself, so it works on
+// a network mount whose server is gone. -1 when no data mount holds path (the system disk is
+// none), or on failure (error slot set).
 QUIB_API int QUIBFSIsInMountTable(const char *path);
 // Type index of a mount-table type name ("ext4", "fuse.sshfs", ...; aliases in
 // platform/README.md); source (may be null) names the driver of FUSE mounts without subtype.

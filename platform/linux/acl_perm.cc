@@ -65,17 +65,12 @@ AclSupport ProbeAclSupport(const char *target, struct statfs *info) {
 // A symbolic link carries no ACL of its own: the directory holding it answers for its file
 // system.
 std::string ProbeTargetOf(const char *path, const struct statx &info) {
-    if (!S_ISLNK(info.stx_mode)) {
+    std::string parent;
+    std::string_view last;
+    if (!S_ISLNK(info.stx_mode) || !SplitLastComponent(path, &parent, &last)) {
         return path;
     }
-    const std::string absolute = AbsolutePath(path);
-    return absolute.empty() ? std::string(".") : ParentOf(absolute);
-}
-
-int Fail(int err, int line) {
-    VLIBCErrSetEx(VLIBCErrFromErrno(err), __FILE__, line);
-    errno = err;
-    return -1;
+    return parent;
 }
 
 // Whether unlink or rmdir of path would pass the kernel's may_delete: write and search on the
@@ -86,21 +81,10 @@ bool MayDelete(const char *path, const struct statx &entry) {
         HasAttribute(entry, STATX_ATTR_MOUNT_ROOT)) {
         return false;
     }
-    // The parent as unlink resolves it: the path up to its last component, links and all.
-    const std::string_view raw(path);
-    const size_t end = raw.find_last_not_of('/');
-    if (end == std::string_view::npos) {
-        return false;  // the root
-    }
-    const size_t slash = raw.rfind('/', end);
-    const size_t start = slash == std::string_view::npos ? 0 : slash + 1;
-    const std::string_view last = raw.substr(start, end - start + 1);
-    if (last == "." || last == "..") {
-        return false;  // rmdir refuses them (EINVAL, ENOTEMPTY)
-    }
-    std::string parent = slash == std::string_view::npos ? std::string(".") : std::string(raw.substr(0, slash));
-    if (parent.empty()) {
-        parent = "/";
+    std::string parent;
+    std::string_view last;
+    if (!SplitLastComponent(path, &parent, &last) || last == "." || last == "..") {
+        return false;  // the root, and what rmdir refuses (EINVAL, ENOTEMPTY)
     }
     struct statx dir;
     if (statx(AT_FDCWD, parent.c_str(), 0, STATX_MODE | STATX_UID, &dir) != 0 ||
@@ -124,15 +108,15 @@ extern "C" {
 
 int QUIBACLPermGet(const char *path, unsigned int *mask) {
     if (mask == nullptr) {
-        return Fail(EINVAL, __LINE__);
+        return NORVO_FAIL_ERRNO(EINVAL);
     }
     if (const int err = CheckPathArgument(path)) {
-        return Fail(err, __LINE__);
+        return NORVO_FAIL_ERRNO(err);
     }
     return Guarded(-1, [&] {
         struct statx info;
         if (statx(AT_FDCWD, path, AT_SYMLINK_NOFOLLOW, STATX_TYPE | STATX_MODE | STATX_UID, &info) != 0) {
-            return Fail(errno, __LINE__);
+            return NORVO_FAIL_ERRNO(errno);
         }
         const std::string target = ProbeTargetOf(path, info);
         struct statfs fs;
@@ -143,13 +127,13 @@ int QUIBACLPermGet(const char *path, unsigned int *mask) {
             QUIB_SET_ERR(QUIB_ERR_ACL_NOT_SUPPORTED);
             return -1;
         case AclSupport::kFailed:
-            return Fail(errno, __LINE__);
+            return NORVO_FAIL_ERRNO(errno);
         }
         const Access read = Check(path, R_OK, AT_SYMLINK_NOFOLLOW);
         const Access write = Check(path, W_OK, AT_SYMLINK_NOFOLLOW);
         const Access exec = Check(path, X_OK, AT_SYMLINK_NOFOLLOW);
         if (read == Access::kFailed || write == Access::kFailed || exec == Access::kFailed) {
-            return Fail(errno, __LINE__);
+            return NORVO_FAIL_ERRNO(errno);
         }
         const bool readOnlyFs = (fs.f_flags & ST_RDONLY) != 0;
         const bool immutable = HasAttribute(info, STATX_ATTR_IMMUTABLE);
@@ -185,12 +169,12 @@ int QUIBACLPermGet(const char *path, unsigned int *mask) {
 
 int QUIBACLIsSupport(const char *path) {
     if (const int err = CheckPathArgument(path)) {
-        return Fail(err, __LINE__);
+        return NORVO_FAIL_ERRNO(err);
     }
     return Guarded(-1, [&] {
         struct statx info;
         if (statx(AT_FDCWD, path, AT_SYMLINK_NOFOLLOW, STATX_TYPE, &info) != 0) {
-            return Fail(errno, __LINE__);
+            return NORVO_FAIL_ERRNO(errno);
         }
         const std::string target = ProbeTargetOf(path, info);
         struct statfs fs;
@@ -202,7 +186,7 @@ int QUIBACLIsSupport(const char *path) {
         case AclSupport::kFailed:
             break;
         }
-        return Fail(errno, __LINE__);
+        return NORVO_FAIL_ERRNO(errno);
     });
 }
 

@@ -9,6 +9,7 @@
 #include <memory>
 
 #include "text_util.h"
+#include "vlibc_err.h"
 
 namespace norvo::platform {
 
@@ -36,12 +37,27 @@ std::string AbsolutePath(const char *path) {
     return NormalizePath(joined);
 }
 
-std::string ParentOf(const std::string &normalized) {
-    const size_t slash = normalized.rfind('/');
-    if (slash == std::string::npos || slash == 0) {
-        return "/";
+bool SplitLastComponent(std::string_view path, std::string *parent, std::string_view *last) {
+    const size_t end = path.find_last_not_of('/');
+    if (end == std::string_view::npos) {
+        return false;
     }
-    return normalized.substr(0, slash);
+    const size_t slash = path.rfind('/', end);
+    const size_t start = slash == std::string_view::npos ? 0 : slash + 1;
+    *last = path.substr(start, end - start + 1);
+    if (slash == std::string_view::npos) {
+        *parent = ".";
+    } else {
+        const size_t parentEnd = path.find_last_not_of('/', slash);
+        *parent = parentEnd == std::string_view::npos ? "/" : std::string(path.substr(0, parentEnd + 1));
+    }
+    return true;
+}
+
+int FailWithErrno(int err, const char *file, int line) {
+    VLIBCErrSetEx(VLIBCErrFromErrno(err), file, line);
+    errno = err;
+    return -1;
 }
 
 }  // namespace norvo::platform

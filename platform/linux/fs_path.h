@@ -1,6 +1,7 @@
 // Checks shared by the file-system calls on the path arguments they are given.
 #pragma once
 #include <string>
+#include <string_view>
 
 namespace norvo::platform {
 
@@ -14,7 +15,19 @@ namespace norvo::platform {
 // "" when the working directory can't be read (errno set).
 [[nodiscard]] std::string AbsolutePath(const char *path);
 
-// The directory part of a normalised absolute path: "/a/b" -> "/a", "/a" -> "/", "/" -> "/".
-[[nodiscard]] std::string ParentOf(const std::string &normalized);
+// Splits path as the kernel resolves it for unlink: *parent is everything before the last
+// component, links and ".." left as they are ("." when there is none, "/" for a top-level
+// name), *last the component itself. false for the root (no last component).
+[[nodiscard]] bool SplitLastComponent(std::string_view path, std::string *parent, std::string_view *last);
+
+// Sets the error slot from err at file:line, leaves errno == err, and returns -1.
+int FailWithErrno(int err, const char *file, int line);
+
+}  // namespace norvo::platform
+
+// Fails the current call with err, recording the caller's place.
+#define NORVO_FAIL_ERRNO(err) ::norvo::platform::FailWithErrno((err), __FILE__, __LINE__)
+
+namespace norvo::platform {
 
 }  // namespace norvo::platform

@@ -86,12 +86,6 @@ int IndexOfBlockDevice(std::string_view source) {
     return memcmp(boot + 3, "EXFAT   ", 8) == 0 ? FSTYPE_EXFAT : FSTYPE_UNKNOWN;
 }
 
-int ErrnoFailure(int err, int line) {
-    VLIBCErrSetEx(VLIBCErrFromErrno(err), __FILE__, line);
-    errno = err;
-    return -1;
-}
-
 }  // namespace
 
 int FsTypeIndexOf(std::string_view type, std::string_view source) {
@@ -158,33 +152,32 @@ int QUIBFSTypeFromName(const char *type, const char *source) {
 
 int QUIBFSIsInMountTable(const char *path) {
     if (const int err = CheckPathArgument(path)) {
-        QUIB_SET_ERRNO(err);
-        return -1;
+        return NORVO_FAIL_ERRNO(err);
     }
     return Guarded(-1, [&] {
         const std::string absolute = AbsolutePath(path);
         if (absolute.empty()) {
-            return ErrnoFailure(errno, __LINE__);
+            return NORVO_FAIL_ERRNO(errno);
         }
         std::vector<MountEntry> entries;
         if (const int err = ReadMountTable(&entries)) {
-            return ErrnoFailure(err, __LINE__);
+            return NORVO_FAIL_ERRNO(err);
         }
-        const MountEntry *mount = FindHoldingMount(entries, absolute);
+        const MountEntry *mount = FindHoldingMount(entries, absolute, MountScope::kDataVolumes);
         return mount != nullptr ? FsTypeIndexOf(mount->type, mount->source) : -1;
     });
 }
 
 int QUIBGetFSType(const char *path, int flags) {
     if (const int err = CheckPathArgument(path)) {
-        return ErrnoFailure(err, __LINE__);
+        return NORVO_FAIL_ERRNO(err);
     }
     if (flags != 0 && flags != 1) {
-        return ErrnoFailure(EINVAL, __LINE__);
+        return NORVO_FAIL_ERRNO(EINVAL);
     }
     struct statfs info;
     if (statfs(path, &info) != 0) {
-        return ErrnoFailure(errno, __LINE__);
+        return NORVO_FAIL_ERRNO(errno);
     }
     return Guarded(-1, [&] {
         // statfs succeeded, so the path resolves: judge the mount by where it really lies.
@@ -193,7 +186,7 @@ int QUIBGetFSType(const char *path, int flags) {
         std::vector<MountEntry> entries;
         const MountEntry *mount = nullptr;
         if (!where.empty() && ReadMountTable(&entries) == 0) {
-            mount = FindHoldingMount(entries, where);
+            mount = FindHoldingMount(entries, where, MountScope::kAll);
         }
         if (mount == nullptr) {
             // No table (no /proc, or a root outside it): the kernel still knows whether the

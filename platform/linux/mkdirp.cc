@@ -89,10 +89,8 @@ using namespace norvo::platform;
 extern "C" int QUIBFSMkdirP(const char *path, char *stopAt, int stopAtSize, int recursive,
                             uid_t uid, gid_t gid, mode_t mode) {
     if (const int err = CheckPathArgument(path)) {
-        QUIB_SET_ERRNO(err);
         ReportStop(stopAt, stopAtSize, path != nullptr ? path : "");
-        errno = err;
-        return -1;
+        return NORVO_FAIL_ERRNO(err);
     }
     return Guarded(-1, [&] {
         const std::string_view whole(path);
@@ -108,10 +106,8 @@ extern "C" int QUIBFSMkdirP(const char *path, char *stopAt, int stopAtSize, int 
             current.Reset(open(start.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
             if (!current.IsOpen()) {
                 const int err = errno;
-                QUIB_SET_ERRNO(err);
                 ReportStop(stopAt, stopAtSize, whole);
-                errno = err;
-                return -1;
+                return NORVO_FAIL_ERRNO(err);
             }
             parent = current.Get();
         }
@@ -120,10 +116,8 @@ extern "C" int QUIBFSMkdirP(const char *path, char *stopAt, int stopAtSize, int 
             const int err = MakeOne(parent, std::string(parts[i].name), i + 1 == parts.size(), uid,
                                     gid, mode & 07777, &next);
             if (err != 0) {
-                QUIB_SET_ERRNO(err);
                 ReportStop(stopAt, stopAtSize, whole.substr(0, parts[i].end));
-                errno = err;
-                return -1;
+                return NORVO_FAIL_ERRNO(err);
             }
             current = std::move(next);
             parent = current.Get();

@@ -7,6 +7,8 @@
 
 #include <memory>
 
+#include "volume_name.h"
+
 namespace norvo::platform {
 namespace {
 
@@ -107,9 +109,14 @@ int ReadMountTable(std::vector<MountEntry> *entries) {
     return 0;
 }
 
-const MountEntry *FindHoldingMount(const std::vector<MountEntry> &entries, std::string_view path) {
+const MountEntry *FindHoldingMount(const std::vector<MountEntry> &entries, std::string_view path,
+                                   MountScope scope) {
     const MountEntry *best = nullptr;
+    size_t volumeLength = 0;
     for (const MountEntry &entry : entries) {
+        if (scope == MountScope::kDataVolumes && VolumeKindOf(entry.dir, &volumeLength) == 0) {
+            continue;
+        }
         if (DirHolds(entry.dir, path) && (best == nullptr || entry.dir.size() >= best->dir.size())) {
             best = &entry;
         }

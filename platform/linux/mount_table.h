@@ -22,11 +22,15 @@ struct MountEntry {
 // Reads /proc/self/mounts in kernel order. 0 and *entries, or the errno.
 [[nodiscard]] int ReadMountTable(std::vector<MountEntry> *entries);
 
-// The entry holding the normalised absolute path: the deepest mount directory that is the path
-// or a parent of it by whole components; of mounts stacked on one directory the last (the one
-// visible). null when none holds it.
+// Which mounts a lookup considers: all, or the data mounts only (those whose directory is a
+// volume or lies below one; the system disk and the host's other mounts are not data).
+enum class MountScope { kAll, kDataVolumes };
+
+// The entry holding the normalised absolute path: the deepest mount directory in scope that is
+// the path or a parent of it by whole components; of mounts stacked on one directory the last
+// (the one visible). null when none holds it.
 [[nodiscard]] const MountEntry *FindHoldingMount(const std::vector<MountEntry> &entries,
-                                                 std::string_view path);
+                                                 std::string_view path, MountScope scope);
 
 // FSTYPE_* index of a mount type name, with the source for FUSE mounts that carry no subtype.
 [[nodiscard]] int FsTypeIndexOf(std::string_view type, std::string_view source);

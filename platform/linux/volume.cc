@@ -7,6 +7,7 @@
 #include "api_guard.h"
 #include "fs_path.h"
 #include "quib_fs.h"
+#include "volume_name.h"
 
 namespace {
 
@@ -28,6 +29,28 @@ bool IsDigit(char c) {
 
 }  // namespace
 
+namespace norvo::platform {
+
+int VolumeKindOf(std::string_view path, size_t *prefixLength) {
+    for (const VolumePrefix &prefix : kPrefixes) {
+        if (path.compare(0, prefix.text.size(), prefix.text) != 0) {
+            continue;
+        }
+        size_t end = prefix.text.size();
+        while (end < path.size() && IsDigit(path[end])) {
+            ++end;
+        }
+        if (end == prefix.text.size() || (end < path.size() && path[end] != '/')) {
+            return 0;  // "/volume", "/volumeUSB", "/volume1x": no volume
+        }
+        *prefixLength = end;
+        return prefix.kind;
+    }
+    return 0;
+}
+
+}  // namespace norvo::platform
+
 extern "C" int VolumePathParse(const char *path, PVOLUME_INFO info) {
     if (info == nullptr) {
         QUIB_SET_ERR(QUIB_ERR_BAD_PARAMETER);
@@ -37,25 +60,13 @@ extern "C" int VolumePathParse(const char *path, PVOLUME_INFO info) {
         QUIB_SET_ERRNO(err);
         return -1;
     }
-    const std::string_view text(path);
-    for (const VolumePrefix &prefix : kPrefixes) {
-        if (text.compare(0, prefix.text.size(), prefix.text) != 0) {
-            continue;
-        }
-        size_t end = prefix.text.size();
-        while (end < text.size() && IsDigit(text[end])) {
-            ++end;
-        }
-        if (end == prefix.text.size() || (end < text.size() && text[end] != '/')) {
-            return 0;  // "/volume", "/volumeUSB", "/volume1x": no volume
-        }
-        if (end >= sizeof info->szVolumePath) {
-            return 0;  // no volume number is that long
-        }
-        memcpy(info->szVolumePath, path, end);
-        info->szVolumePath[end] = '\0';
-        info->kind = prefix.kind;
-        return 1;
+    size_t length = 0;
+    const int kind = norvo::platform::VolumeKindOf(path, &length);
+    if (kind == 0 || length >= sizeof info->szVolumePath) {
+        return 0;  // no volume number is that long
     }
-    return 0;
+    memcpy(info->szVolumePath, path, length);
+    info->szVolumePath[length] = '\0';
+    info->kind = kind;
+    return 1;
 }

@@ -29,6 +29,18 @@ namespace {
 
 using norvo::testing::Appliance;
 
+// Open descriptors of this process, to prove every path releases what it opened.
+int OpenDescriptors() {
+    int count = 0;
+    if (DIR *dir = opendir("/proc/self/fd")) {
+        while (readdir(dir) != nullptr) {
+            ++count;
+        }
+        closedir(dir);
+    }
+    return count;
+}
+
 constexpr unsigned kAlways = ACL_PERM_READ_ATTR | ACL_PERM_READ_ACL;
 constexpr unsigned kRead = ACL_PERM_READ | ACL_PERM_READ_XATTR;
 constexpr unsigned kWrite = ACL_PERM_WRITE | ACL_PERM_APPEND | ACL_PERM_WRITE_XATTR;
@@ -354,6 +366,25 @@ TEST_F(AclPerm, AgreesWithTheKernelOnGeneratedTrees) {
         }
     }
     EXPECT_EQ(appliance_.RunAs("alice", [&] { return CountDisagreements(entries); }), 0);
+}
+
+TEST_F(AclPerm, EveryPathReleasesItsDescriptors) {
+    appliance_.MountFat("/volume2/usb");
+    appliance_.MountDeadRemote("/volume1/remote");
+    appliance_.WriteFile("/volume1/s/file");
+    ASSERT_EQ(symlink("/volume1/s/file", "/volume1/s/link"), 0);
+    const int before = OpenDescriptors();
+    unsigned mask = 0;
+    for (int i = 0; i < 20; ++i) {
+        EXPECT_EQ(QUIBACLPermGet("/volume1/s/file", &mask), 0);
+        EXPECT_EQ(QUIBACLPermGet("/volume1/s/link", &mask), 0);
+        EXPECT_EQ(QUIBACLPermGet("/volume2/usb", &mask), -1);
+        EXPECT_EQ(QUIBACLPermGet("/volume1/remote/x", &mask), -1);
+        EXPECT_EQ(QUIBACLPermGet("/volume1/s/missing", &mask), -1);
+        EXPECT_EQ(QUIBACLIsSupport("/volume2/usb"), 0);
+        EXPECT_EQ(QUIBACLIsSupport("/volume1/s/file"), 1);
+    }
+    EXPECT_EQ(OpenDescriptors(), before);
 }
 
 }  // namespace

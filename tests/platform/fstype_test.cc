@@ -1,5 +1,6 @@
 // File-system type indexes: the name table and its aliases, the mount table (including a lost
 // network share, where everything but the table fails), and statfs-based lookups.
+#include <dirent.h>
 #include <errno.h>
 #include <limits.h>
 #include <string.h>
@@ -17,6 +18,18 @@
 namespace {
 
 using norvo::testing::Appliance;
+
+// Open descriptors of this process, to prove every path releases what it opened.
+int OpenDescriptors() {
+    int count = 0;
+    if (DIR *dir = opendir("/proc/self/fd")) {
+        while (readdir(dir) != nullptr) {
+            ++count;
+        }
+        closedir(dir);
+    }
+    return count;
+}
 
 TEST(FsTypeTable, HoldsThePlatformNamesInIndexOrder) {
     const char *expected[] = {"ext4", "vfat", "ext3", "btrfs", "tmpfs", "xfs", "exfat", "iso9660", "cifs"};
@@ -214,8 +227,43 @@ TEST(MountTable, BadArgumentsAreRefused) {
     EXPECT_EQ(QUIBFSIsInMountTable(""), -1);
     EXPECT_EQ(QUIBFSIsInMountTable(overlong.c_str()), -1);
     EXPECT_EQ(VLIBCErrGet(), QUIB_ERR_NAME_TOO_LONG);
+}
+
+// Only data mounts count: the system disk and whatever else is mounted outside the volumes
+// (here the host directories the sandbox binds in) are not in the table.
+TEST(MountTable, OnlyMountsOnVolumesAreDataMounts) {
+    Appliance appliance;
+    appliance.AddVolume("/volumeUSB1");
+    appliance.AddVolume("/mnt/elsewhere");
+    EXPECT_EQ(QUIBFSIsInMountTable("/volumeUSB1/share/a"), FSTYPE_TMPFS);
+    EXPECT_EQ(QUIBFSIsInMountTable("/mnt/elsewhere/x"), -1);
+    EXPECT_EQ(QUIBFSIsInMountTable("/srv/x"), -1);
+    EXPECT_EQ(QUIBFSIsInMountTable("/"), -1);
+    EXPECT_EQ(QUIBFSIsInMountTable("/volume1x"), -1);
+    EXPECT_EQ(QUIBFSIsInMountTable("/volume3/a"), -1) << "a volume that is not mounted";
+    EXPECT_EQ(QUIBFSIsInMountTable("/volume1/../srv"), -1);
     // Not UTF-8, but a path all the same: the kernel takes bytes.
-    EXPECT_NE(QUIBFSIsInMountTable("/\xff\xfe/x"), -1);
+    EXPECT_EQ(QUIBFSIsInMountTable("/volume1/\xff\xfe/x"), FSTYPE_TMPFS);
+    // statfs-based lookups see every mount.
+    EXPECT_EQ(QUIBGetFSType("/mnt/elsewhere", 1), FSTYPE_TMPFS);
+    EXPECT_NE(QUIBGetFSType("/srv", 0), -1);
+}
+
+TEST(MountTable, EveryPathReleasesItsDescriptors) {
+    Appliance appliance;
+    appliance.MountDeadRemote("/volume1/remote");
+    appliance.WriteFile("/tmp/exfat.img", std::string("\xEB\x76\x90" "EXFAT   ", 11));
+    const int before = OpenDescriptors();
+    for (int i = 0; i < 20; ++i) {
+        (void)QUIBFSIsInMountTable("/volume1/remote/x");
+        (void)QUIBFSIsInMountTable("relative");
+        (void)QUIBGetFSType("/volume1", 1);
+        (void)QUIBGetFSType("/volume1/remote/x", 0);
+        (void)QUIBGetFSType("/volume1/missing", 0);
+        (void)QUIBFSTypeFromName("fuseblk", "/tmp/exfat.img");
+        (void)QUIBFSTypeFromName("fuseblk", "/tmp/missing.img");
+    }
+    EXPECT_EQ(OpenDescriptors(), before);
 }
 
 }  // namespace

@@ -1,5 +1,6 @@
 // Login records: password check against a real crypt hash in shadow, sid issue, the sliding
 // expiry, purging, and refusal of hostile input and of a database that is not ours.
+#include <dirent.h>
 #include <errno.h>
 #include <stdio.h>
 #include <string.h>
@@ -23,6 +24,18 @@ namespace {
 
 using norvo::testing::Appliance;
 using norvo::testing::UserSpec;
+
+// Open descriptors of this process, to prove every path releases what it opened.
+int OpenDescriptors() {
+    int count = 0;
+    if (DIR *dir = opendir("/proc/self/fd")) {
+        while (readdir(dir) != nullptr) {
+            ++count;
+        }
+        closedir(dir);
+    }
+    return count;
+}
 
 struct PipeCloser {
     void operator()(FILE *pipe) const { pclose(pipe); }
@@ -301,6 +314,24 @@ TEST_F(Login, AForeignFileIsNoDatabase) {
     appliance_.WriteFile(QUIB_LOGIN_DB, "this is not a database", "root", 0600);
     EXPECT_EQ(LogIn("alice"), "");
     EXPECT_EQ(VLIBCErrGet(), QUIB_ERR_FAILED);
+}
+
+TEST_F(Login, EveryPathReleasesItsDescriptors) {
+    char user[64];
+    const int before = OpenDescriptors();
+    (void)QUIBLoginGet("AAAAAAAAAAAAAAAAAAAAAAAAAAAAAAAA", user, sizeof user);  // no database yet
+    for (int i = 0; i < 20; ++i) {
+        const std::string sid = LogIn("alice");
+        EXPECT_EQ(LogIn("alice", "wrong"), "");
+        EXPECT_EQ(LogIn("nosuchuser"), "");
+        EXPECT_EQ(UserOf(sid), "alice");
+        EXPECT_EQ(UserOf("BBBBBBBBBBBBBBBBBBBBBBBBBBBBBBBB"), "");
+        EXPECT_EQ(QUIBLoginGet(sid.c_str(), user, 2), -1);
+        EXPECT_EQ(QuibCgiUIDGet(sid.c_str(), "alice"), appliance_.Uid("alice"));
+        EXPECT_EQ(QUIBLoginRemove(sid.c_str()), 0);
+        EXPECT_EQ(QUIBLoginRemove(sid.c_str()), -1);
+    }
+    EXPECT_EQ(OpenDescriptors(), before);
 }
 
 }  // namespace

@@ -1,5 +1,6 @@
 // Directory creation with parents: owner and exact mode on what is created, nothing else
 // touched, and the component where creation stopped.
+#include <dirent.h>
 #include <errno.h>
 #include <limits.h>
 #include <string.h>
@@ -17,6 +18,18 @@
 namespace {
 
 using norvo::testing::Appliance;
+
+// Open descriptors of this process, to prove every path releases what it opened.
+int OpenDescriptors() {
+    int count = 0;
+    if (DIR *dir = opendir("/proc/self/fd")) {
+        while (readdir(dir) != nullptr) {
+            ++count;
+        }
+        closedir(dir);
+    }
+    return count;
+}
 
 struct Attributes {
     mode_t mode = 0;
@@ -185,6 +198,22 @@ TEST_F(MkdirP, BadArgumentsAreRefused) {
     // Names need not be UTF-8.
     EXPECT_EQ(QUIBFSMkdirP("/volume1/\xff\xfe", stop_, sizeof stop_, 1, 0, 0, 0755), 0);
     EXPECT_TRUE(AttributesOf("/volume1/\xff\xfe").isDir);
+}
+
+TEST_F(MkdirP, EveryPathReleasesItsDescriptors) {
+    appliance_.WriteFile("/volume1/file");
+    appliance_.MakeDir("/volume2/ro");
+    appliance_.RemountReadOnly("/volume2");
+    const int before = OpenDescriptors();
+    for (int i = 0; i < 20; ++i) {
+        const std::string fresh = "/volume1/n" + std::to_string(i) + "/a/b";
+        EXPECT_EQ(QUIBFSMkdirP(fresh.c_str(), stop_, sizeof stop_, 1, 0, 0, 0755), 0);
+        EXPECT_EQ(QUIBFSMkdirP("/volume1/file/a", stop_, sizeof stop_, 1, 0, 0, 0755), -1);
+        EXPECT_EQ(QUIBFSMkdirP("/volume2/ro/a/b", stop_, sizeof stop_, 1, 0, 0, 0755), -1);
+        EXPECT_EQ(QUIBFSMkdirP("/volume1/none/a", stop_, sizeof stop_, 0, 0, 0, 0755), -1);
+        EXPECT_EQ(QUIBFSMkdirP("/volume1/again", stop_, sizeof stop_, 1, 0, 0, 0755), 0);
+    }
+    EXPECT_EQ(OpenDescriptors(), before);
 }
 
 }  // namespace
