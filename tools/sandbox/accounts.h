@@ -19,10 +19,10 @@ public:
 
     // Adds the user (primary group "users") and any missing supplementary group. Fails on a
     // duplicate name or uid, or a name that can't appear in /etc/passwd.
-    void AddUser(const UserSpec &spec);
+    void AddUser(const UserSpec &account);
     // Adds the group, or adds members to the existing one. Fails when an explicit gid differs
     // from the existing group's or is taken.
-    void AddGroup(const GroupSpec &spec);
+    void AddGroup(const GroupSpec &account);
     // The root under which users without an explicit home get <root>/<name>.
     void SetHomesRoot(const std::string &root);
 

@@ -88,32 +88,32 @@ gid_t Accounts::NextGid() const {
     return gid;
 }
 
-void Accounts::AddUser(const UserSpec &spec) {
-    CheckName(spec.name, "user");
+void Accounts::AddUser(const UserSpec &account) {
+    CheckName(account.name, "user");
     uid_t ignoredUid;
     gid_t ignoredGid;
-    if (FindUser(spec.name, &ignoredUid, &ignoredGid)) Fail("user %s already exists", spec.name.c_str());
-    const uid_t uid = spec.uid != 0 ? spec.uid : NextUid();
+    if (FindUser(account.name, &ignoredUid, &ignoredGid)) Fail("user %s already exists", account.name.c_str());
+    const uid_t uid = account.uid != 0 ? account.uid : NextUid();
     for (const auto &user : users_)
         if (user.uid == uid) Fail("uid %u is already taken by %s", unsigned(uid), user.name.c_str());
-    if (spec.home.find_first_of(":\n") != std::string::npos) Fail("bad home \"%s\"", spec.home.c_str());
-    users_.push_back({spec.name, uid, kUsersGid, HashPassword(spec.password), spec.home, "/bin/sh",
-                      spec.expireDay});
+    if (account.home.find_first_of(":\n") != std::string::npos) Fail("bad home \"%s\"", account.home.c_str());
+    users_.push_back({account.name, uid, kUsersGid, HashPassword(account.password), account.home, "/bin/sh",
+                      account.expireDay});
     // Every local account of the appliance is listed in "users" as well as having it as primary.
     for (const std::string &name : [&] {
              std::vector<std::string> all{"users"};
-             all.insert(all.end(), spec.groups.begin(), spec.groups.end());
+             all.insert(all.end(), account.groups.begin(), account.groups.end());
              return all;
          }()) {
         Group &group = EnsureGroup(name, 0);
-        if (std::find(group.members.begin(), group.members.end(), spec.name) == group.members.end())
-            group.members.push_back(spec.name);
+        if (std::find(group.members.begin(), group.members.end(), account.name) == group.members.end())
+            group.members.push_back(account.name);
     }
 }
 
-void Accounts::AddGroup(const GroupSpec &spec) {
-    Group &group = EnsureGroup(spec.name, spec.gid);
-    for (const auto &member : spec.members) {
+void Accounts::AddGroup(const GroupSpec &account) {
+    Group &group = EnsureGroup(account.name, account.gid);
+    for (const auto &member : account.members) {
         CheckName(member, "member");
         if (std::find(group.members.begin(), group.members.end(), member) == group.members.end())
             group.members.push_back(member);
