@@ -38,9 +38,9 @@ QUIB_BEGIN_C
 // Looks the share up by name (case-insensitive, as SMB share names are). A name starting with
 // "/" is a path: the share whose path holds it (the deepest, by whole components, after lexical
 // normalisation; links are not followed), else the share named by its first component.
-// 0 and *pshare set (free with QUIBShareFree); -1 with 0x1400 when there is no such share,
-// 0x0900 when the configuration can't be read, 0x0D00 on bad argument (null, empty, invalid
-// UTF-8, a name over 256 or a path over 4096 bytes).
+// 0 and *pshare set (free with QUIBShareFree); -1 with 0x1400 when there is no such share
+// (also for a name no share can carry: invalid UTF-8, a name over 256 or a path over 4096
+// bytes), 0x0900 when the configuration can't be read, 0x0D00 for a null or empty name.
 QUIB_API int QUIBShareGet(const char *name, PQUIBSHARE *pshare);
 QUIB_API void QUIBShareFree(PQUIBSHARE share);
 

@@ -109,8 +109,9 @@ int QUIBShareGet(const char *name, PQUIBSHARE *pshare) {
     bool acceptable = isPath ? strnlen(name, np::kMaxSharePathArg + 1) <= np::kMaxSharePathArg &&
                                    np::IsValidUtf8(name)
                              : np::IsAcceptableName(name);
+    // No share can carry such a name: the answer is the ordinary "no such share".
     if (!acceptable) {
-        QUIB_SET_ERR(QUIB_ERR_BAD_PARAMETER);
+        QUIB_SET_ERR(name[0] == '\0' ? QUIB_ERR_BAD_PARAMETER : QUIB_ERR_NO_SUCH_SHARE);
         return -1;
     }
     return np::Guarded(-1, [&] {

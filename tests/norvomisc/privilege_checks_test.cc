@@ -227,3 +227,26 @@ TEST(Encryption, SharesHomesAndMissingShares) {
 }
 
 }  // namespace
+
+namespace {
+
+TEST(AclLogs, UnexpectedPlatformErrorsAreLogged) {
+    norvo::testing::Appliance app;
+    app.WriteFile("/volume1/file", "x");
+    // A parent that is not a directory is none of the quiet cases.
+    EXPECT_EQ(GetACLPrivilege("/volume1/file/x"), 8191u);
+    EXPECT_EQ(ACLAccess("/volume1/file/x", 0x1), -1);
+    EXPECT_EQ(app.ErrorLines(),
+              (Lines{"norvomisc.cpp:# Failed to get the ACL Privilege: file = /volume1/file/x, euid = 0, reason=[700]",
+                     "norvomisc.cpp:# Failed to get the ACL Privilege: file = /volume1/file/x, reason=[700]"}));
+}
+
+TEST(DirList, AFolderThatCanBeEnteredButNotRead) {
+    norvo::testing::Appliance app;
+    app.Basic();
+    app.MakeDir("/volume1/photo/dropbox", "alice", 0711);
+    EXPECT_EQ(app.RunAs("bob", [] { return CheckDirListPrivilege("/volume1/photo/dropbox") ? 0 : NvoLibGetErr() - 400; }), 7);
+    EXPECT_EQ(app.ErrorLines(), (Lines{"norvomisc.cpp:# Failed to opendir /volume1/photo/dropbox. [Permission denied]"}));
+}
+
+}  // namespace

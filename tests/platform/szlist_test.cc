@@ -15,31 +15,28 @@
 
 namespace {
 
+using Strings = std::vector<std::string>;
 struct ListFree {
     void operator()(PSZLIST list) const { VLIBCSzListFree(list); }
 };
 using List = std::unique_ptr<SZLIST, ListFree>;
 
-List Make(const std::vector<std::string> &items) {
-    List list(VLIBCSzListAlloc(1));
-    EXPECT_NE(list, nullptr);
+// Pushes through a raw pointer, as callers do: *plist may move when the list grows.
+List Make(const Strings &items) {
+    PSZLIST raw = VLIBCSzListAlloc(1);
     for (const std::string &item : items) {
-        PSZLIST raw = list.release();
         EXPECT_EQ(VLIBCSzListPush(&raw, item.c_str()), 0);
-        list.reset(raw);
     }
-    return list;
+    return List(raw);
 }
 
-std::vector<std::string> Items(const List &list) {
-    std::vector<std::string> out;
+Strings Items(const List &list) {
+    Strings out;
     for (int i = 0; i < VLIBCSzListCount(list.get()); ++i) {
         out.emplace_back(VLIBCSzListGet(list.get(), i));
     }
     return out;
 }
-
-using Strings = std::vector<std::string>;
 
 TEST(SzList, GrowsPastItsCapacityAndKeepsCopies) {
     List list(VLIBCSzListAlloc(0));
@@ -52,7 +49,7 @@ TEST(SzList, GrowsPastItsCapacityAndKeepsCopies) {
         ASSERT_EQ(VLIBCSzListPush(&raw, buf), 0);
         list.reset(raw);
     }
-    strcpy(buf, "changed");  // the list holds its own copies
+    strcpy(buf, "changed");
     ASSERT_EQ(VLIBCSzListCount(list.get()), 1000);
     EXPECT_STREQ(VLIBCSzListGet(list.get(), 0), "item0");
     EXPECT_STREQ(VLIBCSzListGet(list.get(), 999), "item999");
@@ -66,67 +63,63 @@ TEST(SzList, GrowsPastItsCapacityAndKeepsCopies) {
     EXPECT_EQ(VLIBCSzListGet(list.get(), 0), nullptr);
 }
 
-TEST(SzList, NullAndBadArguments) {
+TEST(SzList, NullAndBadArgumentsChangeNothing) {
     EXPECT_EQ(VLIBCSzListCount(nullptr), 0);
     EXPECT_EQ(VLIBCSzListGet(nullptr, 0), nullptr);
     VLIBCSzListFree(nullptr);
     VLIBCSzListRemoveAll(nullptr);
-
-    EXPECT_EQ(VLIBCSzListPush(nullptr, "x"), -1);
-    EXPECT_EQ(VLIBCErrGet(), QUIB_ERR_BAD_PARAMETER);
-    PSZLIST none = nullptr;
-    EXPECT_EQ(VLIBCSzListPush(&none, "x"), -1);
     List list = Make({});
     PSZLIST raw = list.get();
-    EXPECT_EQ(VLIBCSzListPush(&raw, nullptr), -1);
-    EXPECT_EQ(VLIBCSzListSortItems(nullptr, 0), -1);
+    PSZLIST none = nullptr;
+    const struct {
+        const char *what;
+        int rc;
+    } rows[] = {
+        {"push to null", VLIBCSzListPush(nullptr, "x")},
+        {"push to *null", VLIBCSzListPush(&none, "x")},
+        {"push null", VLIBCSzListPush(&raw, nullptr)},
+        {"sort null", VLIBCSzListSortItems(nullptr, 0)},
+        {"split null", VLIBCStrTok(nullptr, ",", &raw)},
+        {"split by null", VLIBCStrTok("a", nullptr, &raw)},
+        {"split into null", VLIBCStrTok("a", ",", nullptr)},
+        {"split into *null", VLIBCStrTok("a", ",", &none)},
+    };
+    for (const auto &row : rows) {
+        EXPECT_EQ(row.rc, -1) << row.what;
+    }
+    EXPECT_EQ(VLIBCErrGet(), QUIB_ERR_BAD_PARAMETER);
     EXPECT_EQ(VLIBCSzListCount(list.get()), 0);
+    EXPECT_EQ(none, nullptr);
+
+    for (int flags : {0x08, 0x20, 0x100, SZLIST_SORT_CASE_SENSITIVE | SZLIST_SORT_CASE_INSENSITIVE, -1}) {
+        List two = Make({"b", "a"});
+        VLIBCErrSetEx(0, "", 0);
+        EXPECT_EQ(VLIBCSzListSortItems(two.get(), flags), -1) << flags;
+        EXPECT_EQ(VLIBCErrGet(), QUIB_ERR_BAD_PARAMETER) << flags;
+        EXPECT_EQ(Items(two), (Strings{"b", "a"})) << flags;
+    }
 }
 
-TEST(SzList, PushKeepsArbitraryBytes) {
-    List list = Make({"", "caf\xc3\xa9", "\xff\xfe"});
-    EXPECT_EQ(Items(list), (Strings{"", "caf\xc3\xa9", "\xff\xfe"}));
-}
-
+// Fixed points the reference below can't vouch for, as it follows the same reading of the flags.
 TEST(SzListSort, Orders) {
     const struct {
         int flags;
         Strings input;
         Strings expected;
-    } cases[] = {
+    } rows[] = {
         {0, {"b", "B", "a", "A"}, {"A", "B", "a", "b"}},
-        {SZLIST_SORT_CASE_SENSITIVE, {"b", "B", "a", "A"}, {"A", "B", "a", "b"}},
-        // Stable: items equal ignoring case keep their input order.
         {SZLIST_SORT_CASE_INSENSITIVE, {"b", "B", "a", "A"}, {"a", "A", "b", "B"}},
-        {SZLIST_SORT_CASE_INSENSITIVE, {"Photo", "music", "homes", "Music"},
-         {"homes", "music", "Music", "Photo"}},
         {SZLIST_SORT_CASE_INSENSITIVE | SZLIST_SORT_DESC, {"b", "B", "a", "A"}, {"b", "B", "a", "A"}},
-        {SZLIST_SORT_DESC, {"a", "c", "b"}, {"c", "b", "a"}},
-        // Numeric: the leading integer; none counts as 0; equal numbers keep their order.
         {SZLIST_SORT_NUMERIC, {"10", "9", "x", "-1", "09", "2abc"}, {"-1", "x", "2abc", "9", "09", "10"}},
-        {SZLIST_SORT_NUMERIC | SZLIST_SORT_DESC, {"1", "30", "200"}, {"200", "30", "1"}},
-        {0, {}, {}},
-        {0, {"only"}, {"only"}},
-        // Byte order: UTF-8 sorts after ASCII.
         {0, {"\xc3\xa9t\xc3\xa9", "zoo", "Zoo"}, {"Zoo", "zoo", "\xc3\xa9t\xc3\xa9"}},
     };
-    for (const auto &c : cases) {
-        List list = Make(c.input);
-        ASSERT_EQ(VLIBCSzListSortItems(list.get(), c.flags), 0);
-        EXPECT_EQ(Items(list), c.expected) << "flags " << c.flags;
+    for (const auto &row : rows) {
+        List list = Make(row.input);
+        ASSERT_EQ(VLIBCSzListSortItems(list.get(), row.flags), 0);
+        EXPECT_EQ(Items(list), row.expected) << "flags " << row.flags;
     }
 }
 
-TEST(SzListSort, RejectsUnknownOrContradictoryFlags) {
-    for (int flags : {0x08, 0x20, 0x100, SZLIST_SORT_CASE_SENSITIVE | SZLIST_SORT_CASE_INSENSITIVE, -1}) {
-        List list = Make({"b", "a"});
-        EXPECT_EQ(VLIBCSzListSortItems(list.get(), flags), -1) << flags;
-        EXPECT_EQ(VLIBCErrGet(), QUIB_ERR_BAD_PARAMETER);
-        EXPECT_EQ(Items(list), (Strings{"b", "a"}));
-    }
-}
-
-// The reference: an insertion sort, stable by construction, over the documented comparisons.
 int ReferenceCompare(const std::string &a, const std::string &b, int flags) {
     if (flags & SZLIST_SORT_NUMERIC) {
         long long x = strtoll(a.c_str(), nullptr, 10);
@@ -137,12 +130,12 @@ int ReferenceCompare(const std::string &a, const std::string &b, int flags) {
                                                   : strcmp(a.c_str(), b.c_str());
 }
 
+// An insertion sort: stable by construction.
 Strings ReferenceSort(Strings items, int flags) {
     for (size_t i = 1; i < items.size(); ++i) {
         for (size_t j = i; j > 0; --j) {
             int cmp = ReferenceCompare(items[j - 1], items[j], flags);
-            bool outOfOrder = (flags & SZLIST_SORT_DESC) ? cmp < 0 : cmp > 0;
-            if (!outOfOrder) {
+            if ((flags & SZLIST_SORT_DESC) ? cmp >= 0 : cmp <= 0) {
                 break;
             }
             std::swap(items[j - 1], items[j]);
@@ -164,8 +157,7 @@ TEST(SzListSort, AgreesWithReferenceOnGeneratedLists) {
     for (int round = 0; round < 300; ++round) {
         Strings items(rng() % 40);
         for (std::string &item : items) {
-            size_t len = rng() % 5;
-            for (size_t i = 0; i < len; ++i) {
+            for (size_t i = 0, len = rng() % 5; i < len; ++i) {
                 item += alphabet[rng() % (sizeof alphabet - 1)];
             }
         }
@@ -177,61 +169,29 @@ TEST(SzListSort, AgreesWithReferenceOnGeneratedLists) {
     }
 }
 
-TEST(StrTok, Splits) {
+// Every split appends to a list that already holds "keep".
+TEST(StrTok, SplitsAndAppends) {
     const struct {
         const char *text;
         const char *delims;
-        Strings expected;
-    } cases[] = {
+        Strings pieces;
+    } rows[] = {
         {"a,b,c", ",", {"a", "b", "c"}},
-        {"a,,b", ",", {"a", "b"}},
-        {",,a,b,,", ",", {"a", "b"}},
+        {",,a,,b,,", ",", {"a", "b"}},
         {"", ",", {}},
         {",,,", ",", {}},
         {"a b,c\td", " ,\t", {"a", "b", "c", "d"}},
-        {"no delimiter", ",", {"no delimiter"}},
         {"whole", "", {"whole"}},
         {"caf\xc3\xa9,th\xc3\xa9", ",", {"caf\xc3\xa9", "th\xc3\xa9"}},
     };
-    for (const auto &c : cases) {
-        List list = Make({});
-        PSZLIST raw = list.release();
-        EXPECT_EQ(VLIBCStrTok(c.text, c.delims, &raw), static_cast<int>(c.expected.size())) << c.text;
-        list.reset(raw);
-        EXPECT_EQ(Items(list), c.expected) << c.text;
+    for (const auto &row : rows) {
+        PSZLIST raw = Make({"keep"}).release();
+        EXPECT_EQ(VLIBCStrTok(row.text, row.delims, &raw), static_cast<int>(row.pieces.size())) << row.text;
+        List list(raw);
+        Strings expected{"keep"};
+        expected.insert(expected.end(), row.pieces.begin(), row.pieces.end());
+        EXPECT_EQ(Items(list), expected) << row.text;
     }
-}
-
-TEST(StrTok, AppendsToWhatIsThere) {
-    List list = Make({"keep"});
-    PSZLIST raw = list.release();
-    EXPECT_EQ(VLIBCStrTok("x:y", ":", &raw), 2);
-    list.reset(raw);
-    EXPECT_EQ(Items(list), (Strings{"keep", "x", "y"}));
-}
-
-TEST(StrTok, ManyPiecesGrowTheList) {
-    std::string text;
-    for (int i = 0; i < 5000; ++i) {
-        text += std::to_string(i) + ";";
-    }
-    List list = Make({});
-    PSZLIST raw = list.release();
-    EXPECT_EQ(VLIBCStrTok(text.c_str(), ";", &raw), 5000);
-    list.reset(raw);
-    EXPECT_STREQ(VLIBCSzListGet(list.get(), 4999), "4999");
-}
-
-TEST(StrTok, BadArguments) {
-    List list = Make({});
-    PSZLIST raw = list.get();
-    PSZLIST none = nullptr;
-    EXPECT_EQ(VLIBCStrTok(nullptr, ",", &raw), -1);
-    EXPECT_EQ(VLIBCErrGet(), QUIB_ERR_BAD_PARAMETER);
-    EXPECT_EQ(VLIBCStrTok("a", nullptr, &raw), -1);
-    EXPECT_EQ(VLIBCStrTok("a", ",", nullptr), -1);
-    EXPECT_EQ(VLIBCStrTok("a", ",", &none), -1);
-    EXPECT_EQ(VLIBCSzListCount(list.get()), 0);
 }
 
 }  // namespace

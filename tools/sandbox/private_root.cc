@@ -64,6 +64,17 @@ void CopySymlink(const std::string &hostPath, const std::string &target) {
     if (symlink(link, target.c_str()) != 0) FailErrno("can't create the link %s", target.c_str());
 }
 
+// Files of the appliance's own that a host might happen to hold: the overlay hides them.
+const char *const kApplianceTmpFiles[] = {"quib_login.db", "quib_login.db-journal"};
+
+template <size_t N>
+void HideHostFiles(const std::string &dir, const char *const (&names)[N]) {
+    for (const char *name : names) {
+        const std::string path = dir + "/" + name;
+        if (unlink(path.c_str()) != 0 && errno != ENOENT) FailErrno("can't hide %s", path.c_str());
+    }
+}
+
 // The host's directory seen through an overlay whose upper layer is on the private root, so
 // the appliance can add and replace files without the host seeing it.
 void MountOverlay(const std::string &hostPath, const std::string &newRoot) {
@@ -74,6 +85,10 @@ void MountOverlay(const std::string &hostPath, const std::string &newRoot) {
     MakeDir(state + "/work", 0700);
     struct stat st {};
     if (stat(hostPath.c_str(), &st) != 0) FailErrno("can't examine %s", hostPath.c_str());
+    // The merged directory shows the upper layer's mode and owner: a private /tmp stays 1777.
+    if (chmod((state + "/upper").c_str(), st.st_mode & 07777) != 0 ||
+        chown((state + "/upper").c_str(), st.st_uid, st.st_gid) != 0)
+        FailErrno("can't prepare the overlay of %s", hostPath.c_str());
     MakeDir(newRoot + hostPath, st.st_mode & 07777);
     const std::string options = "lowerdir=" + hostPath + ",upperdir=" + state +
                                 "/upper,workdir=" + state + "/work";
@@ -127,7 +142,10 @@ void PopulateRoot(const std::string &newRoot) {
         } else if (name == "etc" || name == "usr") {
             MountOverlay(host, newRoot);
         } else if (name == "tmp") {
-            MountTmpfs(target, "1777");
+            // An overlay, not a fresh tmpfs: programs built under the host's /tmp (a CI clone)
+            // must stay reachable, while whatever the appliance writes there stays private.
+            MountOverlay(host, newRoot);
+            HideHostFiles(target, kApplianceTmpFiles);
         } else if (name == "run" || name == "etc.defaults") {
             // /run fresh too: a host nscd or sssd socket there would answer for the host's users.
             MountTmpfs(target, "0755");

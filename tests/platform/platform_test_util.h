@@ -1,0 +1,48 @@
+// Helpers shared by the platform tests.
+#pragma once
+
+#include <dirent.h>
+#include <errno.h>
+
+#include <ostream>
+
+#include "vlibc_err.h"
+
+namespace norvo::testing {
+
+// Open descriptors of this process, to prove every path releases what it opened.
+inline int OpenDescriptors() {
+    int count = 0;
+    if (DIR *dir = opendir("/proc/self/fd")) {
+        while (readdir(dir) != nullptr) {
+            ++count;
+        }
+        closedir(dir);
+    }
+    return count;
+}
+
+// What a call left behind: its result, the error slot and errno (kAnyErrno: not compared).
+constexpr int kAnyErrno = -1;
+struct Outcome {
+    long rc;
+    int slot;
+    int err = kAnyErrno;
+};
+inline bool operator==(const Outcome &a, const Outcome &b) {
+    return a.rc == b.rc && a.slot == b.slot && (a.err == kAnyErrno || b.err == kAnyErrno || a.err == b.err);
+}
+inline std::ostream &operator<<(std::ostream &out, const Outcome &o) {
+    return out << "{rc " << o.rc << ", slot 0x" << std::hex << o.slot << std::dec << ", errno " << o.err << "}";
+}
+
+// Runs call with errno and the error slot cleared first, so neither can be left from before.
+template <typename F>
+Outcome OutcomeOf(F &&call) {
+    errno = 0;
+    VLIBCErrSetEx(QUIB_ERR_NONE, "", 0);
+    const long rc = static_cast<long>(call());
+    return {rc, VLIBCErrGet(), errno};
+}
+
+}  // namespace norvo::testing
