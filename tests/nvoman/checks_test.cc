@@ -1,3 +1,4 @@
+#include <stdlib.h>
 #include <sys/mount.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -10,6 +11,7 @@
 #include "appliance.h"
 #include "norvo/errors.h"
 #include "norvo/nvoman.h"
+#include "quib_login.h"
 #include "vlibc_err.h"
 
 namespace {
@@ -159,6 +161,7 @@ TEST(TmpDir, CreatesBothLevelsOpenToAll) {
     EXPECT_EQ(st.st_mode & 07777, 0777u);
     ASSERT_EQ(stat("/volume1/@tmp", &st), 0);
     EXPECT_EQ(st.st_mode & 07777, 0777u);
+    EXPECT_EQ(umask(022), 0u);  // left open for every user's search
     EXPECT_EQ(NvoCreateTmpDir("/volume1"), 0);  // again: nothing to do
 }
 
@@ -176,6 +179,33 @@ TEST(TmpDir, LeavesWhatStandsThereAndFailsBelowAFile) {
     EXPECT_EQ(app.ErrorLines(),
               (Lines{"nvoman.cpp(#)Failed to mkdir : /volume2/@tmp/norvo , reason=Not a directory[20]",
                      "nvoman.cpp(#) Bad Parameter", "nvoman.cpp(#) Bad Parameter"}));
+}
+
+}  // namespace
+
+namespace {
+
+TEST(Authorized, NeedsALiveLoginAndTheApplicationPrivilege) {
+    Appliance app;
+    app.Basic();
+    app.AddUser("carol");
+    app.SetAppPrivilege("QUIB.TVQ.App.Tovana3.Instance", "@staff");
+    char sid[128] = {0};
+    ASSERT_EQ(QUIBLoginCreate("alice", "secret", "127.0.0.1", sid, sizeof(sid)), 0);
+    char carolSid[128] = {0};
+    ASSERT_EQ(QUIBLoginCreate("carol", "secret", "127.0.0.1", carolSid, sizeof(carolSid)), 0);
+
+    const auto authorized = [](const std::string &cookie) {
+        setenv("HTTP_COOKIE", cookie.c_str(), 1);
+        WebMan webman;
+        return IsAuthorized(webman, "test");
+    };
+    EXPECT_TRUE(authorized(std::string("lang=en; id=") + sid));
+    EXPECT_FALSE(authorized(std::string("id=") + carolSid));  // logged in, but not a file-manager user
+    EXPECT_FALSE(authorized("id=forged"));
+    EXPECT_FALSE(authorized(""));
+    QUIBLoginRemove(sid);
+    EXPECT_FALSE(authorized(std::string("id=") + sid));
 }
 
 }  // namespace
