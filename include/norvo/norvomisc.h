@@ -1,6 +1,10 @@
-// Permission conversions, ACL checks, and the share-level list, download and upload checks.
+// String and name utilities; permission conversions, ACL checks, and the share-level list,
+// download and upload checks.
 #pragma once
 #include <string>
+#include <vector>
+
+#include <json/value.h>
 
 #include "norvo/export.h"
 
@@ -34,3 +38,53 @@ NORVO_API int NvoLibFileSystemSupported(const char *path);
 NORVO_API int NvoLibCheckEncryptShare(const std::string &share, bool *encrypted);
 
 NORVO_END_C
+
+// ---- String and name utilities ----
+
+NORVO_BEGIN_C
+
+// 1 when subject matches pattern as a whole, else 0: "*" any run, "?" one character, esc makes
+// the next pattern character literal; UTF-8 code points compared after ICU default case folding.
+// Worst case bounded by pattern length times subject length.
+NORVO_API int NvoLibStrLikeCompare(const char *pattern, const char *subject, int esc);
+// *out = src with every non-overlapping occurrence of from replaced by to, scanning left to right
+// (inserted text is not searched again). 1 replaced, 0 nothing found (*out a copy), -1 for a null
+// or empty argument or no memory. The caller frees *out.
+NORVO_API int NvoLibStrReplace(const char *src, const char *from, const char *to, char **out);
+// The same with two pairs, tried in one left-to-right scan, from1 before from2 at each position.
+NORVO_API int NvoLibTwoStrReplace(const char *src, const char *from1, const char *to1, const char *from2,
+                                  const char *to2, char **out);
+// Lower-cases every byte in place (tolower). 0, or -1 for null.
+NORVO_API int NvoLibStringToLower(char *text);
+// Pointer into name just after the extension's dot, or null (no extension, a leading dot only,
+// a trailing dot, a name shorter than 2). The scan starts at start when 1 < start < length.
+NORVO_API const char *ReturnFileExt(const char *name, int start);
+// Writes size as "N Bytes", "N KB", "N MB" or "N GB" ("%5.2f" with fraction). 1 written, 0 not
+// (null buffer, len <= 0, size <= 0).
+NORVO_API int FileUnitGet(long long size, char *buf, int len, bool fraction);
+// 1 when text is well formed by the UTF-8 lead-byte rules (null and empty count), else 0.
+NORVO_API int IsUnicodeString(const char *text);
+// 1 and out = the elements' paths (from their first "/") joined by ", "; 0 with 401 when value is
+// not an array.
+NORVO_API int ParseJsonPathToString(const Json::Value &value, std::string &out);
+// out = the icon file name of a listed entry ("misc.png", "<ext>.png", "folder.png",
+// "isomountpoint.png", "remotemountpoint.png", "recycle_bin.png"). realPath is the entry's real
+// path, sharePath its path within the share.
+NORVO_API void GetImgFileExt(const char *name, bool isDir, std::string &out, const std::string &realPath,
+                             const std::string &sharePath);
+// out = the file names of text's delim-separated paths, joined by sep. An empty delim leaves out.
+NORVO_API void StringExplodeToFileNameString(std::string &out, const std::string &text, const char *delim,
+                                             const char *sep);
+
+NORVO_END_C
+
+// The bytes of hex decoded two characters at a time, up to the first zero byte.
+NORVO_API std::string NvoLibHex2Bin(const char *hex);
+// Splits text at delim: no leading empty piece for a delimiter at index 0, empty pieces between
+// adjacent delimiters kept, the rest after the last delimiter always pushed. An empty delim does
+// nothing.
+NORVO_API void StringExplode(std::vector<std::string> &out, const std::string &text, const char *delim);
+NORVO_API void StringExplode(const std::string &text, const char *delim, void (*callback)(const std::string &, void *),
+                             void *user);
+// The longest common parent directory of paths, ending in "/", or "".
+NORVO_API std::string FindCommonParent(std::vector<std::string> paths);
