@@ -30,6 +30,10 @@ typedef struct _tag_QUIBGROUP_ {
     PSZLIST pMembers;  // explicit members (not users whose primary group this is)
 } QUIBGROUP, *PQUIBGROUP;
 
+// Cursors over the whole user and group databases (see QUIBUserDBOpen).
+typedef struct _tag_QUIBUSER_DB_ QUIBUSER_DB, *PQUIBUSER_DB;
+typedef struct _tag_QUIBGROUP_DB_ QUIBGROUP_DB, *PQUIBGROUP_DB;
+
 QUIB_BEGIN_C
 
 // The kind of account a name denotes (AUTH_LOCAL, AUTH_DOMAIN or AUTH_LDAP); a backslash wins
@@ -37,7 +41,8 @@ QUIB_BEGIN_C
 QUIB_API AUTH_TYPE QUIBUserAuthTypeOf(const char *name);
 
 // 0 and *puser (free with QUIBUserFree); -1 with 0x1D00 when unknown, 0x0D00 on bad argument
-// (null, empty, over 256 bytes, control characters, invalid UTF-8), 0x8100 when NSS fails.
+// (null, empty, over 256 bytes, control characters, invalid UTF-8), 0x8100 when NSS fails
+// (0x0300 when it was refused access, e.g. to shadow).
 // Nothing is cached, so blNoCache changes nothing.
 QUIB_API int QUIBUserGet(const char *name, PQUIBUSER *puser);
 QUIB_API int QUIBUserGetByUID(uid_t uid, PQUIBUSER *puser, int blNoCache);
@@ -57,6 +62,31 @@ QUIB_API void QUIBGroupFree(PQUIBGROUP group);
 // 1 when user belongs to group (primary or supplementary, via getgrouplist), 0 not, -1 failure
 // (0x1D00 unknown user, 0x1E00 unknown group).
 QUIB_API int QUIBGroupIsMember(const char *group, const char *user);
+
+// Every group id of user, its primary group first, as decimal text appended to *plist (which
+// may move as it grows). flags is reserved: it must be 0. 0 on success; -1 with 0x0D00 for a bad
+// user (as for names), a null plist or *plist, or other flags; 0x1D00 when the user is unknown;
+// 0x8100 when NSS fails; 0x2B00 when out of memory (then some ids may have been appended).
+QUIB_API int QUIBGroupInfoGetgroupList(const char *user, PSZLIST *plist, int flags);
+
+// A cursor over every account NSS enumerates (getpwent), local, domain and directory alike
+// (winbind and sssd list theirs only when their enumeration is switched on). Open takes a
+// snapshot of the whole database; null on failure with 0x8100 (NSS failed, or a record would
+// not fit in 16 MiB) or 0x2B00. Close with QUIBUserDBClose (null is ignored).
+QUIB_API PQUIBUSER_DB QUIBUserDBOpen(void);
+// The next account of the snapshot whose kind (QUIBUserAuthTypeOf of its name) is one of the
+// bits of type: 0 with *puser refilled (the record passed in is freed; start with null), 1 at
+// the end (the last record stays the caller's, to free with QUIBUserFree), -1 on failure with
+// *puser untouched: 0x0D00 for a null db or puser or a type with none of the three bits,
+// 0x2B00 out of memory. Nothing is cached between snapshots, so blNoCache changes nothing.
+QUIB_API int QUIBUserDBGetByCursor(PQUIBUSER_DB db, PQUIBUSER *puser, AUTH_TYPE type, int blNoCache);
+QUIB_API void QUIBUserDBClose(PQUIBUSER_DB db);
+
+// The same over every group NSS enumerates (getgrent); a group's kind is told by its name as an
+// account's is ("CORP\domain users" is a domain group). Records as from QUIBGroupGet.
+QUIB_API PQUIBGROUP_DB QUIBGroupDBOpen(void);
+QUIB_API int QUIBGroupDBGetByCursor(PQUIBGROUP_DB db, PQUIBGROUP *pgroup, AUTH_TYPE type, int blNoCache);
+QUIB_API void QUIBGroupDBClose(PQUIBGROUP_DB db);
 
 // 1 when user is a member of the administrators group, 0 not, -1 failure (0x1D00 when the
 // user is unknown). Domain and directory accounts count (as the Ex call with blWithDomain 1).

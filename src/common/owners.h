@@ -23,6 +23,15 @@ struct SzListFree {
 struct ShareDBClose {
     void operator()(PQUIBSHARE_DB db) const { QUIBShareDBClose(db); }
 };
+struct GroupFree {
+    void operator()(PQUIBGROUP g) const { QUIBGroupFree(g); }
+};
+struct UserDBClose {
+    void operator()(PQUIBUSER_DB db) const { QUIBUserDBClose(db); }
+};
+struct GroupDBClose {
+    void operator()(PQUIBGROUP_DB db) const { QUIBGroupDBClose(db); }
+};
 struct MallocFree {
     void operator()(void *p) const { free(p); }
 };
@@ -34,8 +43,30 @@ using ShareRecord = std::unique_ptr<QUIBSHARE, ShareFree>;
 using UserRecord = std::unique_ptr<QUIBUSER, UserFree>;
 using SzList = std::unique_ptr<SZLIST, SzListFree>;
 using ShareDB = std::unique_ptr<QUIBSHARE_DB, ShareDBClose>;
+using GroupRecord = std::unique_ptr<QUIBGROUP, GroupFree>;
+using UserDB = std::unique_ptr<QUIBUSER_DB, UserDBClose>;
+using GroupDB = std::unique_ptr<QUIBGROUP_DB, GroupDBClose>;
 using CString = std::unique_ptr<char, MallocFree>;
 using DirHandle = std::unique_ptr<DIR, DirClose>;
+
+// The record slot a platform cursor refills in place: the cursor frees the record passed in
+// and leaves the last one to the caller, which this frees whatever way the walk ends.
+template <typename Record, void (*Free)(Record *)>
+class CursorSlot {
+public:
+    CursorSlot() = default;
+    ~CursorSlot() { Free(record_); }
+    CursorSlot(const CursorSlot &) = delete;
+    CursorSlot &operator=(const CursorSlot &) = delete;
+
+    Record **Out() { return &record_; }
+    Record *operator->() const { return record_; }
+
+private:
+    Record *record_ = nullptr;
+};
+using UserCursorSlot = CursorSlot<QUIBUSER, QUIBUserFree>;
+using GroupCursorSlot = CursorSlot<QUIBGROUP, QUIBGroupFree>;
 
 // A platform lookup that fills a raw pointer, wrapped: returns the record or null.
 inline ShareRecord GetShare(const char *name) {
