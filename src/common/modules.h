@@ -6,4 +6,5 @@ inline constexpr char kNorvoDir[] = "norvodir.cpp";
 inline constexpr char kNvoMan[] = "nvoman.cpp";
 inline constexpr char kNorvoMisc[] = "norvomisc.cpp";
 inline constexpr char kNorvoEnum[] = "norvoenum.cpp";
+inline constexpr char kNorvoSearch[] = "norvosearch.cpp";
 }  // namespace norvo

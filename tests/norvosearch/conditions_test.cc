@@ -1,0 +1,241 @@
+// The file-index records each condition builds, the chains linking makes, and the factory's
+// results: records are read by walking their links, as the index would.
+#include <limits.h>
+#include <string.h>
+
+#include <functional>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include <gtest/gtest.h>
+
+#include "appliance.h"
+#include "norvo/errors.h"
+#include "norvo/norvosearch.h"
+
+namespace {
+
+using namespace FileSearch;
+using Field = FindFactory::_tag_FIND_FIELD_;
+using Chains = std::vector<std::string>;
+
+// A record and everything its links reach: "{type op value &{and...} |{or...}}".
+std::string Chain(const __tag_FI_SQL_COND *r, int depth = 0) {
+    if (r == nullptr || depth > 64) {
+        return r == nullptr ? "" : "{...}";
+    }
+    static const char *const kOps[] = {"=", "?1", "<", "?3", ">", ">=", "~", "?7", "path~", "path!~"};
+    std::string text = "{" + std::to_string(r->type) + " " + (r->op < 10 ? kOps[r->op] : "?") + " " + r->value;
+    if (r->andNext != nullptr) text += " &" + Chain(r->andNext, depth + 1);
+    if (r->orNext != nullptr) text += " |" + Chain(r->orNext, depth + 1);
+    return text + "}";
+}
+
+struct Owned {
+    std::vector<FindComp *> list;
+    ~Owned() {
+        for (FindComp *c : list) delete c;
+    }
+    Chains chains() const {
+        Chains out;
+        for (FindComp *c : list) out.push_back(Chain(c->getFirstCond()));
+        return out;
+    }
+};
+
+std::string ChainOf(std::unique_ptr<FindComp> c) {
+    return Chain(c->getFirstCond());
+}
+
+TEST(Records, EachConstructorBuildsItsRecords) {
+    const std::string longest = std::to_string(LLONG_MAX);
+    const struct {
+        std::function<FindComp *()> make;
+        std::string chain;
+    } cases[] = {
+        {[] { return new FindNameComp("abc"); }, "{0 ~ *abc*}"},
+        {[] { return new FindNameComp("a*c"); }, "{0 ~ a*c}"},
+        {[] { return new FindNameComp("a\\*c"); }, "{0 ~ *a\\*c*}"},      // an escaped star is no wildcard
+        {[] { return new FindNameComp("a\\*b*c"); }, "{0 ~ *a\\*b*c*}"},  // ... even beside a real one
+        {[] { return new FindNameComp("a\\?c*"); }, "{0 ~ a\\?c*}"},
+        {[] { return new FindNameComp("a\\\\b"); }, "{0 ~ *a\\b*}"},      // doubled backslash made single
+        {[] { return new FindNameComp("a\\\\\\\\*"); }, "{0 ~ *a\\\\**}"},
+        {[] { return new FindNameComp("abc\\"); }, "{0 ~ abc\\}"},        // ends in a backslash: not wrapped
+        {[] { return new FindNameComp(""); }, "{0 = }"},
+        {[] { return new FindNameComp(nullptr); }, "{0 = }"},
+        {[] { return new FindTypeComp(true); }, "{6 = 1}"},
+        {[] { return new FindTypeComp(false); }, "{6 = 0}"},
+        {[] { return new FindUserComp("alice", 1026); }, "{15 = 1026 |{17 ~ alice}}"},
+        {[] { return new FindUserComp(nullptr, 0xFFFFFFFFu); }, "{15 = 4294967295 |{17 ~ }}"},
+        {[] { return new FindGroupComp("staff", 65537); }, "{16 = 65537 |{18 ~ staff}}"},
+        {[] { return new FindMTimeComp("before", 1000); }, "{12 < 1000}"},
+        {[] { return new FindMTimeComp("BeFoRe", 1000); }, "{12 < 1000}"},
+        {[] { return new FindCRTimeComp("after", 5); }, "{9 >= 5}"},
+        {[] { return new FindATimeComp(nullptr, -1); }, "{11 >= 18446744073709551615}"},
+        {[] { return new FindSizeComp("equal", 100); }, "{7 < 105 &{7 >= 95}}"},
+        {[] { return new FindSizeComp("equal", 10); }, "{7 < 11 &{7 >= 9}}"},
+        {[] { return new FindSizeComp("equal", 0); }, "{7 < 1 &{7 >= 0}}"},
+        {[] { return new FindSizeComp("equal", -100); }, "{7 < 18446744073709551517 &{7 >= 0}}"},
+        {[] { return new FindSizeComp("equal", LLONG_MAX); },
+         "{7 < " + longest + " &{7 >= " + std::to_string(LLONG_MAX - (LLONG_MAX >> 2) / 5) + "}}"},
+        {[] { return new FindSizeComp("EQUAL", 100); }, "{7 > 100}"},
+        {[] { return new FindSizeComp("less", 7); }, "{7 < 7}"},
+        {[] { return new FindSizeComp(nullptr, 7); }, "{7 > 7}"},
+    };
+    for (const auto &c : cases) {
+        EXPECT_EQ(ChainOf(std::unique_ptr<FindComp>(c.make())), c.chain);
+    }
+}
+
+TEST(Records, SetSqlCondFillsAndCuts) {
+    __tag_FI_SQL_COND a, b, c;
+    memset(&c, 0x5A, sizeof(c));
+    setSqlCond(c, FI_COND_PATH, FI_OP_PATH_LIKE, std::string(5000, 'p'), &a, &b);
+    EXPECT_EQ(c.andNext, &a);
+    EXPECT_EQ(c.orNext, &b);
+    EXPECT_EQ(c.type, FI_COND_PATH);
+    EXPECT_EQ(c.op, FI_OP_PATH_LIKE);
+    EXPECT_EQ(std::string(c.value), std::string(4095, 'p'));
+    setSqlCond(c, FI_COND_SIZE, FI_OP_GT, 18446744073709551615ull, nullptr, nullptr);
+    EXPECT_STREQ(c.value, "18446744073709551615");
+    EXPECT_EQ(std::string(c.value, sizeof(c.value)).find_first_not_of('\0', 20), std::string::npos);  // zero-filled
+}
+
+TEST(Chains, AlternativesHeadTheirChainNewestFirst) {
+    auto head = std::make_unique<FindNameComp>("a");
+    head->orComp(new FindNameComp("b"));
+    head->orComp(new FindNameComp("c"));
+    EXPECT_EQ(ChainOf(std::unique_ptr<FindComp>(head.release())), "{0 ~ *c* |{0 ~ *b* |{0 ~ *a*}}}");
+}
+
+TEST(Chains, JoiningItselfTwiceOrInACircleChangesNothing) {
+    auto head = std::make_unique<FindNameComp>("a");
+    auto *b = new FindNameComp("b");
+    head->orComp(b);
+    head->orComp(b);
+    head->orComp(head.get());
+    head->orComp(nullptr);
+    b->orComp(head.get());  // would make each own the other
+    EXPECT_EQ(Chain(head->getFirstCond()), "{0 ~ *b* |{0 ~ *a*}}");
+}
+
+TEST(Chains, ConjunctionLinksFromTheLastRecordOfEachCondition) {
+    std::vector<std::unique_ptr<FindComp>> list;
+    list.emplace_back(new FindUserComp("alice", 1026));
+    list.emplace_back(new FindSizeComp("equal", 100));
+    list.emplace_back(new FindNameComp("x"));
+    list.emplace_back(new FindGroupComp("staff", 7));
+    list.emplace_back(new FindTypeComp(false));
+    for (size_t i = 1; i < list.size(); ++i) {
+        (*list[i - 1])(list[i].get());
+    }
+    (*list.back())(nullptr);
+    EXPECT_EQ(Chain(list[0]->getFirstCond()),
+              "{15 = 1026 |{17 ~ alice &{7 < 105 &{7 >= 95 &{0 ~ *x* &{16 = 7 |{18 ~ staff &{6 = 0}}}}}}}}");
+}
+
+class Factory : public ::testing::Test {
+protected:
+    void SetUp() override { app.Basic(); }
+    norvo::testing::Appliance app;
+};
+
+TEST_F(Factory, AppendsTheConditionsOfEachField) {
+    const std::string alice = std::to_string(app.Uid("alice"));
+    const std::string staff = std::to_string(app.Gid("staff"));
+    const struct {
+        int field;
+        const char *op;
+        const char *value;
+        Chains chains;
+    } cases[] = {
+        {0, nullptr, "a, b", {"{0 ~ *b* |{0 ~ *a*}}"}},
+        {0, "ignored", " a\t", {"{0 ~ *a*}"}},
+        {0, nullptr, "x,\"y\",z", {"{0 ~ *z* |{0 ~ *y*}}"}},  // x has no effect
+        {0, nullptr, "\"a\",\"b\"", {"{0 ~ *a*}", "{0 ~ *b*}"}},
+        {0, nullptr, " \"a*\" ", {"{0 ~ a*}"}},               // quotes go, the wrapping rule stays
+        {0, nullptr, "\"\"", {"{0 ~ *\"\"*}"}},                // two characters: not a quoted term
+        {0, nullptr, "a\\\\b,c\\*", {"{0 ~ *c\\** |{0 ~ *a\\b*}}"}},
+        {0, nullptr, "", {}},
+        {0, nullptr, " , ,\t", {}},
+        {1, "DIR", nullptr, {"{6 = 1}"}},
+        {1, "File", "ignored", {"{6 = 0}"}},
+        {1, "folder", nullptr, {}},
+        {2, nullptr, "jpg,png", {"{6 = 0}", "{0 ~ *.png |{0 ~ *.jpg}}"}},
+        {2, nullptr, " jpg,", {"{6 = 0}", "{0 ~ *. |{0 ~ *. jpg}}"}},  // neither trimmed nor skipped
+        {3, nullptr, "alice", {"{15 = " + alice + " |{17 ~ alice}}"}},
+        {4, nullptr, "staff", {"{16 = " + staff + " |{18 ~ staff}}"}},
+        {5, "before", "1000", {"{12 < 1000}"}},
+        {5, "Before", "12abc", {"{12 < 12}"}},
+        {6, "after", "abc", {"{9 >= 0}"}},
+        {7, "", "-5", {"{11 >= 18446744073709551611}"}},
+        {7, "x", "99999999999999999999999", {"{11 >= 18446744073709551615}"}},
+        {8, "equal", "100", {"{7 < 105 &{7 >= 95}}"}},
+        {8, "EQUAL", "100", {"{7 > 100}"}},
+        {8, "less", "1k", {"{7 < 1}"}},
+        {9, nullptr, "x", {}},
+        {-1, "x", "y", {}},
+    };
+    for (const auto &c : cases) {
+        SCOPED_TRACE(std::to_string(c.field) + " " + (c.value ? c.value : "(null)"));
+        Owned out;
+        NvoLibSetErr(NVO_ERR_NONE);
+        EXPECT_TRUE(FindFactory::createFindOp(static_cast<Field>(c.field), c.op, c.value, out.list));
+        EXPECT_EQ(out.chains(), c.chains);
+        EXPECT_EQ(NvoLibGetErr(), NVO_ERR_NONE);
+    }
+}
+
+TEST_F(Factory, RefusesMissingArgumentsAndUnknownOwners) {
+    const std::string huge(10000, 'u');
+    const struct {
+        int field;
+        const char *op;
+        const char *value;
+        int error;
+    } cases[] = {
+        {0, "x", nullptr, 400},      {2, nullptr, nullptr, 400},   {1, nullptr, "dir", 400},
+        {5, nullptr, "1", 400},      {6, nullptr, "1", 400},       {7, nullptr, "1", 400},
+        {8, nullptr, "1", 400},      {9, nullptr, nullptr, 400},   {3, nullptr, nullptr, 400},
+        {3, nullptr, "nobody-here", 403}, {3, nullptr, "", 403},   {3, nullptr, huge.c_str(), 403},
+        {3, nullptr, "\xff\xfe", 403},    {3, nullptr, "staff", 403},
+        {4, nullptr, "no-such-group", 404}, {4, nullptr, "alice", 404}, {4, nullptr, "\xc3", 404},
+    };
+    for (const auto &c : cases) {
+        SCOPED_TRACE(std::to_string(c.field) + " " + (c.value ? std::string(c.value).substr(0, 20) : "(null)"));
+        Owned out;
+        NvoLibSetErr(NVO_ERR_NONE);
+        EXPECT_FALSE(FindFactory::createFindOp(static_cast<Field>(c.field), c.op, c.value, out.list));
+        EXPECT_EQ(NvoLibGetErr(), c.error);
+        EXPECT_TRUE(out.list.empty());
+    }
+    EXPECT_TRUE(app.ErrorLines().empty());
+}
+
+// Whatever a request carries, the factory answers and everything it appended is freed with
+// the list (the sanitized run checks for leaks and double frees).
+TEST_F(Factory, HostileValuesAreBuiltAndFreed) {
+    const std::string longTerm(10000, 'n');
+    std::string manyTerms;
+    for (int i = 0; i < 2000; ++i) manyTerms += (i % 3 == 0 ? "\"q\"," : "t,");
+    const std::string values[] = {longTerm, "\"" + longTerm + "\"", manyTerms, "\xff\xfe,\xc3\x28,\"\xe2\x82\"",
+                                  std::string(3000, ','), "\\\\\\\\\\", "**??\\", "-", "0x10", " 12 "};
+    for (const std::string &value : values) {
+        for (int field = 0; field <= 8; ++field) {
+            Owned out;
+            const bool ok = FindFactory::createFindOp(static_cast<Field>(field), "equal", value.c_str(), out.list);
+            EXPECT_EQ(ok, field != 3 && field != 4) << field;
+            for (FindComp *c : out.list) {
+                const __tag_FI_SQL_COND *first = c->getFirstCond();
+                ASSERT_NE(first, nullptr);
+                EXPECT_LT(strlen(first->value), sizeof(first->value));
+            }
+        }
+    }
+    Owned out;
+    ASSERT_TRUE(FindFactory::createFindOp(FindFactory::FIND_FIELD_NAME, nullptr, longTerm.c_str(), out.list));
+    EXPECT_EQ(strlen(out.list.at(0)->getFirstCond()->value), 4095u);
+}
+
+}  // namespace
