@@ -55,7 +55,8 @@ QUIB_API void QUIBShareDBClose(PQUIBSHARE_DB db);
 // 1 when user is named in list (entries separated by commas or white space, double quotes around
 // an entry that holds them; names compare ignoring ASCII case; "@group" entries match members of
 // that group, primary or supplementary, through NSS), 0 when not (also for an unknown user or
-// group), -1 on bad argument (0x0D00) or when NSS failed and no other entry matched (0x8100).
+// group), -1 on bad argument (0x0D00) or when NSS failed and no other entry matched (0x8100,
+// or 0x0300 when NSS was refused access).
 QUIB_API int BlSDKUserIsInList(const char *user, const char *list);
 
 QUIB_END_C

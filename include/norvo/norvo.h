@@ -2,6 +2,8 @@
 #pragma once
 #include "norvo/errors.h"
 #include "norvo/norvodir.h"
+#include "norvo/norvoenum.h"
 #include "norvo/norvomisc.h"
+#include "norvo/norvosearch.h"
 #include "norvo/nvoman.h"
 #include "norvo/pathinfo.h"

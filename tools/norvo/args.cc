@@ -2,6 +2,8 @@
 
 #include <string.h>
 
+#include <algorithm>
+
 namespace norvo::cli {
 namespace {
 
@@ -98,16 +100,18 @@ ParseOutcome ParseCommandArgs(const CommandDef &command, bool json, int argc, co
             return UsageError(&command, std::string("option --") + option.name + " is required");
         }
     }
-    const size_t wanted = command.arguments.size();
+    const bool repeated = !command.arguments.empty() && IsRepeated(command.arguments.back());
+    const size_t wanted = command.arguments.size() - (repeated ? 1 : 0);
     if (inv.arguments.size() < wanted) {
         return UsageError(&command, std::string("missing argument ") + command.arguments[inv.arguments.size()].name);
     }
-    if (inv.arguments.size() > wanted) {
+    if (!repeated && inv.arguments.size() > wanted) {
         return UsageError(&command, "unexpected argument " + inv.arguments[wanted]);
     }
-    for (size_t i = 0; i < wanted; ++i) {
+    for (size_t i = 0; i < inv.arguments.size(); ++i) {
         if (inv.arguments[i].empty()) {
-            return UsageError(&command, std::string("argument ") + command.arguments[i].name + " is empty");
+            const ArgumentDef &def = command.arguments[std::min(i, command.arguments.size() - 1)];
+            return UsageError(&command, std::string("argument ") + def.name + " is empty");
         }
     }
     return outcome;

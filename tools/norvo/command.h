@@ -18,9 +18,15 @@ struct OptionDef {
 };
 
 struct ArgumentDef {
-    const char *name;  // "PATH"; every argument is required
+    const char *name;  // "PATH"; every argument is required, but a last one named "FILE..."
+                       // takes any number of values, none included
     const char *help;
 };
+
+inline bool IsRepeated(const ArgumentDef &argument) {
+    const std::string name = argument.name;
+    return name.size() > 3 && name.compare(name.size() - 3, 3, "...") == 0;
+}
 
 struct CommandDef {
     const char *name;

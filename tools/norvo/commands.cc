@@ -77,6 +77,58 @@ std::vector<CommandDef> MakeCommands() {
           {"remote-addr", "ADDR", false, "the address the login comes from (default 127.0.0.1)"}},
          {},
          RunLogin},
+        {"mounts", "the mount-status table a listing works with",
+         "Reads the mount table as the library does (NorvoMountStatus, from /proc/mounts) and\n"
+         "prints each mount directory with its read-only state and its file-system type: the\n"
+         "index into the platform's type table and its name. Type names compare exactly with the\n"
+         "table, so a mount whose type is none of its names (fuse.*, overlay, proc) is 11\n"
+         "(unknown). Of several mounts on one directory the first line of the table counts, as\n"
+         "for the library, even when a later mount hides it.\n"
+         "\n"
+         "With --path, also the answers for PATH: read-only as the deepest mount directory that is\n"
+         "PATH or a parent of it says (IsReadOnly; the root mount \"/\" counts only for \"/\" itself\n"
+         "and \"//...\"), and the type only when PATH, trailing slashes cut, is a mount directory\n"
+         "itself (getFSTYPE; 10 otherwise, also for \"/\").",
+         {{"path", "PATH", false, "also report the read-only state and type the library gives PATH"}},
+         {},
+         RunMounts},
+        {"whois", "names and groups of a user or group id, through the name caches",
+         "Names an id as a listing names the owner of a file (NorvoUserEnum): --uid N gives the\n"
+         "account's name and its groups (NvoEnum::EnumUserGroups, the primary group first), each\n"
+         "named through the group cache; --user USER the same for an account name; --gid N the\n"
+         "group's name. Give exactly one of them. An id nobody has is a failure (403 for a uid,\n"
+         "404 for a gid); a listing would show an empty name.",
+         {{"uid", "N", false, "a user id (decimal)"},
+          {"gid", "N", false, "a group id (decimal)"},
+          {"user", "USER", false, kUserHelp}},
+         {},
+         RunWhois},
+        {"conditions", "the search conditions a request makes, their index records, and what they match",
+         "Builds the conditions a search request with these fields makes\n"
+         "(FileSearch::FindFactory::createFindOp, in the order of the options below) and joins them\n"
+         "into one query as the search walker does. Prints each condition with the file-index\n"
+         "records it owns, then every record numbered from the first one of the query: column\n"
+         "(FI_COND_*), operator (FI_OP_*), operand, and where its \"and\" link (must also hold)\n"
+         "and \"or\" link (may hold instead) lead. For each FILE it reads the status (a final link\n"
+         "is not followed) and tests the conditions in memory, as a walk would: \"matches\", or the\n"
+         "first condition that fails.\n"
+         "\n"
+         "Values go to the library unchanged, quirks included: --name a,b gives two alternatives and\n"
+         "a term in double quotes a condition of its own; --type words other than dir and file add\n"
+         "nothing; numbers that are not numbers read as 0; time words other than \"before\" (any case)\n"
+         "mean at or after; size words other than \"equal\" and \"less\" (exactly) mean greater than,\n"
+         "and \"equal\" allows one twentieth of the size either way (100 matches 95 to 104).",
+         {{"name", "TERMS", false, "comma-separated name terms (substring unless * or ? is in the term)"},
+          {"type", "WORD", false, "dir or file (regular files only)"},
+          {"ext", "EXTS", false, "comma-separated extensions: files named *.EXT"},
+          {"user", "USER", false, "the owner, a user name"},
+          {"group", "GROUP", false, "the group, a group name"},
+          {"mtime", "OP:SECONDS", false, "modification time: before:T, or at or after with any other word"},
+          {"crtime", "OP:SECONDS", false, "creation time, as --mtime"},
+          {"atime", "OP:SECONDS", false, "access time, as --mtime"},
+          {"size", "OP:BYTES", false, "size: equal:N, less:N, or greater than with any other word"}},
+         {{"FILE...", "real paths to test in memory"}},
+         RunConditions},
     };
 }
 

@@ -10,5 +10,8 @@ int RunCheckPath(const Invocation &inv);   // cmd_paths.cc
 int RunPrivilege(const Invocation &inv);   // cmd_privilege.cc
 int RunShares(const Invocation &inv);      // cmd_shares.cc
 int RunLogin(const Invocation &inv);       // cmd_login.cc
+int RunMounts(const Invocation &inv);      // cmd_enum.cc
+int RunWhois(const Invocation &inv);       // cmd_enum.cc
+int RunConditions(const Invocation &inv);  // cmd_conditions.cc
 
 }  // namespace norvo::cli

@@ -43,7 +43,7 @@ void PrintUsageLine(std::ostream &out, const CommandDef &command) {
         out << ' ' << (option.required ? "" : "[") << OptionLabel(option) << (option.required ? "" : "]");
     }
     for (const ArgumentDef &argument : command.arguments) {
-        out << ' ' << argument.name;
+        out << ' ' << (IsRepeated(argument) ? "[" : "") << argument.name << (IsRepeated(argument) ? "]" : "");
     }
     out << '\n';
 }
