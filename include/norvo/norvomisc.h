@@ -43,48 +43,68 @@ NORVO_END_C
 
 NORVO_BEGIN_C
 
-// 1 when subject matches pattern as a whole, else 0: "*" any run, "?" one character, esc makes
-// the next pattern character literal; UTF-8 code points compared after ICU default case folding.
-// Worst case bounded by pattern length times subject length.
+// 1 when subject matches pattern as a whole, else 0 (also for a null pattern or subject).
+// Both are read as UTF-8 code points without validation: a byte 0xC0..0xF4 leads one to three
+// trail bytes, whatever they hold (a sequence cut short by the end is one character); any other
+// byte is a character. "*" matches any run, "?" one character, esc (a code point; "*" and "?"
+// take precedence over it) makes the next pattern character literal; characters compare after
+// ICU's default case folding. After a star the rest is tried only where a subject character is
+// left, so a pattern ending in star and escape character matches nothing. No allocation; at
+// most (pattern length) x (subject length) steps.
 NORVO_API int NvoLibStrLikeCompare(const char *pattern, const char *subject, int esc);
 // *out = src with every non-overlapping occurrence of from replaced by to, scanning left to right
-// (inserted text is not searched again). 1 replaced, 0 nothing found (*out a copy), -1 for a null
-// or empty argument or no memory. The caller frees *out.
+// (inserted text is not searched again). 1 replaced; 0 nothing found (*out a copy); -1 with
+// *out = null for a null or empty argument (an empty to included), a null out, or no memory
+// (logged). The caller frees *out.
 NORVO_API int NvoLibStrReplace(const char *src, const char *from, const char *to, char **out);
-// The same with two pairs, tried in one left-to-right scan, from1 before from2 at each position.
+// The same with two pairs in one left-to-right scan: at each position from1 is tried before
+// from2; the scan goes on after each replacement.
 NORVO_API int NvoLibTwoStrReplace(const char *src, const char *from1, const char *to1, const char *from2,
                                   const char *to2, char **out);
-// Lower-cases every byte in place (tolower). 0, or -1 for null.
+// Lower-cases every byte in place with tolower (bytes, not code points). 0, or -1 for null.
 NORVO_API int NvoLibStringToLower(char *text);
-// Pointer into name just after the extension's dot, or null (no extension, a leading dot only,
-// a trailing dot, a name shorter than 2). The scan starts at start when 1 < start < length.
+// Pointer into name just after its extension's dot, or null: no dot after index 0 (".profile"
+// has none), a trailing dot, a name shorter than 2 or null. The dot is sought backwards from
+// start when 1 < start < length, else from the last character.
 NORVO_API const char *ReturnFileExt(const char *name, int start);
-// Writes size as "N Bytes", "N KB", "N MB" or "N GB" ("%5.2f" with fraction). 1 written, 0 not
-// (null buffer, len <= 0, size <= 0).
+// Writes size into buf (snprintf, cut to len) as "N Bytes" below 1 KiB, else in the largest of
+// KB, MB, GB that holds at least one: "%5.2f KB" with fraction, the value truncated ("%lld KB")
+// without. 1 written; 0 and buf untouched for a null buf, len <= 0 or size <= 0.
 NORVO_API int FileUnitGet(long long size, char *buf, int len, bool fraction);
-// 1 when text is well formed by the UTF-8 lead-byte rules (null and empty count), else 0.
+// 1 when every byte with the high bit set starts a sequence of the original UTF-8 lead-byte
+// rules (up to six bytes; overlong forms and surrogates pass) completed by 10xxxxxx bytes, and
+// for null or empty text; else 0.
 NORVO_API int IsUnicodeString(const char *text);
-// 1 and out = the elements' paths (from their first "/") joined by ", "; 0 with 401 when value is
-// not an array.
+// 1 and out = the elements' texts joined by ", ", each from its first "/" when it has one
+// (arrays and objects count as ""). 0 with 401 (logged) and out untouched when value is not an
+// array.
 NORVO_API int ParseJsonPathToString(const Json::Value &value, std::string &out);
-// out = the icon file name of a listed entry ("misc.png", "<ext>.png", "folder.png",
-// "isomountpoint.png", "remotemountpoint.png", "recycle_bin.png"). realPath is the entry's real
-// path, sharePath its path within the share.
+// out = the icon file name of a listed entry; "misc.png" for a null name. A file: "<ext>.png"
+// (the extension lower-cased) when "../images/files_ext/<ext>.png" exists relative to the
+// working directory, else "misc.png". A directory: at a mount point "isomountpoint.png" (disk
+// image) or "remotemountpoint.png" (network), else "folder.png"; a folder that is no mount
+// point and whose sharePath (its path within the share, "/#recycle" or "#recycle") is the single
+// component "#recycle" gets "recycle_bin.png". realPath is the entry's real path.
 NORVO_API void GetImgFileExt(const char *name, bool isDir, std::string &out, const std::string &realPath,
                              const std::string &sharePath);
-// out = the file names of text's delim-separated paths, joined by sep. An empty delim leaves out.
+// out = the file names (after the last "/") of text's pieces split as by StringExplode, joined by
+// sep (null: none). An empty or null delim leaves out as it was.
 NORVO_API void StringExplodeToFileNameString(std::string &out, const std::string &text, const char *delim,
                                              const char *sep);
 
 NORVO_END_C
 
-// The bytes of hex decoded two characters at a time, up to the first zero byte.
+// The bytes of hex decoded two characters at a time with strtol (a trailing odd character is
+// ignored), up to the first zero byte. "" for null.
 NORVO_API std::string NvoLibHex2Bin(const char *hex);
-// Splits text at delim: no leading empty piece for a delimiter at index 0, empty pieces between
-// adjacent delimiters kept, the rest after the last delimiter always pushed. An empty delim does
-// nothing.
+// Appends the pieces of text between occurrences of delim: no empty first piece for a delimiter
+// at index 0, empty pieces between adjacent delimiters kept, the rest after the last delimiter always
+// appended (text whole when it has none). An empty or null delim does nothing.
 NORVO_API void StringExplode(std::vector<std::string> &out, const std::string &text, const char *delim);
+// The same pieces, each passed to callback with user instead; nothing for a null callback.
 NORVO_API void StringExplode(const std::string &text, const char *delim, void (*callback)(const std::string &, void *),
                              void *user);
-// The longest common parent directory of paths, ending in "/", or "".
+// The longest common parent directory of paths (each taken with a trailing "/"), ending in "/";
+// "" for no paths or only empty ones. Paths without a common leading directory give their
+// common prefix as it is ("ab" and "ac" give "a").
 NORVO_API std::string FindCommonParent(std::vector<std::string> paths);
