@@ -1,7 +1,7 @@
 // The home service: per-kind switches, the homes root, and homes outside it.
+#include <stdio.h>
 #include <unistd.h>
 
-#include <memory>
 #include <string>
 
 #include <gtest/gtest.h>
@@ -13,135 +13,97 @@
 
 namespace {
 
-using norvo::testing::Appliance;
-using norvo::testing::UserSpec;
-
-struct UserFree {
-    void operator()(PQUIBUSER user) const { QUIBUserFree(user); }
-};
-using User = std::unique_ptr<QUIBUSER, UserFree>;
-
-// 1/0 from the service for name, or -100 when the user can't be looked up.
-int Enabled(const char *name) {
-    PQUIBUSER raw = nullptr;
-    if (QUIBUserGet(name, &raw) != 0) {
-        return -100;
-    }
-    User user(raw);
-    return QUIBServiceUserHomeIsEnabled(user.get());
-}
-
-std::string HomePath(int *code = nullptr) {
+// The homes root, or "<none 0xcode>".
+std::string HomePath() {
     char buf[256];
     VLIBCErrSetEx(0, "", 0);
-    int rc = QUIBServiceHomePathGet(buf, sizeof buf);
-    if (code != nullptr) {
-        *code = rc == 0 ? 0 : VLIBCErrGet();
+    if (QUIBServiceHomePathGet(buf, sizeof buf) == 0) {
+        return buf;
     }
-    return rc == 0 ? buf : "<none>";
-}
-
-UserSpec WithHome(const std::string &name, const std::string &home) {
-    UserSpec account;
-    account.name = name;
-    account.home = home;
-    return account;
+    snprintf(buf, sizeof buf, "<none %#x>", VLIBCErrGet());
+    return buf;
 }
 
 class HomeService : public ::testing::Test {
 protected:
-    void SetUp() override {
-        app_.AddUser("alice").AddUser("CORP\\dave").AddUser("erin@corp.example");
-        app_.AddUser(WithHome("outsider", "/var/lib/outsider"));
-        app_.AddUser(WithHome("neighbour", "/volume1/homesick/neighbour"));
-        app_.AddUser(WithHome("rooted", "/volume1/homes"));
-        app_.AddUser(WithHome("messy", "/volume1//homes/./messy/"));
-    }
-    Appliance app_;
+    norvo::testing::Appliance app_;
 };
 
+// Records as a caller may build them; domain accounts are off.
 TEST_F(HomeService, EnabledForHomesBelowTheRoot) {
-    app_.SetHomeService(true);
-    EXPECT_EQ(Enabled("alice"), 1);
-    EXPECT_EQ(Enabled("CORP\\dave"), 1);
-    EXPECT_EQ(Enabled("erin@corp.example"), 1);
-    EXPECT_EQ(Enabled("messy"), 1);
-    EXPECT_EQ(Enabled("outsider"), 0);
-    EXPECT_EQ(Enabled("neighbour"), 0);  // whole components: homesick is not homes
-    EXPECT_EQ(Enabled("rooted"), 0);     // the root itself is nobody's home
-    EXPECT_EQ(HomePath(), "/volume1/homes");
-}
-
-TEST_F(HomeService, SwitchesPerKindOfAccount) {
     app_.SetHomeService(true, "/volume1/homes", false, true);
-    EXPECT_EQ(Enabled("alice"), 1);
-    EXPECT_EQ(Enabled("CORP\\dave"), 0);
-    EXPECT_EQ(Enabled("erin@corp.example"), 1);
-    app_.SetHomeService(true, "/volume1/homes", true, false);
-    EXPECT_EQ(Enabled("CORP\\dave"), 1);
-    EXPECT_EQ(Enabled("erin@corp.example"), 0);
-    app_.SetSetting("userHomeEnable", "no");
-    EXPECT_EQ(Enabled("alice"), 0);
-    EXPECT_EQ(Enabled("CORP\\dave"), 1);
-    EXPECT_EQ(HomePath(), "/volume1/homes");  // on for some kind of account
-}
-
-TEST_F(HomeService, OffOrUnconfigured) {
-    app_.SetHomeService(false);
-    EXPECT_EQ(Enabled("alice"), 0);
-    int code = 0;
-    EXPECT_EQ(HomePath(&code), "<none>");
-    EXPECT_EQ(code, QUIB_ERR_OPEN_FAILED);
-
-    ASSERT_EQ(unlink(QUIB_INFO_CONF), 0);
-    EXPECT_EQ(Enabled("alice"), 0);
-    EXPECT_EQ(HomePath(&code), "<none>");
-    EXPECT_EQ(code, QUIB_ERR_OPEN_FAILED);
-
-    // Switched on but without a usable root.
-    app_.WriteFile(QUIB_INFO_CONF, "userHomeEnable=\"yes\"\n");
-    EXPECT_EQ(Enabled("alice"), 0);
-    EXPECT_EQ(HomePath(&code), "<none>");
-    for (const char *root : {"relative/homes", "/", ""}) {
-        app_.WriteFile(QUIB_INFO_CONF,
-                       std::string("userHomeEnable=\"yes\"\nuserHomeRoot=\"") + root + "\"\n");
-        EXPECT_EQ(Enabled("alice"), 0) << root;
-        EXPECT_EQ(HomePath(&code), "<none>") << root;
+    const struct { const char *name, *home; int kind, expected; } rows[] = {
+        {"alice", "/volume1/homes/alice", AUTH_LOCAL, 1},
+        {"messy", "/volume1//homes/./messy/", AUTH_LOCAL, 1},
+        {"erin@corp.example", "/volume1/homes/erin", AUTH_LDAP, 1},
+        {"outsider", "/var/lib/outsider", AUTH_LOCAL, 0},
+        {"neighbour", "/volume1/homesick/neighbour", AUTH_LOCAL, 0},  // whole components
+        {"rooted", "/volume1/homes", AUTH_LOCAL, 0},  // the root itself is nobody's home
+        {"homeless", nullptr, AUTH_LOCAL, 0},
+        {"CORP\\carl", "/volume1/homes/carl", AUTH_DOMAIN, 0},
+        {"CORP\\carl", "/volume1/homes/carl", 0, 0},  // no kind given: the name tells it
+        {"carl", "/volume1/homes/carl", 0, 1},
+        {"CORP\\carl", "/volume1/homes/carl", AUTH_LOCAL, 1},  // a kind given wins over the name
+    };
+    for (const auto &row : rows) {
+        QUIBUSER user{};
+        user.szName = const_cast<char *>(row.name);
+        user.szHome = const_cast<char *>(row.home);
+        user.authType = static_cast<AUTH_TYPE>(row.kind);
+        EXPECT_EQ(QUIBServiceUserHomeIsEnabled(&user), row.expected) << row.name << " at " << (row.home ? row.home : "(null)");
     }
-}
-
-TEST_F(HomeService, RootIsReadLeniently) {
-    app_.SetHomeService(true, "/volume1/homes/");
-    EXPECT_EQ(Enabled("alice"), 1);
-    EXPECT_EQ(HomePath(), "/volume1/homes");
-    app_.SetSetting("userHomeEnable", "YES");
-    EXPECT_EQ(Enabled("alice"), 1);
-    app_.SetSetting("userHomeEnable", "maybe");
-    EXPECT_EQ(Enabled("alice"), 0);
-}
-
-TEST_F(HomeService, HandBuiltRecordsAndBadArguments) {
-    app_.SetHomeService(true, "/volume1/homes", false, true);
-    QUIBUSER record{};
-    record.szName = const_cast<char *>("CORP\\carl");
-    record.szHome = const_cast<char *>("/volume1/homes/carl");
-    record.authType = static_cast<AUTH_TYPE>(0);  // not filled in: the name tells the kind
-    EXPECT_EQ(QUIBServiceUserHomeIsEnabled(&record), 0);
-    record.szName = const_cast<char *>("carl");
-    EXPECT_EQ(QUIBServiceUserHomeIsEnabled(&record), 1);
-    record.szHome = nullptr;
-    EXPECT_EQ(QUIBServiceUserHomeIsEnabled(&record), 0);
-
     EXPECT_EQ(QUIBServiceUserHomeIsEnabled(nullptr), 0);
     EXPECT_EQ(VLIBCErrGet(), QUIB_ERR_BAD_PARAMETER);
-    char small[8];
-    EXPECT_EQ(QUIBServiceHomePathGet(small, sizeof small), -1);
-    EXPECT_EQ(VLIBCErrGet(), QUIB_ERR_BAD_PARAMETER);
-    EXPECT_EQ(QUIBServiceHomePathGet(nullptr, 64), -1);
     char exact[sizeof "/volume1/homes"];
+    for (int size : {0, static_cast<int>(sizeof exact) - 1}) {
+        VLIBCErrSetEx(0, "", 0);
+        EXPECT_EQ(QUIBServiceHomePathGet(exact, size), -1) << size;
+        EXPECT_EQ(VLIBCErrGet(), QUIB_ERR_BAD_PARAMETER) << size;
+    }
+    EXPECT_EQ(QUIBServiceHomePathGet(nullptr, 64), -1);
     EXPECT_EQ(QUIBServiceHomePathGet(exact, sizeof exact), 0);
     EXPECT_STREQ(exact, "/volume1/homes");
-    EXPECT_EQ(QUIBServiceHomePathGet(exact, 0), -1);
+}
+
+// Each row writes the settings file (a null value leaves its line out) and expects the service
+// for the accounts alice, CORP\dave and erin@corp.example, and the homes root.
+TEST_F(HomeService, SwitchesAndRoot) {
+    app_.AddUser("alice").AddUser("CORP\\dave").AddUser("erin@corp.example");
+    const char *keys[] = {"userHomeEnable", "domainUserHomeEnable", "ldapUserHomeEnable", "userHomeRoot"};
+    const char *const off = "<none 0x900>";
+    const struct { const char *values[4], *enabled, *root; } rows[] = {
+        {{"yes", "yes", "yes", "/volume1/homes/"}, "111", "/volume1/homes"},
+        {{"yes", "no", "yes", "/volume1/homes"}, "101", "/volume1/homes"},
+        {{"yes", "yes", "no", "/volume1/homes"}, "110", "/volume1/homes"},
+        {{"no", "yes", nullptr, "/volume1/homes"}, "010", "/volume1/homes"},  // on for some kind
+        {{"YES", "maybe", nullptr, "/volume1/homes"}, "100", "/volume1/homes"},
+        {{"no", "no", "no", "/volume1/homes"}, "000", off},
+        {{"yes", "yes", "yes", nullptr}, "000", off},
+        {{"yes", "yes", "yes", "relative/homes"}, "000", off},
+        {{"yes", "yes", "yes", "/"}, "000", off},
+        {{"yes", "yes", "yes", ""}, "000", off},
+    };
+    auto enabled = [] {
+        std::string out;
+        for (const char *name : {"alice", "CORP\\dave", "erin@corp.example"}) {
+            PQUIBUSER user = nullptr;
+            out += QUIBUserGet(name, &user) == 0 ? std::to_string(QUIBServiceUserHomeIsEnabled(user)) : "?";
+            QUIBUserFree(user);
+        }
+        return out;
+    };
+    for (const auto &row : rows) {
+        std::string text;
+        for (int i = 0; i < 4; ++i) {
+            text += row.values[i] ? std::string(keys[i]) + "=\"" + row.values[i] + "\"\n" : "";
+        }
+        app_.WriteFile(QUIB_INFO_CONF, text);
+        EXPECT_EQ(enabled(), row.enabled) << text;
+        EXPECT_EQ(HomePath(), row.root) << text;
+    }
+    ASSERT_EQ(unlink(QUIB_INFO_CONF), 0);
+    EXPECT_EQ(enabled(), "000");
+    EXPECT_EQ(HomePath(), off);
 }
 
 }  // namespace

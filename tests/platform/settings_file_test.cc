@@ -1,81 +1,67 @@
 // Settings files: what readers make of hand-written files, what writers keep, the errors,
 // and that concurrent writers neither tear a reader's view nor lose each other's updates.
-#include <dirent.h>
-#include <fcntl.h>
 #include <limits.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
+#include <filesystem>
 #include <fstream>
-#include <memory>
-#include <set>
-#include <sstream>
+#include <iterator>
 #include <string>
 #include <vector>
 
 #include <gtest/gtest.h>
 
 #include "appliance.h"
+#include "platform_test_util.h"
 #include "vlibc_err.h"
 #include "vlibc_file.h"
 #include "vlibc_szlist.h"
 
 namespace {
 
-using norvo::testing::Appliance;
+using norvo::testing::Outcome;
 using Strings = std::vector<std::string>;
+#define OUTCOME(call) norvo::testing::OutcomeOf([&] { return call; })
 
 constexpr const char kDir[] = "/tmp/conf";
 constexpr const char kFile[] = "/tmp/conf/test.conf";
+constexpr const char kNone[] = "/tmp/conf/none.conf";
 
 std::string ReadText(const std::string &path) {
     std::ifstream in(path, std::ios::binary);
-    std::stringstream text;
-    text << in.rdbuf();
-    return text.str();
+    return std::string(std::istreambuf_iterator<char>(in), {});
 }
 
 // The value readers see, or "<absent>" / "<failed>".
 std::string Get(const char *file, const char *key, int flags = 0) {
     char buf[4096];
     int rc = VLIBCFileGetKeyValue(file, key, buf, sizeof buf, flags);
-    if (rc < 0) {
-        return "<failed>";
-    }
-    return rc == 0 ? "<absent>" : std::string(buf);
+    return rc < 0 ? "<failed>" : rc == 0 ? "<absent>" : std::string(buf);
 }
 
 Strings DirEntries(const char *dir) {
     Strings names;
-    std::unique_ptr<DIR, int (*)(DIR *)> d(opendir(dir), closedir);
-    if (!d) {
-        return names;
-    }
-    while (dirent *e = readdir(d.get())) {
-        std::string name = e->d_name;
-        if (name != "." && name != "..") {
-            names.push_back(name);
-        }
+    for (const auto &entry : std::filesystem::directory_iterator(dir)) {
+        names.push_back(entry.path().filename());
     }
     std::sort(names.begin(), names.end());
     return names;
 }
 
-int OpenDescriptors() {
-    return static_cast<int>(DirEntries("/proc/self/fd").size());
-}
-
-struct ListFree {
-    void operator()(PSZLIST list) const { VLIBCSzListFree(list); }
-};
-using List = std::unique_ptr<SZLIST, ListFree>;
-
-Strings Items(PSZLIST list) {
-    Strings out;
-    for (int i = 0; i < VLIBCSzListCount(list); ++i) {
-        out.emplace_back(VLIBCSzListGet(list, i));
+// VLIBCFileGetKeys as "count: key=value ..." (without values: "count: key ...").
+std::string KeysOf(const char *file, bool values = true) {
+    PSZLIST keyList = VLIBCSzListAlloc(1);
+    PSZLIST valueList = VLIBCSzListAlloc(1);
+    std::string out = std::to_string(VLIBCFileGetKeys(file, &keyList, values ? &valueList : nullptr)) + ":";
+    for (int i = 0; i < VLIBCSzListCount(keyList); ++i) {
+        out += std::string(" ") + VLIBCSzListGet(keyList, i);
+        out += values ? std::string("=") + VLIBCSzListGet(valueList, i) : "";
     }
+    VLIBCSzListFree(keyList);
+    VLIBCSzListFree(valueList);
     return out;
 }
 
@@ -83,97 +69,59 @@ class SettingsFile : public ::testing::Test {
 protected:
     void SetUp() override { app_.MakeDir(kDir); }
     void Put(const std::string &text) { app_.WriteFile(kFile, text); }
-
-    Appliance app_;
+    norvo::testing::Appliance app_;
 };
 
 TEST_F(SettingsFile, ReadsHandWrittenLines) {
-    const struct {
-        const char *text;
-        const char *expected;
-    } cases[] = {
-        {"key=\"value\"\n", "value"},
-        {"key = \"spaced\"\n", "spaced"},
-        {"\t key\t=\t\"tabs\"  \n", "tabs"},
-        {"key=bare value  \n", "bare value"},
-        {"key=\"a=b=c\"\n", "a=b=c"},
-        {"key=a=b\n", "a=b"},
-        {"key=\"say \\\"hi\\\"\"\n", "say \"hi\""},
-        {"key=\"back\\\\slash\"\n", "back\\slash"},
-        {"key=\"CORP\\dave\"\n", "CORP\\dave"},
-        {"key=\"value\" # trailing comment\n", "value"},
-        {"key='single \"quoted\"'\n", "single \"quoted\""},
-        {"key=\"unterminated\n", "unterminated"},
-        {"key=\"#not a comment\"\n", "#not a comment"},
-        {"key=color#fff\n", "color#fff"},
-        {"key=\"crlf\"\r\n", "crlf"},
-        {"other=\"1\"\r\nkey=\"crlf2\"\r\n", "crlf2"},
-        {"key=\"no newline\"", "no newline"},
-        {"key=\"\"\n", ""},
-        {"key=\n", ""},
-        {"key=\"caf\xc3\xa9\"\n", "caf\xc3\xa9"},
-        {"key=\"first\"\nkey=\"second\"\n", "first"},
-        {"# key=\"commented\"\nkey=\"live\"\n", "live"},
-        {"\n\n   \nkey=\"after blanks\"\n", "after blanks"},
-        {"# key=\"commented\"\n", "<absent>"},
-        {"  # key=\"indented comment\"\n", "<absent>"},
-        {"key\n", "<absent>"},
-        {"keyx=\"prefix only\"\n", "<absent>"},
-        {"Key=\"other case\"\n", "<absent>"},
-        {"=\"no key\"\n", "<absent>"},
+    const struct { const char *text, *expected; } rows[] = {
+        {"key=\"value\"\n", "value"},                  {"\t key\t=\t\"tabs\"  \n", "tabs"},
+        {"key=bare value  \n", "bare value"},          {"key=\"a=b=c\"\n", "a=b=c"},
+        {"key=a=b\n", "a=b"},                          {"key=\"say \\\"hi\\\"\"\n", "say \"hi\""},
+        {"key=\"back\\\\slash\"\n", "back\\slash"},    {"key=\"CORP\\dave\"\n", "CORP\\dave"},
+        {"key=\"value\" # trailing comment\n", "value"}, {"key='single \"quoted\"'\n", "single \"quoted\""},
+        {"key=\"unterminated\n", "unterminated"},      {"key=\"#not a comment\"\n", "#not a comment"},
+        {"key=color#fff\n", "color#fff"},              {"other=\"1\"\r\nkey=\"crlf\"\r\n", "crlf"},
+        {"key=\"no newline\"", "no newline"},          {"key=\"\"\n", ""},
+        {"key=\n", ""},                                {"key=\"caf\xc3\xa9\"\n", "caf\xc3\xa9"},
+        {"key=\"first\"\nkey=\"second\"\n", "first"},  {"# key=\"commented\"\nkey=\"live\"\n", "live"},
+        {"\n\n   \nkey=\"after blanks\"\n", "after blanks"}, {"  # key=\"indented comment\"\n", "<absent>"},
+        {"key\n", "<absent>"},                         {"keyx=\"prefix only\"\n", "<absent>"},
+        {"Key=\"other case\"\n", "<absent>"},          {"=\"no key\"\n", "<absent>"},
         {"", "<absent>"},
     };
-    for (const auto &c : cases) {
-        Put(c.text);
-        EXPECT_EQ(Get(kFile, "key"), c.expected) << "file: " << c.text;
+    for (const auto &row : rows) {
+        Put(row.text);
+        EXPECT_EQ(Get(kFile, "key"), row.expected) << "file: " << row.text;
     }
 }
 
-TEST_F(SettingsFile, CaseInsensitiveKeysOnRequest) {
+TEST_F(SettingsFile, ReaderResultsAndErrors) {
     Put("UserHomeEnable=\"yes\"\n");
-    EXPECT_EQ(Get(kFile, "userhomeenable", 0), "<absent>");
     EXPECT_EQ(Get(kFile, "userhomeenable", 1), "yes");
     EXPECT_EQ(VLIBCFileCheckKeyValue(kFile, "userhomeenable", "YES", 1), 1);
     EXPECT_EQ(VLIBCFileCheckKeyValue(kFile, "UserHomeEnable", "YES", 0), 0);
-    EXPECT_EQ(VLIBCFileCheckKeyValue(kFile, "UserHomeEnable", "yes", 0), 1);
     EXPECT_EQ(VLIBCFileCheckKeyValue(kFile, "missing", "yes", 0), 0);
-}
 
-TEST_F(SettingsFile, ReturnsFullLengthAndTruncates) {
-    Put("key=\"abcdef\"\n");
-    char buf[4] = {'x', 'x', 'x', 'x'};
+    Put("# c=1\nkey=\"abcdef\"\na = one\nkey=\"shadowed\"\nbroken\nc=\"x=y\"\n");
+    EXPECT_EQ(KeysOf(kFile), "3: key=abcdef a=one c=x=y");  // each key once, as readers see it
+    EXPECT_EQ(KeysOf(kFile, false), "3: key a c");
+    char buf[4] = {'x', 'x', 'x', 'x'};  // the full length + 1, and whatever fits
     EXPECT_EQ(VLIBCFileGetKeyValue(kFile, "key", buf, sizeof buf, 0), 7);
     EXPECT_STREQ(buf, "abc");
     EXPECT_EQ(VLIBCFileGetKeyValue(kFile, "key", nullptr, 0, 0), 7);
-    char one[1] = {'x'};
-    EXPECT_EQ(VLIBCFileGetKeyValue(kFile, "key", one, 1, 0), 7);
-    EXPECT_EQ(one[0], '\0');
-    Put("key=\"\"\n");
-    EXPECT_EQ(VLIBCFileGetKeyValue(kFile, "key", buf, sizeof buf, 0), 1);
-    EXPECT_STREQ(buf, "");
-}
+    EXPECT_EQ(VLIBCFileGetKeyValue(kFile, "key", buf, 1, 0), 7);
+    EXPECT_EQ(buf[0], '\0');
 
-TEST_F(SettingsFile, MissingFileAndAbsentKeyAreTold) {
-    char buf[16];
-    EXPECT_EQ(VLIBCFileGetKeyValue("/tmp/conf/none.conf", "key", buf, sizeof buf, 0), -1);
-    EXPECT_EQ(VLIBCErrGet(), QUIB_ERR_OPEN_FAILED);
+    const Outcome openFailed{-1, QUIB_ERR_OPEN_FAILED};
+    EXPECT_EQ(OUTCOME(VLIBCFileGetKeyValue(kFile, "absent", buf, sizeof buf, 0)), (Outcome{0, QUIB_ERR_OPEN_FAILED}));
+    EXPECT_EQ(OUTCOME(VLIBCFileGetKeyValue(kNone, "key", buf, sizeof buf, 0)), openFailed);
+    EXPECT_EQ(OUTCOME(VLIBCFileGetKeyValue(kDir, "key", buf, sizeof buf, 0)), openFailed);
+    EXPECT_EQ(OUTCOME(VLIBCFileCheckKeyValue(kNone, "key", "v", 0)), openFailed);
+    EXPECT_EQ(OUTCOME(VLIBCFileRemoveKey(kNone, "key")), openFailed);
     VLIBCErrSetEx(0, "", 0);
-    Put("other=\"1\"\n");
-    EXPECT_EQ(VLIBCFileGetKeyValue(kFile, "key", buf, sizeof buf, 0), 0);
+    EXPECT_EQ(KeysOf(kNone), "-1:");
     EXPECT_EQ(VLIBCErrGet(), QUIB_ERR_OPEN_FAILED);
-    // A directory is no settings file.
-    EXPECT_EQ(VLIBCFileGetKeyValue(kDir, "key", buf, sizeof buf, 0), -1);
-    EXPECT_EQ(VLIBCErrGet(), QUIB_ERR_OPEN_FAILED);
-
-    EXPECT_EQ(VLIBCFileCheckKeyValue("/tmp/conf/none.conf", "key", "v", 0), -1);
-    EXPECT_EQ(VLIBCErrGet(), QUIB_ERR_OPEN_FAILED);
-    EXPECT_EQ(VLIBCFileRemoveKey("/tmp/conf/none.conf", "key"), -1);
-    EXPECT_EQ(VLIBCErrGet(), QUIB_ERR_OPEN_FAILED);
-    EXPECT_EQ(access("/tmp/conf/none.conf", F_OK), -1);  // remove never creates
-    List keys(VLIBCSzListAlloc(1));
-    PSZLIST raw = keys.get();
-    EXPECT_EQ(VLIBCFileGetKeys("/tmp/conf/none.conf", &raw, nullptr), -1);
-    EXPECT_EQ(VLIBCErrGet(), QUIB_ERR_OPEN_FAILED);
+    EXPECT_EQ(access(kNone, F_OK), -1);  // remove never creates
 }
 
 TEST_F(SettingsFile, RejectsBadArguments) {
@@ -181,66 +129,41 @@ TEST_F(SettingsFile, RejectsBadArguments) {
     std::string longKey(300, 'k');
     std::string longPath = "/tmp/" + std::string(PATH_MAX, 'p');
     char buf[16];
-    const struct {
-        const char *file;
-        const char *key;
-        char *buf;
-        size_t size;
-        int flags;
-        int code;
-    } reads[] = {
-        {nullptr, "key", buf, sizeof buf, 0, QUIB_ERR_BAD_PARAMETER},
-        {"", "key", buf, sizeof buf, 0, QUIB_ERR_BAD_PARAMETER},
-        {longPath.c_str(), "key", buf, sizeof buf, 0, QUIB_ERR_NAME_TOO_LONG},
-        {kFile, nullptr, buf, sizeof buf, 0, QUIB_ERR_BAD_PARAMETER},
-        {kFile, "", buf, sizeof buf, 0, QUIB_ERR_BAD_PARAMETER},
-        {kFile, "a=b", buf, sizeof buf, 0, QUIB_ERR_BAD_PARAMETER},
-        {kFile, "line\nbreak", buf, sizeof buf, 0, QUIB_ERR_BAD_PARAMETER},
-        {kFile, "\xff\xfe", buf, sizeof buf, 0, QUIB_ERR_BAD_PARAMETER},
-        {kFile, longKey.c_str(), buf, sizeof buf, 0, QUIB_ERR_BAD_PARAMETER},
-        {kFile, "key", buf, sizeof buf, 2, QUIB_ERR_BAD_PARAMETER},
-        {kFile, "key", nullptr, 8, 0, QUIB_ERR_BAD_PARAMETER},
+    const Outcome bad{-1, QUIB_ERR_BAD_PARAMETER};
+    const Outcome tooLong{-1, QUIB_ERR_NAME_TOO_LONG};
+    const struct { const char *file, *key; char *buf; int flags; Outcome outcome; } reads[] = {
+        {nullptr, "key", buf, 0, bad},  {longPath.c_str(), "key", buf, 0, tooLong}, {kFile, nullptr, buf, 0, bad},
+        {kFile, "", buf, 0, bad},       {kFile, "a=b", buf, 0, bad},   {kFile, "line\nbreak", buf, 0, bad},
+        {kFile, "\xff\xfe", buf, 0, bad}, {kFile, longKey.c_str(), buf, 0, bad}, {kFile, "key", buf, 2, bad},
+        {kFile, "key", nullptr, 0, bad},
     };
-    for (const auto &c : reads) {
-        VLIBCErrSetEx(0, "", 0);
-        EXPECT_EQ(VLIBCFileGetKeyValue(c.file, c.key, c.buf, c.size, c.flags), -1);
-        EXPECT_EQ(VLIBCErrGet(), c.code) << (c.key ? c.key : "(null key)");
+    for (const auto &row : reads) {
+        EXPECT_EQ(OUTCOME(VLIBCFileGetKeyValue(row.file, row.key, row.buf, 8, row.flags)), row.outcome)
+            << (row.key ? row.key : "(null key)") << " flags " << row.flags;
     }
-
-    const struct {
-        const char *key;
-        const char *value;
-        int format;
-    } writes[] = {
-        {nullptr, "v", 0},         {"", "v", 0},           {"two words", "v", 0},
-        {"a=b", "v", 0},           {"#key", "v", 0},       {"\"key", "v", 0},
-        {"\xff", "v", 0},          {longKey.c_str(), "v", 0}, {"key", nullptr, 0},
-        {"key", "line\nbreak", 0}, {"key", "cr\rhere", 0}, {"key", "\xc3(", 0},
-        {"key", " padded", 1},     {"key", "padded ", 1},  {"key", "\"quoted", 1},
-        {"key", "v", 2},
+    const struct { const char *file, *key, *value; int format; Outcome outcome; } writes[] = {
+        {nullptr, "k", "v", 0, bad},       {longPath.c_str(), "k", "v", 0, tooLong}, {kFile, nullptr, "v", 0, bad},
+        {kFile, "", "v", 0, bad},          {kFile, "two words", "v", 0, bad},      {kFile, "a=b", "v", 0, bad},
+        {kFile, "#key", "v", 0, bad},      {kFile, "\"key", "v", 0, bad},          {kFile, "\xff", "v", 0, bad},
+        {kFile, longKey.c_str(), "v", 0, bad}, {kFile, "key", nullptr, 0, bad},    {kFile, "key", "line\nbreak", 0, bad},
+        {kFile, "key", "cr\rhere", 0, bad}, {kFile, "key", "\xc3(", 0, bad},       {kFile, "key", " padded", 1, bad},
+        {kFile, "key", "padded ", 1, bad}, {kFile, "key", "\"quoted", 1, bad},      {kFile, "key", "v", 2, bad},
     };
-    for (const auto &c : writes) {
-        VLIBCErrSetEx(0, "", 0);
-        EXPECT_EQ(VLIBCFileSetKeyValue(kFile, c.key, c.value, c.format), -1)
-            << (c.key ? c.key : "(null)") << " = " << (c.value ? c.value : "(null)");
-        EXPECT_EQ(VLIBCErrGet(), QUIB_ERR_BAD_PARAMETER);
+    for (const auto &row : writes) {
+        EXPECT_EQ(OUTCOME(VLIBCFileSetKeyValue(row.file, row.key, row.value, row.format)), row.outcome)
+            << (row.key ? row.key : "(null)") << " = " << (row.value ? row.value : "(null)");
     }
-    EXPECT_EQ(VLIBCFileSetKeyValue(nullptr, "k", "v", 0), -1);
-    EXPECT_EQ(VLIBCFileSetKeyValue(longPath.c_str(), "k", "v", 0), -1);
-    EXPECT_EQ(VLIBCErrGet(), QUIB_ERR_NAME_TOO_LONG);
-    EXPECT_EQ(VLIBCFileRemoveKey(kFile, nullptr), -1);
-    EXPECT_EQ(VLIBCFileCheckKeyValue(kFile, "key", nullptr, 0), -1);
-    EXPECT_EQ(VLIBCFileCheckKeyValue(kFile, "key", "v", 5), -1);
-    EXPECT_EQ(VLIBCFileGetKeys(kFile, nullptr, nullptr), -1);
+    for (const Outcome &outcome :
+         {OUTCOME(VLIBCFileRemoveKey(kFile, nullptr)), OUTCOME(VLIBCFileCheckKeyValue(kFile, "key", nullptr, 0)),
+          OUTCOME(VLIBCFileCheckKeyValue(kFile, "key", "v", 5)), OUTCOME(VLIBCFileGetKeys(kFile, nullptr, nullptr))}) {
+        EXPECT_EQ(outcome, bad);
+    }
     EXPECT_EQ(ReadText(kFile), "key=\"v\"\n");  // nothing was written
 }
 
 TEST_F(SettingsFile, ValuesSurviveARoundTrip) {
-    const char *values[] = {
-        "plain", "", "with spaces", "a=b=c", "say \"hi\"", "back\\slash", "trailing\\",
-        "\\\"", "#hash", "  padded  ", "tab\there", "caf\xc3\xa9 \xe6\x97\xa5\xe6\x9c\xac", "'single'",
-    };
-    for (const char *value : values) {
+    for (const char *value : {"plain", "", "with spaces", "a=b=c", "say \"hi\"", "back\\slash", "trailing\\", "\\\"",
+                              "#hash", "  padded  ", "tab\there", "caf\xc3\xa9 \xe6\x97\xa5\xe6\x9c\xac", "'single'"}) {
         ASSERT_EQ(VLIBCFileSetKeyValue(kFile, "key", value, 0), 0) << value;
         EXPECT_EQ(Get(kFile, "key"), value);
         EXPECT_EQ(VLIBCFileCheckKeyValue(kFile, "key", value, 0), 1) << value;
@@ -251,75 +174,42 @@ TEST_F(SettingsFile, ValuesSurviveARoundTrip) {
 }
 
 TEST_F(SettingsFile, RewriteKeepsEverythingElse) {
-    Put("# Appliance settings\r\n"
-        "\r\n"
-        "  # indented comment\r\n"
-        "first = unquoted\r\n"
-        "malformed line\r\n"
-        "key=\"old\"\r\n"
-        "key=\"duplicate\"\r\n"
-        "last=\"no newline\"");
+    const std::string head = "# Appliance settings\r\n\r\n  # indented comment\r\n";
+    Put(head + "first = unquoted\r\nmalformed line\r\nkey=\"old\"\r\nkey=\"duplicate\"\r\nlast=\"no newline\"");
     ASSERT_EQ(VLIBCFileSetKeyValue(kFile, "key", "new \"one\"", 0), 0);
     EXPECT_EQ(ReadText(kFile),
-              "# Appliance settings\r\n"
-              "\r\n"
-              "  # indented comment\r\n"
-              "first = unquoted\r\n"
-              "malformed line\r\n"
-              "key=\"new \\\"one\\\"\"\r\n"
-              "last=\"no newline\"");
+              head + "first = unquoted\r\nmalformed line\r\nkey=\"new \\\"one\\\"\"\r\nlast=\"no newline\"");
     ASSERT_EQ(VLIBCFileSetKeyValue(kFile, "added", "1", 0), 0);
-    EXPECT_EQ(ReadText(kFile),
-              "# Appliance settings\r\n"
-              "\r\n"
-              "  # indented comment\r\n"
-              "first = unquoted\r\n"
-              "malformed line\r\n"
-              "key=\"new \\\"one\\\"\"\r\n"
-              "last=\"no newline\"\r\n"
-              "added=\"1\"\r\n");
+    EXPECT_EQ(ReadText(kFile), head + "first = unquoted\r\nmalformed line\r\nkey=\"new \\\"one\\\"\"\r\n"
+                                      "last=\"no newline\"\r\nadded=\"1\"\r\n");
     ASSERT_EQ(VLIBCFileRemoveKey(kFile, "first"), 0);
     ASSERT_EQ(VLIBCFileRemoveKey(kFile, "last"), 0);
-    EXPECT_EQ(ReadText(kFile),
-              "# Appliance settings\r\n"
-              "\r\n"
-              "  # indented comment\r\n"
-              "malformed line\r\n"
-              "key=\"new \\\"one\\\"\"\r\n"
-              "added=\"1\"\r\n");
-}
+    EXPECT_EQ(ReadText(kFile), head + "malformed line\r\nkey=\"new \\\"one\\\"\"\r\nadded=\"1\"\r\n");
 
-TEST_F(SettingsFile, RemoveTakesEveryOccurrenceAndLeavesAbsentKeysAlone) {
+    // Remove takes every occurrence; removing an absent key or setting the value a key
+    // already has does not rewrite the file.
     Put("a=\"1\"\n# note\na=\"2\"\nb=\"3\"\n");
     ASSERT_EQ(VLIBCFileRemoveKey(kFile, "a"), 0);
     EXPECT_EQ(ReadText(kFile), "# note\nb=\"3\"\n");
-    struct stat before;
+    struct stat before, after;
     ASSERT_EQ(stat(kFile, &before), 0);
     EXPECT_EQ(VLIBCFileRemoveKey(kFile, "absent"), 0);
-    struct stat after;
-    ASSERT_EQ(stat(kFile, &after), 0);
-    EXPECT_EQ(before.st_ino, after.st_ino);  // not rewritten
-    // Setting the value it already has does not rewrite either.
     ASSERT_EQ(VLIBCFileSetKeyValue(kFile, "b", "3", 0), 0);
     ASSERT_EQ(stat(kFile, &after), 0);
     EXPECT_EQ(before.st_ino, after.st_ino);
 }
 
-TEST_F(SettingsFile, NewFilesAre0644WhateverTheUmask) {
+TEST_F(SettingsFile, RewriteKeepsOwnerModeAndSymlink) {
     mode_t old = umask(077);
     ASSERT_EQ(VLIBCFileSetKeyValue("/tmp/conf/new.conf", "key", "v", 0), 0);
     umask(old);
     struct stat st;
     ASSERT_EQ(stat("/tmp/conf/new.conf", &st), 0);
-    EXPECT_EQ(st.st_mode & 07777, 0644u);
+    EXPECT_EQ(st.st_mode & 07777, 0644u);  // new files, whatever the umask
     EXPECT_EQ(ReadText("/tmp/conf/new.conf"), "key=\"v\"\n");
-}
 
-TEST_F(SettingsFile, RewriteKeepsOwnerModeAndSymlink) {
-    app_.AddUser("alice");
-    app_.WriteFile(kFile, "key=\"v\"\n", "alice", 0600);
+    app_.AddUser("alice").WriteFile(kFile, "key=\"v\"\n", "alice", 0600);
     ASSERT_EQ(VLIBCFileSetKeyValue(kFile, "key", "w", 0), 0);
-    struct stat st;
     ASSERT_EQ(stat(kFile, &st), 0);
     EXPECT_EQ(st.st_uid, app_.Uid("alice"));
     EXPECT_EQ(st.st_mode & 07777, 0600u);
@@ -329,44 +219,31 @@ TEST_F(SettingsFile, RewriteKeepsOwnerModeAndSymlink) {
     ASSERT_EQ(lstat("/tmp/conf/link.conf", &st), 0);
     EXPECT_TRUE(S_ISLNK(st.st_mode));
     EXPECT_EQ(Get(kFile, "key"), "through link");
-    EXPECT_EQ(DirEntries(kDir), (Strings{"link.conf", "test.conf"}));
+    EXPECT_EQ(DirEntries(kDir), (Strings{"link.conf", "new.conf", "test.conf"}));
 }
 
 TEST_F(SettingsFile, WriterFailuresAreTranslatedAndLeaveNoTrace) {
-    EXPECT_EQ(VLIBCFileSetKeyValue("/tmp/conf/missing/x.conf", "k", "v", 0), -1);
-    EXPECT_EQ(VLIBCErrGet(), QUIB_ERR_NO_SUCH_FILE);
     app_.WriteFile("/tmp/conf/plain", "not a directory");
-    EXPECT_EQ(VLIBCFileSetKeyValue("/tmp/conf/plain/x.conf", "k", "v", 0), -1);
-    EXPECT_EQ(VLIBCErrGet(), QUIB_ERR_NO_SUCH_PATH);
-
-    app_.MakeDir("/volume2/conf");
-    app_.WriteFile("/volume2/conf/ro.conf", "key=\"v\"\n");
-    app_.RemountReadOnly("/volume2");
-    EXPECT_EQ(VLIBCFileSetKeyValue("/volume2/conf/ro.conf", "key", "w", 0), -1);
-    EXPECT_EQ(VLIBCErrGet(), QUIB_ERR_READ_ONLY_FS);
+    app_.MakeDir("/volume2/conf").WriteFile("/volume2/conf/ro.conf", "key=\"v\"\n").RemountReadOnly("/volume2");
+    EXPECT_EQ(OUTCOME(VLIBCFileSetKeyValue("/tmp/conf/missing/x.conf", "k", "v", 0)), (Outcome{-1, QUIB_ERR_NO_SUCH_FILE}));
+    EXPECT_EQ(OUTCOME(VLIBCFileSetKeyValue("/tmp/conf/plain/x.conf", "k", "v", 0)), (Outcome{-1, QUIB_ERR_NO_SUCH_PATH}));
+    EXPECT_EQ(OUTCOME(VLIBCFileSetKeyValue("/volume2/conf/ro.conf", "key", "w", 0)), (Outcome{-1, QUIB_ERR_READ_ONLY_FS}));
     EXPECT_EQ(Get("/volume2/conf/ro.conf", "key"), "v");  // readers still read it
-}
 
-TEST_F(SettingsFile, UnprivilegedWritersCantReplaceOrGiveAwayFiles) {
+    // Unprivileged writers: the first file is writable by everyone but its directory is not, so
+    // no temporary can be made; the second's directory is open, but the rewritten file could
+    // not keep root as its owner.
     app_.AddUser("alice");
-    // The file is writable by everyone, but its directory is not: no temporary can be made.
-    app_.MakeDir("/tmp/conf/closed", "root", 0755);
-    app_.WriteFile("/tmp/conf/closed/a.conf", "key=\"v\"\n", "root", 0666);
-    // The directory is open, but the rewritten file could not keep root as its owner.
-    app_.MakeDir("/tmp/conf/open", "root", 0777);
-    app_.WriteFile("/tmp/conf/open/b.conf", "key=\"v\"\n", "root", 0666);
+    app_.MakeDir("/tmp/conf/closed", "root", 0755).WriteFile("/tmp/conf/closed/a.conf", "key=\"v\"\n", "root", 0666);
+    app_.MakeDir("/tmp/conf/open", "root", 0777).WriteFile("/tmp/conf/open/b.conf", "key=\"v\"\n", "root", 0666);
     int result = app_.RunAs("alice", [] {
-        if (VLIBCFileSetKeyValue("/tmp/conf/closed/a.conf", "key", "w", 0) != -1 ||
-            VLIBCErrGet() != QUIB_ERR_ACCESS_DENIED) {
-            return 1;
+        for (const char *file : {"/tmp/conf/closed/a.conf", "/tmp/conf/open/b.conf"}) {
+            if (VLIBCFileSetKeyValue(file, "key", "w", 0) != -1 || VLIBCErrGet() != QUIB_ERR_ACCESS_DENIED) {
+                return 1;
+            }
         }
-        if (VLIBCFileSetKeyValue("/tmp/conf/open/b.conf", "key", "w", 0) != -1 ||
-            VLIBCErrGet() != QUIB_ERR_ACCESS_DENIED) {
-            return 2;
-        }
-        // Reading needs no more than read permission.
-        char buf[8];
-        return VLIBCFileGetKeyValue("/tmp/conf/open/b.conf", "key", buf, sizeof buf, 0) == 2 ? 0 : 3;
+        char buf[8];  // reading needs no more than read permission
+        return VLIBCFileGetKeyValue("/tmp/conf/open/b.conf", "key", buf, sizeof buf, 0) == 2 ? 0 : 2;
     });
     EXPECT_EQ(result, 0);
     EXPECT_EQ(Get("/tmp/conf/open/b.conf", "key"), "v");
@@ -374,135 +251,100 @@ TEST_F(SettingsFile, UnprivilegedWritersCantReplaceOrGiveAwayFiles) {
     EXPECT_EQ(DirEntries("/tmp/conf/closed"), (Strings{"a.conf"}));
 }
 
-TEST_F(SettingsFile, GetKeysListsEachKeyOnceInFileOrder) {
-    Put("# c\nb=\"2\"\na = one\nb=\"shadowed\"\nbroken\nc=\"x=y\"\n");
-    List keys(VLIBCSzListAlloc(1));
-    List values(VLIBCSzListAlloc(1));
-    PSZLIST k = keys.release();
-    PSZLIST v = values.release();
-    EXPECT_EQ(VLIBCFileGetKeys(kFile, &k, &v), 3);
-    keys.reset(k);
-    values.reset(v);
-    EXPECT_EQ(Items(keys.get()), (Strings{"b", "a", "c"}));
-    EXPECT_EQ(Items(values.get()), (Strings{"2", "one", "x=y"}));
-
-    List onlyKeys(VLIBCSzListAlloc(1));
-    k = onlyKeys.release();
-    EXPECT_EQ(VLIBCFileGetKeys(kFile, &k, nullptr), 3);
-    onlyKeys.reset(k);
-    EXPECT_EQ(Items(onlyKeys.get()), (Strings{"b", "a", "c"}));
-}
-
 TEST_F(SettingsFile, NoDescriptorLeaksOnAnyPath) {
     Put("key=\"v\"\n");
-    int before = OpenDescriptors();
+    int before = norvo::testing::OpenDescriptors();
     char buf[8];
     for (int i = 0; i < 50; ++i) {
-        (void)VLIBCFileGetKeyValue(kFile, "key", buf, sizeof buf, 0);
-        (void)VLIBCFileGetKeyValue(kFile, "absent", buf, sizeof buf, 0);
-        (void)VLIBCFileGetKeyValue("/tmp/conf/none", "key", buf, sizeof buf, 0);
-        (void)VLIBCFileGetKeyValue(kDir, "key", buf, sizeof buf, 0);
-        (void)VLIBCFileSetKeyValue(kFile, "key", i % 2 ? "a" : "b", 0);
-        (void)VLIBCFileSetKeyValue("/tmp/conf/missing/x", "key", "v", 0);
-        (void)VLIBCFileSetKeyValue(kDir, "key", "v", 0);
-        (void)VLIBCFileRemoveKey(kFile, "absent");
-        (void)VLIBCFileRemoveKey("/tmp/conf/none", "key");
-        (void)VLIBCFileCheckKeyValue(kFile, "key", "a", 0);
+        for (const char *file : {kFile, kNone, kDir, "/tmp/conf/missing/x"}) {
+            (void)VLIBCFileGetKeyValue(file, i % 2 ? "key" : "absent", buf, sizeof buf, 0);
+            (void)VLIBCFileSetKeyValue(file == kNone ? kFile : file, "key", i % 2 ? "a" : "b", 0);
+            (void)VLIBCFileRemoveKey(file, "absent");
+            (void)VLIBCFileCheckKeyValue(file, "key", "a", 0);
+            (void)KeysOf(file);
+        }
     }
-    EXPECT_EQ(OpenDescriptors(), before);
+    EXPECT_EQ(norvo::testing::OpenDescriptors(), before);
     EXPECT_EQ(DirEntries(kDir), (Strings{"test.conf"}));
 }
 
-// Runs body(index) in count children; their exit status is body's result.
-template <typename Body>
-std::vector<pid_t> Spawn(int count, Body body) {
+// Runs body(index) in count children, calling between() until every child has exited; true
+// when each returned 0.
+template <typename Body, typename Between>
+bool InChildren(int count, Body body, Between between) {
     std::vector<pid_t> pids;
     for (int i = 0; i < count; ++i) {
         fflush(nullptr);
-        pid_t pid = fork();
-        if (pid == 0) {
+        pids.push_back(fork());
+        if (pids.back() == 0) {
             _exit(body(i));
         }
-        pids.push_back(pid);
     }
-    return pids;
-}
-
-bool AllSucceeded(const std::vector<pid_t> &pids) {
     bool ok = true;
-    for (pid_t pid : pids) {
+    while (!pids.empty()) {
+        between();
         int status = 0;
-        if (waitpid(pid, &status, 0) != pid || !WIFEXITED(status) || WEXITSTATUS(status) != 0) {
-            ok = false;
+        pid_t done = waitpid(pids.back(), &status, WNOHANG);
+        if (done != 0) {
+            ok = ok && done == pids.back() && WIFEXITED(status) && WEXITSTATUS(status) == 0;
+            pids.pop_back();
         }
     }
     return ok;
 }
 
-bool AnyRunning(const std::vector<pid_t> &pids) {
-    for (pid_t pid : pids) {
-        siginfo_t info{};
-        if (waitid(P_PID, static_cast<id_t>(pid), &info, WEXITED | WNOHANG | WNOWAIT) == 0 &&
-            info.si_pid == 0) {
-            return true;  // not exited yet; WNOWAIT leaves it for AllSucceeded to reap
-        }
-    }
-    return false;
+// True when text is before + one byte repeated + after.
+bool WholeAround(const std::string &text, const std::string &before, const std::string &after) {
+    size_t size = text.size() - std::min(text.size(), before.size() + after.size());
+    std::string middle = text.substr(std::min(text.size(), before.size()), size);
+    return size > 0 && text.rfind(before, 0) == 0 && text.compare(before.size() + size, after.size(), after) == 0 &&
+           middle.find_first_not_of(middle[0]) == std::string::npos;
 }
 
 TEST_F(SettingsFile, ReadersNeverSeeATornFile) {
-    Put("# header comment\nhead=\"H\"\n\n# middle comment\npayload=\"x\"\ntail=\"T\"\n");
-    std::vector<pid_t> writers = Spawn(2, [](int index) {
-        for (int i = 0; i < 300; ++i) {
-            // Large values of one repeated letter: a mixture of two writes would show.
-            std::string value(1000 + (i * 7919) % 60000, static_cast<char>('a' + index * 13 + i % 13));
-            if (VLIBCFileSetKeyValue(kFile, "payload", value.c_str(), 0) != 0) {
-                return 1;
-            }
-        }
-        return 0;
-    });
+    const std::string top = "# header comment\nhead=\"H\"\n\n# middle comment\npayload=\"";
+    Put(top + "x\"\ntail=\"T\"\n");
     int reads = 0;
     int torn = 0;
-    while (AnyRunning(writers) || reads < 200) {
-        List keys(VLIBCSzListAlloc(4));
-        List values(VLIBCSzListAlloc(4));
-        PSZLIST k = keys.release();
-        PSZLIST v = values.release();
-        int n = VLIBCFileGetKeys(kFile, &k, &v);
-        keys.reset(k);
-        values.reset(v);
-        std::string raw = ReadText(kFile);
-        ++reads;
-        bool whole = n == 3 && Items(keys.get()) == Strings{"head", "payload", "tail"} &&
-                     raw.rfind("# header comment\nhead=\"H\"\n\n# middle comment\npayload=\"", 0) == 0 &&
-                     raw.size() > 9 && raw.compare(raw.size() - 9, 9, "tail=\"T\"\n") == 0;
-        if (whole) {
-            std::string payload = VLIBCSzListGet(values.get(), 1);
-            whole = !payload.empty() && payload.find_first_not_of(payload[0]) == std::string::npos;
-        }
-        torn += whole ? 0 : 1;
-    }
-    EXPECT_TRUE(AllSucceeded(writers));
+    bool ok = InChildren(
+        2,
+        [](int index) {
+            for (int i = 0; i < 300; ++i) {
+                // Large values of one repeated letter: a mixture of two writes would show.
+                std::string value(1000 + (i * 7919) % 60000, static_cast<char>('a' + index * 13 + i % 13));
+                if (VLIBCFileSetKeyValue(kFile, "payload", value.c_str(), 0) != 0) {
+                    return 1;
+                }
+            }
+            return 0;
+        },
+        [&] {
+            ++reads;
+            bool whole = WholeAround(KeysOf(kFile), "3: head=H payload=", " tail=T") &&
+                         WholeAround(ReadText(kFile), top, "\"\ntail=\"T\"\n");
+            torn += whole ? 0 : 1;
+        });
+    EXPECT_TRUE(ok);
     EXPECT_EQ(torn, 0) << "of " << reads << " reads";
 }
 
 TEST_F(SettingsFile, ConcurrentWritersLoseNoUpdate) {
     Put("# shared by four writers\n");
-    constexpr int kWriters = 4;
-    constexpr int kRounds = 500;
-    std::vector<pid_t> writers = Spawn(kWriters, [](int index) {
-        std::string key = "writer" + std::to_string(index);
-        for (int i = 1; i <= kRounds; ++i) {
-            if (VLIBCFileSetKeyValue(kFile, key.c_str(), std::to_string(i).c_str(), 0) != 0) {
-                return 1;
+    bool ok = InChildren(
+        4,
+        [](int index) {
+            std::string key = "writer" + std::to_string(index);
+            for (int i = 1; i <= 500; ++i) {
+                if (VLIBCFileSetKeyValue(kFile, key.c_str(), std::to_string(i).c_str(), 0) != 0) {
+                    return 1;
+                }
             }
-        }
-        return 0;
-    });
-    ASSERT_TRUE(AllSucceeded(writers));
-    for (int i = 0; i < kWriters; ++i) {
-        EXPECT_EQ(Get(kFile, ("writer" + std::to_string(i)).c_str()), std::to_string(kRounds));
+            return 0;
+        },
+        [] { usleep(1000); });
+    ASSERT_TRUE(ok);
+    for (const char *key : {"writer0", "writer1", "writer2", "writer3"}) {
+        EXPECT_EQ(Get(kFile, key), "500") << key;
     }
     EXPECT_EQ(ReadText(kFile).rfind("# shared by four writers\n", 0), 0u);
     EXPECT_EQ(DirEntries(kDir), (Strings{"test.conf"}));
