@@ -1,5 +1,4 @@
 // The wildcard matcher against a direct, slow transcription of its recursive definition.
-#include <dlfcn.h>
 #include <stdint.h>
 
 #include <iterator>
@@ -14,15 +13,9 @@
 
 namespace {
 
-#define NVO_TEXT_OF(x) #x
-#define NVO_NAME_OF(x) NVO_TEXT_OF(x)
-
-// ICU's own default case folding. The tests link ICU only through libnorvo, so the function is
-// taken from the process by its versioned name (u_foldCase is a macro for it).
+// ICU's own default case folding, the reference the matcher must agree with.
 UChar32 IcuFold(UChar32 c) {
-    using Fold = UChar32 (*)(UChar32, uint32_t);
-    static const Fold fold = reinterpret_cast<Fold>(dlsym(RTLD_DEFAULT, NVO_NAME_OF(u_foldCase)));
-    return fold(c, U_FOLD_CASE_DEFAULT);
+    return u_foldCase(c, U_FOLD_CASE_DEFAULT);
 }
 
 // Decoding as defined: a lead byte 0xC0..0xF4 takes 1, 2 or 3 trail bytes, unvalidated, keeping
