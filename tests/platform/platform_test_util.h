@@ -14,27 +14,25 @@ namespace norvo::testing {
 inline int OpenDescriptors() {
     int count = 0;
     if (DIR *dir = opendir("/proc/self/fd")) {
-        while (readdir(dir) != nullptr) {
-            ++count;
-        }
+        while (readdir(dir) != nullptr) ++count;
         closedir(dir);
     }
     return count;
 }
 
-// What a call left behind: its result, the error slot and errno (kAnyErrno: not compared).
-constexpr int kAnyErrno = -1;
-struct Outcome {
-    long rc;
-    int slot;
-    int err = kAnyErrno;
-};
+// What a call left behind: its result, the error slot and errno; kAny is not compared (the slot
+// is not cleared on success, nor promised to stay untouched then).
+constexpr int kAny = -1;
+struct Outcome { long rc; int slot = kAny; int err = kAny; };
 inline bool operator==(const Outcome &a, const Outcome &b) {
-    return a.rc == b.rc && a.slot == b.slot && (a.err == kAnyErrno || b.err == kAnyErrno || a.err == b.err);
+    const auto same = [](int x, int y) { return x == kAny || y == kAny || x == y; };
+    return a.rc == b.rc && same(a.slot, b.slot) && same(a.err, b.err);
 }
 inline std::ostream &operator<<(std::ostream &out, const Outcome &o) {
     return out << "{rc " << o.rc << ", slot 0x" << std::hex << o.slot << std::dec << ", errno " << o.err << "}";
 }
+
+inline Outcome Failed(int slot, int err = kAny) { return {-1, slot, err}; }
 
 // Runs call with errno and the error slot cleared first, so neither can be left from before.
 template <typename F>
@@ -46,3 +44,6 @@ Outcome OutcomeOf(F &&call) {
 }
 
 }  // namespace norvo::testing
+
+// The Outcome of one call expression: EXPECT_EQ(OUTCOME(f(x)), Failed(QUIB_ERR_...)).
+#define OUTCOME(call) norvo::testing::OutcomeOf([&] { return call; })
