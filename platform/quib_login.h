@@ -28,8 +28,8 @@ QUIB_API gid_t QuibCgiGIDGet(const char *sid, const char *user);
 // The share privilege (0, 1 or 2) of a domain or directory account logged in under sid,
 // from the share's lists as for a local account (no access, then read-write, then read-only).
 // 0 with *priv set; -1 when the sid is not a live login of that user (0x0300), the name is not
-// of that kind of account or the sid is malformed (0x0D00) or the share is unknown (0x1400); -2 when no domain (no
-// directory service) is configured: the join test fails.
+// of that kind of account or the sid is malformed (0x0D00), or the share is unknown (0x1400);
+// -2 when no domain (no directory service) is configured: the join test fails.
 QUIB_API int QuibCgiDomGetPrivilege(const char *share, const char *user, const char *sid, int *priv);
 QUIB_API int QuibCgiLDAPGetPrivilege(const char *share, const char *user, const char *sid, int *priv);
 
