@@ -1,15 +1,25 @@
-// The step shared by the user and group database cursors: both walk a snapshot and deliver only
-// the entries whose kind of account, told by the name, the caller selected.
+// What the user and group database cursors share: both walk a snapshot taken at Open and
+// deliver only the entries whose kind of account, told by the name, the caller selected.
 #pragma once
 #include <stddef.h>
 
+#include <memory>
 #include <string>
 #include <vector>
 
 #include "api_guard.h"
+#include "nss.h"
 #include "quib_user.h"
 
 namespace norvo::platform {
+
+// The state behind a QUIBUSER_DB or QUIBGROUP_DB: the entries NSS enumerated at Open and the
+// index of the next one a step looks at.
+template <typename Entry>
+struct AccountSnapshot {
+    std::vector<Entry> entries;
+    size_t next = 0;
+};
 
 // A type without any of the three kinds would select nothing; callers refuse it as a bad
 // argument rather than answer "end of database".
@@ -40,6 +50,31 @@ int CursorStep(const std::vector<Entry> &entries, size_t *next, Record **out, AU
         return 0;
     }
     return 1;
+}
+
+// Open: a new Db holding what enumerate took; null with the NSS failure code when it fails.
+template <typename Db, typename Entry>
+Db *OpenSnapshot(bool (*enumerate)(std::vector<Entry> *, int *)) {
+    return Guarded<Db *>(nullptr, [&] {
+        auto db = std::make_unique<Db>();
+        int err = 0;
+        if (!enumerate(&db->entries, &err)) {
+            QUIB_SET_ERR(NssFailureCode(err));
+            return static_cast<Db *>(nullptr);
+        }
+        return db.release();
+    });
+}
+
+// GetByCursor: CursorStep over db, after refusing a null db or out, or a type that selects
+// nothing, with 0x0D00.
+template <typename Db, typename Record, typename Make, typename Release>
+int StepSnapshot(Db *db, Record **out, AUTH_TYPE type, Make make, Release release) {
+    if (db == nullptr || out == nullptr || !SelectsAnyKind(type)) {
+        QUIB_SET_ERR(QUIB_ERR_BAD_PARAMETER);
+        return -1;
+    }
+    return Guarded(-1, [&] { return CursorStep(db->entries, &db->next, out, type, make, release); });
 }
 
 }  // namespace norvo::platform

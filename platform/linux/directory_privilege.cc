@@ -52,14 +52,7 @@ int GetPrivilege(const Service &service, const char *share, const char *user, co
         return -1;
     }
     std::string loggedIn;
-    int code = QUIB_ERR_NONE;
-    if (FindLogin(sid, &loggedIn, &code) != LoginState::kLive) {
-        QUIB_SET_ERR(code);
-        return -1;
-    }
-    // Windows and directory names are case-insensitive; ASCII folding is what they share.
-    if (!EqualsIgnoreCase(loggedIn, user)) {
-        QUIB_SET_ERR(QUIB_ERR_ACCESS_DENIED);
+    if (!IsLoginOf(sid, user, &loggedIn)) {
         return -1;
     }
     PQUIBSHARE raw = nullptr;

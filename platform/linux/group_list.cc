@@ -2,8 +2,7 @@
 #include <string>
 #include <vector>
 
-#include "api_guard.h"
-#include "nss.h"
+#include "account_records.h"
 #include "quib_user.h"
 #include "text_util.h"
 
@@ -16,23 +15,10 @@ int QUIBGroupInfoGetgroupList(const char *user, PSZLIST *plist, int flags) {
         QUIB_SET_ERR(QUIB_ERR_BAD_PARAMETER);
         return -1;
     }
-    return np::Guarded(-1, [&] {
-        np::NssUser entry;
-        int err = 0;
-        switch (np::FindUserByName(user, &entry, &err)) {
-        case np::NssStatus::kFound:
-            break;
-        case np::NssStatus::kNotFound:
-            QUIB_SET_ERR(QUIB_ERR_NO_SUCH_USER);
-            return -1;
-        case np::NssStatus::kFailed:
-            QUIB_SET_ERR(np::NssFailureCode(err));
-            return -1;
-        }
+    return np::WithKnownUser(user, [&](const np::NssUser &entry) {
         // getgrouplist puts the primary group first and lists every other group once.
         std::vector<gid_t> gids;
-        if (!np::GroupIdsOf(entry, &gids)) {
-            QUIB_SET_ERR(QUIB_ERR_FAILED);
+        if (!np::ListGroupIds(entry, &gids)) {
             return -1;
         }
         for (const gid_t gid : gids) {

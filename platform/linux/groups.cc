@@ -3,9 +3,9 @@
 #include <stdlib.h>
 
 #include <algorithm>
-#include <memory>
 #include <vector>
 
+#include "account_records.h"
 #include "api_guard.h"
 #include "nss.h"
 #include "quib_paths.h"
@@ -15,83 +15,44 @@
 namespace norvo::platform {
 namespace {
 
-struct GroupRecordFree {
-    void operator()(PQUIBGROUP group) const { QUIBGroupFree(group); }
-};
-using GroupRecord = std::unique_ptr<QUIBGROUP, GroupRecordFree>;
-
-GroupRecord MakeRecord(const NssGroup &entry) {
-    GroupRecord record(static_cast<PQUIBGROUP>(calloc(1, sizeof(QUIBGROUP))));
-    if (record) {
-        record->szName = DupCString(entry.name);
-        record->nGID = entry.gid;
-        record->pMembers = VLIBCSzListAlloc(static_cast<int>(std::max<size_t>(entry.members.size(), 1)));
-    }
-    if (!record || record->szName == nullptr || record->pMembers == nullptr) {
-        QUIB_SET_ERR(QUIB_ERR_NO_MEMORY);
-        return GroupRecord();
-    }
-    for (const std::string &member : entry.members) {
-        if (VLIBCSzListPush(&record->pMembers, member.c_str()) != 0) {
-            return GroupRecord();
+// The one place a group lookup's outcome reaches the caller: runs find(&entry, &err) and
+// returns 0 with *pgroup, or -1 with 0x1E00 (unknown) or the NSS failure code.
+template <typename Find>
+int GetGroup(Find find, PQUIBGROUP *pgroup) {
+    return Guarded(-1, [&] {
+        NssGroup entry;
+        int err = 0;
+        const NssStatus status = find(&entry, &err);
+        if (!Found(status, err, QUIB_ERR_NO_SUCH_GROUP)) {
+            return -1;
         }
-    }
-    return record;
-}
-
-// The one place a group lookup's outcome reaches the caller.
-int Deliver(NssStatus status, const NssGroup &entry, int err, PQUIBGROUP *pgroup) {
-    switch (status) {
-    case NssStatus::kFound: {
-        GroupRecord record = MakeRecord(entry);
+        GroupRecord record = MakeGroupRecord(entry);
         if (!record) {
             return -1;
         }
         *pgroup = record.release();
         return 0;
-    }
-    case NssStatus::kNotFound:
-        QUIB_SET_ERR(QUIB_ERR_NO_SUCH_GROUP);
-        return -1;
-    case NssStatus::kFailed:
-        break;
-    }
-    QUIB_SET_ERR(NssFailureCode(err));
-    return -1;
+    });
 }
 
 // 1 when user belongs to group, 0 when not, -1 with the slot set. An unknown user is 0x1D00;
 // an unknown group is 0x1E00 when groupMustExist, else simply "not a member".
 int Membership(const char *groupName, const char *userName, bool groupMustExist) {
     NssUser user;
-    int err = 0;
-    switch (FindUserByName(userName, &user, &err)) {
-    case NssStatus::kFound:
-        break;
-    case NssStatus::kNotFound:
-        QUIB_SET_ERR(QUIB_ERR_NO_SUCH_USER);
-        return -1;
-    case NssStatus::kFailed:
-        QUIB_SET_ERR(NssFailureCode(err));
+    if (!FindKnownUser(userName, &user)) {
         return -1;
     }
     NssGroup group;
-    switch (FindGroupByName(groupName, &group, &err)) {
-    case NssStatus::kFound:
-        break;
-    case NssStatus::kNotFound:
-        if (!groupMustExist) {
-            return 0;
-        }
-        QUIB_SET_ERR(QUIB_ERR_NO_SUCH_GROUP);
-        return -1;
-    case NssStatus::kFailed:
-        QUIB_SET_ERR(NssFailureCode(err));
+    int err = 0;
+    const NssStatus status = FindGroupByName(groupName, &group, &err);
+    if (status == NssStatus::kNotFound && !groupMustExist) {
+        return 0;
+    }
+    if (!Found(status, err, QUIB_ERR_NO_SUCH_GROUP)) {
         return -1;
     }
     std::vector<gid_t> gids;
-    if (!GroupIdsOf(user, &gids)) {
-        QUIB_SET_ERR(QUIB_ERR_FAILED);
+    if (!ListGroupIds(user, &gids)) {
         return -1;
     }
     return std::find(gids.begin(), gids.end(), group.gid) != gids.end() ? 1 : 0;
@@ -109,12 +70,8 @@ int QUIBGroupGet(const char *name, PQUIBGROUP *pgroup) {
         QUIB_SET_ERR(QUIB_ERR_BAD_PARAMETER);
         return -1;
     }
-    return np::Guarded(-1, [&] {
-        np::NssGroup entry;
-        int err = 0;
-        np::NssStatus status = np::FindGroupByName(name, &entry, &err);
-        return np::Deliver(status, entry, err, pgroup);
-    });
+    return np::GetGroup([name](np::NssGroup *entry, int *err) { return np::FindGroupByName(name, entry, err); },
+                        pgroup);
 }
 
 int QUIBGroupGetByGID(gid_t gid, PQUIBGROUP *pgroup, int blNoCache) {
@@ -123,12 +80,8 @@ int QUIBGroupGetByGID(gid_t gid, PQUIBGROUP *pgroup, int blNoCache) {
         QUIB_SET_ERR(QUIB_ERR_BAD_PARAMETER);
         return -1;
     }
-    return np::Guarded(-1, [&] {
-        np::NssGroup entry;
-        int err = 0;
-        np::NssStatus status = np::FindGroupById(gid, &entry, &err);
-        return np::Deliver(status, entry, err, pgroup);
-    });
+    return np::GetGroup([gid](np::NssGroup *entry, int *err) { return np::FindGroupById(gid, entry, err); },
+                        pgroup);
 }
 
 int QUIBGroupGetGID(const char *name, gid_t *gid) {
@@ -139,18 +92,12 @@ int QUIBGroupGetGID(const char *name, gid_t *gid) {
     return np::Guarded(-1, [&] {
         np::NssGroup entry;
         int err = 0;
-        switch (np::FindGroupByName(name, &entry, &err)) {
-        case np::NssStatus::kFound:
-            *gid = entry.gid;
-            return 0;
-        case np::NssStatus::kNotFound:
-            QUIB_SET_ERR(QUIB_ERR_NO_SUCH_GROUP);
+        const np::NssStatus status = np::FindGroupByName(name, &entry, &err);
+        if (!np::Found(status, err, QUIB_ERR_NO_SUCH_GROUP)) {
             return -1;
-        case np::NssStatus::kFailed:
-            break;
         }
-        QUIB_SET_ERR(np::NssFailureCode(err));
-        return -1;
+        *gid = entry.gid;
+        return 0;
     });
 }
 

@@ -5,9 +5,9 @@
 #include <string.h>
 #include <time.h>
 
-#include <memory>
 #include <string>
 
+#include "account_records.h"
 #include "api_guard.h"
 #include "login_db.h"
 #include "login_session.h"
@@ -25,11 +25,6 @@ namespace {
 constexpr long kDefaultTimeoutMinutes = 15;
 constexpr long kMaxTimeoutMinutes = 365L * 24 * 60;
 constexpr size_t kMaxRemoteAddrLength = 255;
-
-struct UserFree {
-    void operator()(PQUIBUSER user) const { QUIBUserFree(user); }
-};
-using UserRecord = std::unique_ptr<QUIBUSER, UserFree>;
 
 bool IsAcceptableAddress(const char *address) {
     if (address == nullptr) {
@@ -82,6 +77,19 @@ LoginState FindLogin(const char *sid, std::string *user, int *code) {
         return LoginState::kLive;
     }
     return *code == QUIB_ERR_ACCESS_DENIED ? LoginState::kUnknown : LoginState::kFailed;
+}
+
+bool IsLoginOf(const char *sid, const char *user, std::string *loggedIn) {
+    int code = QUIB_ERR_NONE;
+    if (FindLogin(sid, loggedIn, &code) != LoginState::kLive) {
+        QUIB_SET_ERR(code);
+        return false;
+    }
+    if (!EqualsIgnoreCase(*loggedIn, user)) {
+        QUIB_SET_ERR(QUIB_ERR_ACCESS_DENIED);
+        return false;
+    }
+    return true;
 }
 
 }  // namespace norvo::platform

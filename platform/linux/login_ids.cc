@@ -19,13 +19,7 @@ int IdsOfLogin(const char *sid, const char *user, uid_t *uid, gid_t *gid) {
         return -1;
     }
     std::string loggedIn;
-    int code = QUIB_ERR_NONE;
-    if (FindLogin(sid, &loggedIn, &code) != LoginState::kLive) {
-        QUIB_SET_ERR(code);
-        return -1;
-    }
-    if (!EqualsIgnoreCase(loggedIn, user)) {
-        QUIB_SET_ERR(QUIB_ERR_ACCESS_DENIED);
+    if (!IsLoginOf(sid, user, &loggedIn)) {
         return -1;
     }
     return QUIBUserGetUGID(loggedIn.c_str(), uid, gid);

@@ -14,6 +14,12 @@ enum class LoginState {
 // kLive (0x0300 unknown, 0x0D00 malformed, others for failures).
 [[nodiscard]] LoginState FindLogin(const char *sid, std::string *user, int *code);
 
+// The check of the calls that act for user on the strength of sid: true when sid is a live
+// login of user, with the name it was made under in *loggedIn; else false with the slot set
+// (FindLogin's code, or 0x0300 when the login is someone else's). Names compare ignoring ASCII
+// case, the folding Windows and directory names share.
+[[nodiscard]] bool IsLoginOf(const char *sid, const char *user, std::string *loggedIn);
+
 // The session lifetime in seconds, from "login_timeout_minutes" in QUIB_INFO_CONF (decimal
 // digits only, 1 to 525600); 15 minutes when the key is absent or not such a number.
 [[nodiscard]] long LoginLifetimeSeconds();

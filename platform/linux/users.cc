@@ -4,8 +4,7 @@
 #include <string.h>
 #include <time.h>
 
-#include <memory>
-
+#include "account_records.h"
 #include "api_guard.h"
 #include "nss.h"
 #include "quib_user.h"
@@ -14,52 +13,26 @@
 namespace norvo::platform {
 namespace {
 
-struct UserRecordFree {
-    void operator()(PQUIBUSER user) const { QUIBUserFree(user); }
-};
-using UserRecord = std::unique_ptr<QUIBUSER, UserRecordFree>;
-
 constexpr long kSecondsPerDay = 86400;
 
-UserRecord MakeRecord(const NssUser &entry) {
-    UserRecord record(static_cast<PQUIBUSER>(calloc(1, sizeof(QUIBUSER))));
-    if (record) {
-        record->szName = DupCString(entry.name);
-        record->nUID = entry.uid;
-        record->nGID = entry.gid;
-        record->szGecos = DupCString(entry.gecos);
-        record->szHome = DupCString(entry.home);
-        record->szShell = DupCString(entry.shell);
-        record->authType = QUIBUserAuthTypeOf(entry.name.c_str());
-    }
-    if (!record || record->szName == nullptr || record->szGecos == nullptr ||
-        record->szHome == nullptr || record->szShell == nullptr) {
-        QUIB_SET_ERR(QUIB_ERR_NO_MEMORY);
-        return UserRecord();
-    }
-    return record;
-}
-
-// The one place a user lookup's outcome reaches the caller: 0 with *puser, or -1 with 0x1D00
-// (unknown) or the NSS failure code.
-int Deliver(NssStatus status, const NssUser &entry, int err, PQUIBUSER *puser) {
-    switch (status) {
-    case NssStatus::kFound: {
-        UserRecord record = MakeRecord(entry);
+// The one place a user lookup's outcome reaches the caller: runs find(&entry, &err) and
+// returns 0 with *puser, or -1 with 0x1D00 (unknown) or the NSS failure code.
+template <typename Find>
+int GetUser(Find find, PQUIBUSER *puser) {
+    return Guarded(-1, [&] {
+        NssUser entry;
+        int err = 0;
+        const NssStatus status = find(&entry, &err);
+        if (!Found(status, err, QUIB_ERR_NO_SUCH_USER)) {
+            return -1;
+        }
+        UserRecord record = MakeUserRecord(entry, QUIBUserAuthTypeOf(entry.name.c_str()));
         if (!record) {
             return -1;
         }
         *puser = record.release();
         return 0;
-    }
-    case NssStatus::kNotFound:
-        QUIB_SET_ERR(QUIB_ERR_NO_SUCH_USER);
-        return -1;
-    case NssStatus::kFailed:
-        break;
-    }
-    QUIB_SET_ERR(NssFailureCode(err));
-    return -1;
+    });
 }
 
 }  // namespace
@@ -88,12 +61,8 @@ int QUIBUserGet(const char *name, PQUIBUSER *puser) {
         QUIB_SET_ERR(QUIB_ERR_BAD_PARAMETER);
         return -1;
     }
-    return np::Guarded(-1, [&] {
-        np::NssUser entry;
-        int err = 0;
-        np::NssStatus status = np::FindUserByName(name, &entry, &err);
-        return np::Deliver(status, entry, err, puser);
-    });
+    return np::GetUser([name](np::NssUser *entry, int *err) { return np::FindUserByName(name, entry, err); },
+                       puser);
 }
 
 int QUIBUserGetByUID(uid_t uid, PQUIBUSER *puser, int blNoCache) {
@@ -102,12 +71,7 @@ int QUIBUserGetByUID(uid_t uid, PQUIBUSER *puser, int blNoCache) {
         QUIB_SET_ERR(QUIB_ERR_BAD_PARAMETER);
         return -1;
     }
-    return np::Guarded(-1, [&] {
-        np::NssUser entry;
-        int err = 0;
-        np::NssStatus status = np::FindUserById(uid, &entry, &err);
-        return np::Deliver(status, entry, err, puser);
-    });
+    return np::GetUser([uid](np::NssUser *entry, int *err) { return np::FindUserById(uid, entry, err); }, puser);
 }
 
 void QUIBUserFree(PQUIBUSER user) {
@@ -126,26 +90,14 @@ int QUIBUserGetUGID(const char *name, uid_t *uid, gid_t *gid) {
         QUIB_SET_ERR(QUIB_ERR_BAD_PARAMETER);
         return -1;
     }
-    return np::Guarded(-1, [&] {
-        np::NssUser entry;
-        int err = 0;
-        switch (np::FindUserByName(name, &entry, &err)) {
-        case np::NssStatus::kFound:
-            if (uid != nullptr) {
-                *uid = entry.uid;
-            }
-            if (gid != nullptr) {
-                *gid = entry.gid;
-            }
-            return 0;
-        case np::NssStatus::kNotFound:
-            QUIB_SET_ERR(QUIB_ERR_NO_SUCH_USER);
-            return -1;
-        case np::NssStatus::kFailed:
-            break;
+    return np::WithKnownUser(name, [&](const np::NssUser &entry) {
+        if (uid != nullptr) {
+            *uid = entry.uid;
         }
-        QUIB_SET_ERR(np::NssFailureCode(err));
-        return -1;
+        if (gid != nullptr) {
+            *gid = entry.gid;
+        }
+        return 0;
     });
 }
 
@@ -154,19 +106,8 @@ int QUIBUserIsExpired(const char *name) {
         QUIB_SET_ERR(QUIB_ERR_BAD_PARAMETER);
         return -1;
     }
-    return np::Guarded(-1, [&] {
-        np::NssUser entry;
+    return np::WithKnownUser(name, [](const np::NssUser &entry) {
         int err = 0;
-        switch (np::FindUserByName(name, &entry, &err)) {
-        case np::NssStatus::kFound:
-            break;
-        case np::NssStatus::kNotFound:
-            QUIB_SET_ERR(QUIB_ERR_NO_SUCH_USER);
-            return -1;
-        case np::NssStatus::kFailed:
-            QUIB_SET_ERR(np::NssFailureCode(err));
-            return -1;
-        }
         long expireDay = -1;
         switch (np::FindShadowExpiry(entry.name, &expireDay, &err)) {
         case np::NssStatus::kFound:

@@ -1,8 +1,9 @@
 // The login state of one CGI request.
 #include <string.h>
 
-#include <memory>
+#include <string>
 
+#include "account_records.h"
 #include "api_guard.h"
 #include "cgi_request.h"
 #include "login_session.h"
@@ -14,17 +15,13 @@ namespace {
 
 constexpr int kMaskAdministrators = 0x8;
 
-struct UserFree {
-    void operator()(PQUIBUSER user) const { QUIBUserFree(user); }
-};
-
 // Whether the account behind a live login may pass mask. 0 yes; else the platform code.
 int CheckAccount(const std::string &user, int mask) {
     PQUIBUSER raw = nullptr;
     if (QUIBUserGet(user.c_str(), &raw) != 0) {
         return VLIBCErrGet();  // deleted since the login, or NSS failed
     }
-    const std::unique_ptr<QUIBUSER, UserFree> record(raw);
+    const UserRecord record(raw);
     const int expired = QUIBUserIsExpired(user.c_str());
     if (expired != 0) {
         return expired > 0 ? QUIB_ERR_ACCESS_DENIED : VLIBCErrGet();
