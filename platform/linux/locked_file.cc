@@ -60,7 +60,7 @@ int ReadAll(int fd, std::string *text) {
     return 0;
 }
 
-int ReadLockedFile(const char *path, std::string *text) {
+int ReadWholeFile(const char *path, std::string *text) {
     // O_NONBLOCK so that a FIFO put in place of a settings file cannot hang the open.
     FileDescriptor fd(open(path, O_RDONLY | O_CLOEXEC | O_NONBLOCK));
     if (!fd.IsOpen()) {
@@ -72,9 +72,6 @@ int ReadLockedFile(const char *path, std::string *text) {
     }
     if (!S_ISREG(st.st_mode)) {
         return S_ISDIR(st.st_mode) ? EISDIR : EINVAL;
-    }
-    if (int err = LockFile(fd.Get(), LOCK_SH); err != 0) {
-        return err;
     }
     return ReadAll(fd.Get(), text);
 }

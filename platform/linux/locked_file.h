@@ -35,8 +35,10 @@ inline constexpr size_t kMaxSettingsFileSize = 64u << 20;
 // Reads the rest of fd. 0 and *text, or the errno (EFBIG past kMaxSettingsFileSize).
 [[nodiscard]] int ReadAll(int fd, std::string *text);
 
-// Reads the whole regular file under a shared flock. 0 and *text, or the errno: ENOENT when it
-// is missing, EISDIR or EINVAL when it is not a regular file.
-[[nodiscard]] int ReadLockedFile(const char *path, std::string *text);
+// Reads the whole regular file. No lock: writers replace the file by rename, so a reader always
+// sees one whole version, and readers can never starve a writer of its exclusive lock (flock
+// grants new shared locks while a writer waits). 0 and *text, or the errno: ENOENT when it is
+// missing, EISDIR or EINVAL when it is not a regular file.
+[[nodiscard]] int ReadWholeFile(const char *path, std::string *text);
 
 }  // namespace norvo::platform

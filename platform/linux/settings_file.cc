@@ -12,6 +12,7 @@
 
 #include <functional>
 #include <set>
+#include <chrono>
 #include <string>
 #include <vector>
 
@@ -26,8 +27,9 @@ namespace {
 
 using Lines = std::vector<SettingsLine>;
 
-// How often a writer reopens a file that another writer replaced while it waited for the lock.
-constexpr int kMaxLockAttempts = 100;
+// How long a writer keeps reopening a file that other writers replace while it waits for the
+// lock. Each reopen means another writer finished, so this only bounds starvation.
+constexpr auto kMaxLockWait = std::chrono::seconds(10);
 
 // The error slot for bad arguments: 0x0D00, or 0xC300 for a path longer than PATH_MAX.
 bool CheckFileArg(const char *file) {
@@ -60,15 +62,19 @@ bool IsReadableKey(const char *key) {
     return IsValidUtf8(view) && TrimSpace(view).size() == len;
 }
 
-// Reads and parses a settings file for the readers; false with 0x0900 when it can't be read.
-bool LoadForReading(const char *file, Lines *lines) {
-    std::string text;
-    if (ReadLockedFile(file, &text) != 0) {
-        QUIB_SET_ERR(QUIB_ERR_OPEN_FAILED);
-        return false;
-    }
-    *lines = ParseSettings(text);
-    return true;
+// What every reader does around its own work: reads and parses file under a shared lock and
+// returns read(lines), all under Guarded; -1 with 0x0900 when the file can't be read.
+template <typename Read>
+int ReadSettings(const char *file, Read read) {
+    return Guarded(-1, [&] {
+        std::string text;
+        if (ReadWholeFile(file, &text) != 0) {
+            QUIB_SET_ERR(QUIB_ERR_OPEN_FAILED);
+            return -1;
+        }
+        const Lines lines = ParseSettings(text);
+        return read(lines);
+    });
 }
 
 // The file a writer replaces: the target of a symbolic link, so the link survives.
@@ -109,7 +115,8 @@ struct LockedTarget {
 // Opens target and takes the exclusive lock, creating the file (0644) when create is set.
 // A writer that waited while another replaced the file reopens it, so no update is lost.
 int LockTarget(const std::string &target, bool create, LockedTarget *out) {
-    for (int attempt = 0; attempt < kMaxLockAttempts; ++attempt) {
+    const auto deadline = std::chrono::steady_clock::now() + kMaxLockWait;
+    while (std::chrono::steady_clock::now() < deadline) {
         FileDescriptor fd(open(target.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK));
         bool created = false;
         if (!fd.IsOpen()) {
@@ -309,11 +316,7 @@ int VLIBCFileGetKeyValue(const char *file, const char *key, char *buf, size_t si
         QUIB_SET_ERR(QUIB_ERR_BAD_PARAMETER);
         return -1;
     }
-    return Guarded(-1, [&] {
-        np::Lines lines;
-        if (!np::LoadForReading(file, &lines)) {
-            return -1;
-        }
+    return np::ReadSettings(file, [&](const np::Lines &lines) {
         const np::SettingsLine *entry = np::FindSettingsEntry(lines, key, flags == 1);
         if (entry == nullptr) {
             QUIB_SET_ERR(QUIB_ERR_OPEN_FAILED);
@@ -368,11 +371,7 @@ int VLIBCFileCheckKeyValue(const char *file, const char *key, const char *value,
         QUIB_SET_ERR(QUIB_ERR_BAD_PARAMETER);
         return -1;
     }
-    return Guarded(-1, [&] {
-        np::Lines lines;
-        if (!np::LoadForReading(file, &lines)) {
-            return -1;
-        }
+    return np::ReadSettings(file, [&](const np::Lines &lines) {
         const np::SettingsLine *entry = np::FindSettingsEntry(lines, key, flags == 1);
         if (entry == nullptr) {
             return 0;
@@ -390,11 +389,7 @@ int VLIBCFileGetKeys(const char *file, PSZLIST *keys, PSZLIST *values) {
         QUIB_SET_ERR(QUIB_ERR_BAD_PARAMETER);
         return -1;
     }
-    return Guarded(-1, [&] {
-        np::Lines lines;
-        if (!np::LoadForReading(file, &lines)) {
-            return -1;
-        }
+    return np::ReadSettings(file, [&](const np::Lines &lines) {
         int keysBefore = VLIBCSzListCount(*keys);
         int valuesBefore = values != nullptr ? VLIBCSzListCount(*values) : 0;
         std::set<std::string> seen;
