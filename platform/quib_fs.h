@@ -95,13 +95,23 @@ QUIB_API int QUIBFSMkdirP(const char *path, char *stopAt, int stopAtSize, int re
                           gid_t gid, mode_t mode);
 
 // The ACL_PERM_* mask the effective identity holds on path (a final link is not followed),
-// judged by the kernel (POSIX ACLs and modes count). 0 and *mask on success; -1 with 0x0600
-// (no such file), 0x0700 (a parent is not a directory), 0x0300 (a parent can't be searched),
-// 0xD800 (the file system does not support ACLs), 0x0D00 (bad argument), 0xC300 (path of
-// 4096 bytes or more), 0x8100 (other, EIO among them). A read-only file system is no error:
-// its mask lacks the writing bits.
+// judged as the kernel judges (POSIX ACLs and modes count). 0 and *mask on success; -1 with
+// 0x0600 (no such file), 0x0700 (a parent is not a directory), 0x0300 (a parent can't be
+// searched), 0xD800 (the file system does not support ACLs), 0x0D00 (bad argument), 0xC300
+// (path of 4096 bytes or more), 0x8100 (other, EIO among them). A read-only file system is no
+// error: its mask lacks the writing bits.
+// Cost: on tmpfs, ext2/3/4 and XFS one statx and one read of the ACL attribute of path, plus a
+// statx of its directory (whose write and search rights are evaluated once while it stays
+// unchanged); the caller's ids, groups and capabilities are read afresh on every call, so
+// seteuid and setgroups count at once. The facts of a mount (type, read-only, no-exec) are
+// read once per mount per process. Elsewhere the kernel is asked (faccessat) for each bit.
 QUIB_API int QUIBACLPermGet(const char *path, unsigned int *mask);
-// 1 when the file system holding path supports POSIX ACLs, 0 when not, -1 on failure.
-QUIB_API int QUIBACLIsSupport(const char *path);
+// Non-zero when access-control lists govern the file: 1 when its file system supports POSIX
+// ACLs, 0 when not (FUSE file systems count as not supporting them), -1 on failure (error slot
+// as for QUIBACLPermGet). fd -1: the file is path, a final link not followed (the directory
+// holding a link answers for it). fd >= 0: the file open on fd (any open mode, O_PATH too, but
+// not a link), and path is ignored and may be null. flags is reserved: no bit changes the
+// answer (the listing passes 2).
+QUIB_API int QUIBACLIsSupport(const char *path, int fd, int flags);
 
 QUIB_END_C
