@@ -35,8 +35,9 @@ enum {
     NVO_INFO_SYNC_SHARE = 0x100,  // share listing only
 };
 
-// Which entries a listing keeps (any other value keeps both).
-typedef enum _tag_dir_entry_type_ {
+// Which entries a listing keeps (any other value keeps both). The fixed underlying type makes
+// every int a valid value, so "any other value" is defined behaviour.
+typedef enum _tag_dir_entry_type_ : int {
     DIR_ENTRY_TYPE_DIR = 0,
     DIR_ENTRY_TYPE_FILE = 1,
     DIR_ENTRY_TYPE_ALL = 2,

@@ -1,0 +1,382 @@
+// Directory listings and file records over the sandbox's real file systems: what is never
+// listed, what the flags fill, order and pages, the errors with their log lines, a real
+// non-root reader, and a network mount whose server is gone.
+#include <dirent.h>
+#include <errno.h>
+#include <fcntl.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cstring>
+#include <filesystem>
+#include <string>
+#include <vector>
+
+#include <gtest/gtest.h>
+
+#include "appliance.h"
+#include "norvo/errors.h"
+#include "norvo/norvoenum.h"
+#include "norvo/norvomisc.h"
+#include "norvo/norvosearch.h"
+#include "quib_fs.h"
+
+namespace {
+
+using norvo::testing::Appliance;
+using norvo::testing::LogLine;
+
+const std::string kDir = "/volume1/public/dir";
+const std::string kUserDir = "/public/dir";
+
+struct Listed {
+    int rc = -1;
+    int err = -1;
+    unsigned long total = 99;
+    std::list<DIRENTRY_INFO> out;
+    std::string Names() const {
+        std::string names;
+        for (const DIRENTRY_INFO &e : out) {
+            names += (names.empty() ? "" : " ") + e.name;
+        }
+        return names;
+    }
+};
+
+Listed List(const char *userPath, const char *realPath, const char *key = "name", int info = 0, bool ascending = true,
+            unsigned long offset = 0, unsigned long limit = 0, std::vector<FileSearch::FindComp *> conditions = {}) {
+    Listed r;
+    NvoEnum enumeration;
+    r.rc = enumeration.NvoLibDirEntryListEnum(userPath, realPath, key, info, offset, limit, ascending,
+                                              DIR_ENTRY_TYPE_ALL, conditions, r.out, &r.total);
+    r.err = NvoLibGetErr();
+    return r;
+}
+
+Listed ListIn(const std::string &relative, const char *key = "name", int info = 0, bool ascending = true,
+            unsigned long offset = 0, unsigned long limit = 0) {
+    return List((kUserDir + relative).c_str(), (kDir + relative).c_str(), key, info, ascending, offset, limit);
+}
+
+LogLine Err(const std::string &text) {
+    return {LOG_ERR, text};
+}
+
+class Listing : public ::testing::Test {
+protected:
+    void SetUp() override {
+        app_.Basic()
+            .WriteFile(kDir + "/a.txt", "hello", "alice", 0640)
+            .WriteFile(kDir + "/B.TXT", "hi")
+            .WriteFile(kDir + "/b.txt", "ho")
+            .MakeDir(kDir + "/sub");
+    }
+    // Names in the directory reader's own order, hidden ones left out.
+    std::vector<std::string> ReaderOrder() {
+        std::vector<std::string> names;
+        DIR *dir = opendir(kDir.c_str());
+        while (const dirent *e = readdir(dir)) {
+            if (QUIBEAIsHiddenFile(e->d_name) == 0) {
+                names.push_back(e->d_name);
+            }
+        }
+        closedir(dir);
+        return names;
+    }
+    Appliance app_;
+};
+
+TEST_F(Listing, HiddenNamesLinksSocketsAndPipesAreNeverListed) {
+    app_.MakeDir(kDir + "/@eaDir").WriteFile(kDir + "/.DS_Store").MakeDir(kDir + "/@tmp");
+    ASSERT_EQ(symlink("a.txt", (kDir + "/link").c_str()), 0);
+    ASSERT_EQ(symlink("sub", (kDir + "/dirlink").c_str()), 0);
+    ASSERT_EQ(mkfifo((kDir + "/pipe").c_str(), 0644), 0);
+    const int sock = socket(AF_UNIX, SOCK_STREAM, 0);
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    snprintf(address.sun_path, sizeof address.sun_path, "%s/sock", kDir.c_str());
+    ASSERT_EQ(bind(sock, reinterpret_cast<sockaddr *>(&address), sizeof address), 0);
+    close(sock);
+    for (int info : {0, 0x7F}) {  // the reader's type byte alone, then the stat as well
+        const Listed r = ListIn("", "name", info);
+        EXPECT_EQ(r.rc, 1);
+        EXPECT_EQ(r.out.size(), 4u) << info;
+        EXPECT_EQ(r.Names().substr(0, 10), "sub a.txt ") << info;
+    }
+
+    const struct {
+        const char *name;
+        unsigned char dtype;
+        int info;
+        _tag_dir_entry_type_ type;
+        int want;
+    } table[] = {
+        {"link", DT_UNKNOWN, 0, DIR_ENTRY_TYPE_ALL, 1},   {"link", DT_LNK, 0, DIR_ENTRY_TYPE_ALL, 1},
+        {"dirlink", DT_UNKNOWN, 0, DIR_ENTRY_TYPE_DIR, 1}, {"sock", DT_UNKNOWN, 0, DIR_ENTRY_TYPE_ALL, 1},
+        {"sock", DT_SOCK, 0x7F, DIR_ENTRY_TYPE_ALL, 1},   {"pipe", DT_UNKNOWN, 0x7F, DIR_ENTRY_TYPE_ALL, 1},
+        {"pipe", DT_FIFO, 0, DIR_ENTRY_TYPE_ALL, 1},      {"a.txt", DT_UNKNOWN, 0, DIR_ENTRY_TYPE_ALL, 0},
+        {"a.txt", DT_REG, 0, DIR_ENTRY_TYPE_FILE, 0},     {"a.txt", DT_REG, 0, DIR_ENTRY_TYPE_DIR, 1},
+        {"a.txt", DT_UNKNOWN, 0, DIR_ENTRY_TYPE_DIR, 1},  {"sub", DT_DIR, 0, DIR_ENTRY_TYPE_FILE, 1},
+        {"sub", DT_UNKNOWN, 0, DIR_ENTRY_TYPE_FILE, 1},   {"sub", DT_UNKNOWN, 0, DIR_ENTRY_TYPE_DIR, 0},
+        {"sub", DT_DIR, 0, static_cast<_tag_dir_entry_type_>(7), 0},
+        // Vanished between the read and the stat: skipped silently. Without a stat it can't show.
+        {"gone", DT_REG, NVO_INFO_SIZE, DIR_ENTRY_TYPE_ALL, 1}, {"gone", DT_UNKNOWN, 0, DIR_ENTRY_TYPE_ALL, 1},
+        {"gone", DT_REG, NVO_INFO_REAL_PATH, DIR_ENTRY_TYPE_ALL, 0},
+    };
+    NvoEnum enumeration;
+    NvoLibSetErr(NVO_ERR_NONE);
+    for (const auto &row : table) {
+        DIRENTRY_INFO entry;
+        const int got = enumeration.FillFileInfo((kUserDir + "/" + row.name).c_str(),
+                                                 (kDir + "/" + row.name).c_str(), row.name, row.type, row.dtype,
+                                                 row.info, entry);
+        EXPECT_EQ(got, row.want) << row.name << " " << int(row.dtype) << " " << row.type;
+    }
+    EXPECT_EQ(NvoLibGetErr(), NVO_ERR_NONE);
+    EXPECT_TRUE(app_.ErrorLines().empty());
+}
+
+TEST_F(Listing, FillsWhatTheFlagsAsk) {
+    app_.WriteFile(kDir + "/Mixed.TxT", "12345", "alice:staff", 0754);
+    const std::string real = kDir + "/Mixed.TxT";
+    NvoEnum enumeration;
+    DIRENTRY_INFO e;
+    ASSERT_EQ(enumeration.FillFileInfo("/public/dir/Mixed.TxT", real.c_str(), "Mixed.TxT", DIR_ENTRY_TYPE_ALL,
+                                       DT_REG, 0x7F, e), 0);
+    struct stat st {};
+    ASSERT_EQ(lstat(real.c_str(), &st), 0);
+    EXPECT_EQ(e.name, "Mixed.TxT");
+    EXPECT_EQ(e.path, "/public/dir/Mixed.TxT");
+    EXPECT_EQ(e.real_path, real);
+    EXPECT_EQ(e.type, "txt");
+    EXPECT_EQ(e.size, 5u);
+    EXPECT_EQ(e.mode, 0100754u);
+    EXPECT_EQ(e.acl_privilege, GetACLPrivilege(real.c_str()));
+    EXPECT_EQ(e.is_acl_mode, QUIBACLIsSupport(real.c_str(), -1, 2) != 0);
+    EXPECT_EQ(e.mtime, st.st_mtime);
+    EXPECT_EQ(e.atime, st.st_atime);
+    EXPECT_EQ(e.ctime, st.st_ctime);
+    EXPECT_EQ(e.uid, app_.Uid("alice"));
+    EXPECT_EQ(e.user, "alice");
+    EXPECT_EQ(e.gid, app_.Gid("staff"));
+    EXPECT_EQ(e.group, "staff");
+    EXPECT_FALSE(e.isdir);
+    EXPECT_EQ(e.mount_point_type, "");
+
+    DIRENTRY_INFO bare;  // only what the reader told: no stat, no real path
+    ASSERT_EQ(enumeration.FillFileInfo("/public/dir/sub", (kDir + "/sub").c_str(), "sub", DIR_ENTRY_TYPE_ALL, DT_DIR,
+                                       0, bare), 0);
+    EXPECT_TRUE(bare.isdir);
+    EXPECT_EQ(bare.real_path, "");
+    EXPECT_EQ(bare.user, "");
+    EXPECT_EQ(bare.share_privilege, 4);
+    DIRENTRY_INFO folder;
+    ASSERT_EQ(enumeration.FillFileInfo("/public/dir/sub", (kDir + "/sub").c_str(), "sub", DIR_ENTRY_TYPE_ALL,
+                                       DT_UNKNOWN, NVO_INFO_TYPE | NVO_INFO_MOUNT_POINT_TYPE, folder), 0);
+    EXPECT_TRUE(folder.isdir);
+    EXPECT_EQ(folder.type, "");
+    EXPECT_EQ(folder.mount_point_type, "");
+    EXPECT_TRUE(app_.ErrorLines().empty());
+}
+
+TEST_F(Listing, SortsReversesAndPages) {
+    std::vector<std::string> reader = ReaderOrder();
+    const auto before = [&reader](const char *x, const char *y) {
+        return std::find(reader.begin(), reader.end(), x) < std::find(reader.begin(), reader.end(), y);
+    };
+    // "B.TXT" and "b.txt" tie on size and name: the reader's order stays.
+    const std::string ties = before("B.TXT", "b.txt") ? "B.TXT b.txt" : "b.txt B.TXT";
+    const std::string tiesReversed = before("B.TXT", "b.txt") ? "b.txt B.TXT" : "B.TXT b.txt";
+
+    const Listed bySize = ListIn("", "size", 0);  // the key fills the size unasked
+    EXPECT_EQ(bySize.Names(), "sub " + ties + " a.txt");
+    EXPECT_EQ(bySize.out.back().size, 5u);
+    EXPECT_EQ(ListIn("", "name", 0, false).Names(), tiesReversed + " a.txt sub");  // folders last
+
+    std::string reversed;
+    for (auto it = reader.rbegin(); it != reader.rend(); ++it) {
+        reversed += (reversed.empty() ? "" : " ") + *it;
+    }
+    EXPECT_EQ(ListIn("", nullptr, 0, false).Names(), reversed);
+
+    const struct {
+        unsigned long offset;
+        unsigned long limit;
+        const char *page;
+    } pages[] = {{5, 0, "sub a.txt B.TXT b.txt"}, {1, 1, "a.txt"}, {3, 5, "b.txt"}, {4, 1, ""}};
+    for (const auto &row : pages) {
+        const Listed r = ListIn("", "type", 0, true, row.offset, row.limit);
+        EXPECT_EQ(r.rc, 1);
+        EXPECT_EQ(r.total, 4u);
+        if (ties == "B.TXT b.txt") {
+            EXPECT_EQ(r.Names(), row.page) << row.offset << "+" << row.limit;
+        }
+    }
+    const Listed empty = ListIn("/sub");
+    EXPECT_EQ(empty.rc, 1);
+    EXPECT_EQ(empty.total, 0u);
+    EXPECT_TRUE(empty.out.empty());
+    EXPECT_TRUE(app_.ErrorLines().empty());
+}
+
+TEST_F(Listing, BadArgumentsAndPathsGetTheirErrors) {
+    const std::string longPath = "/volume1/" + std::string(4087, 'a');
+    const std::string file = kDir + "/a.txt";
+    const struct {
+        const char *userPath;
+        const char *realPath;
+        bool noTotal;
+        int err;
+        std::vector<LogLine> logs;
+    } table[] = {
+        {nullptr, kDir.c_str(), false, NVO_ERR_GENERAL, {}},
+        {"", kDir.c_str(), false, NVO_ERR_GENERAL, {}},
+        {"/public/dir", nullptr, false, NVO_ERR_GENERAL, {}},
+        {"/public/dir", "", false, NVO_ERR_GENERAL, {}},
+        {"/public/dir", kDir.c_str(), true, NVO_ERR_GENERAL, {}},
+        {"/", "/volume1", false, NVO_ERR_PRIVILEGE, {}},
+        {"/public/none", "/volume1/public/none", false, NVO_ERR_NO_PATH, {}},
+        {"/public/\xff\xfe", "/volume1/public/\xff\xfe", false, NVO_ERR_NO_PATH, {}},
+        {"/public/dir/a.txt", file.c_str(), false, NVO_ERR_ACCESS,
+         {Err("norvoenum.cpp:152 Failed to access " + file + ", errno=Not a directory")}},
+        {"/public/x", longPath.c_str(), false, NVO_ERR_ACCESS,
+         {Err("norvoenum.cpp:152 Failed to access " + longPath + ", errno=File name too long")}},
+    };
+    for (const auto &row : table) {
+        app_.ClearLogs();
+        NvoLibSetErr(NVO_ERR_IO);
+        NvoEnum enumeration;
+        std::list<DIRENTRY_INFO> out;
+        unsigned long total = 99;
+        EXPECT_EQ(enumeration.NvoLibDirEntryListEnum(row.userPath, row.realPath, "name", 0x7F, 0, 0, true,
+                                                     DIR_ENTRY_TYPE_ALL, {}, out, row.noTotal ? nullptr : &total),
+                  0);
+        EXPECT_EQ(NvoLibGetErr(), row.err) << (row.realPath ? row.realPath : "null");
+        // The argument checks come before the total is reset.
+        const bool argumentStage = row.err == NVO_ERR_GENERAL || (row.userPath && std::string(row.userPath) == "/");
+        EXPECT_EQ(total, argumentStage ? 99u : 0u);
+        EXPECT_TRUE(out.empty());
+        EXPECT_EQ(app_.Logs(), row.logs);
+    }
+
+    // A stat that fails otherwise: 401 and the line 306.
+    app_.ClearLogs();
+    const std::string notDir = file + "/x";
+    NvoEnum enumeration;
+    DIRENTRY_INFO e;
+    EXPECT_EQ(enumeration.FillFileInfo("/public/dir/a.txt/x", notDir.c_str(), "x", DIR_ENTRY_TYPE_ALL, DT_REG,
+                                       NVO_INFO_SIZE, e), -1);
+    EXPECT_EQ(NvoLibGetErr(), NVO_ERR_SYSTEM);
+    EXPECT_EQ(enumeration.FillFileInfo(nullptr, "/", "x", DIR_ENTRY_TYPE_ALL, DT_REG, 0, e), -1);
+    EXPECT_EQ(NvoLibGetErr(), NVO_ERR_GENERAL);
+    EXPECT_EQ(enumeration.FillFileInfo("/p", nullptr, "x", DIR_ENTRY_TYPE_ALL, DT_REG, 0, e), -1);
+    EXPECT_EQ(enumeration.FillFileInfo("/p", "/", nullptr, DIR_ENTRY_TYPE_ALL, DT_REG, 0, e), -1);
+    EXPECT_EQ(app_.Logs(), std::vector<LogLine>{Err("norvoenum.cpp:306 Failed to stat " + notDir + ". Not a directory")});
+}
+
+TEST_F(Listing, AFailurePartWayKeepsTheRecordsSoFarAndClosesTheDirectory) {
+    // A folder whose path leaves no room for a long name: that entry's stat fails.
+    std::string deep = "/volume1/public";
+    for (int i = 0; i < 19; ++i) {
+        deep += "/" + std::string(200, 'd');
+    }
+    deep += "/" + std::string(100, 'e');
+    app_.MakeDir(deep).WriteFile(deep + "/ok");
+    const std::string longName(255, 'n');
+    ASSERT_EQ(chdir(deep.c_str()), 0);
+    close(open(longName.c_str(), O_CREAT | O_WRONLY, 0644));
+    const auto openFds = [] { return std::distance(std::filesystem::directory_iterator("/proc/self/fd"), {}); };
+    const auto list = [&deep] { return List(("/public" + deep.substr(15)).c_str(), deep.c_str(), "name", NVO_INFO_SIZE); };
+    list();  // the first log line opens the log socket
+    app_.ClearLogs();
+    const auto fds = openFds();
+    const Listed r = list();
+    EXPECT_EQ(r.rc, 0);
+    EXPECT_EQ(r.err, NVO_ERR_SYSTEM);
+    EXPECT_EQ(r.total, 0u);
+    EXPECT_LE(r.out.size(), 1u);
+    EXPECT_EQ(openFds(), fds);
+    EXPECT_EQ(app_.Logs(), std::vector<LogLine>{Err("norvoenum.cpp:306 Failed to stat " + deep + "/" + longName +
+                                                    ". File name too long")});
+}
+
+// Outcomes travel from the child as small numbers: the library error less 400 on failure,
+// 50 for an empty success, 51 for a success with records.
+int Outcome(const Listed &r) {
+    return r.rc == 1 ? (r.out.empty() ? 50 : 51) + (r.err != 0 ? 10 : 0) : r.err - 400;
+}
+
+TEST_F(Listing, AccessTestAsARealUser) {
+    app_.MakeDir(kDir + "/closed", "root", 0700).WriteFile(kDir + "/closed/x")
+        .MakeDir(kDir + "/blind", "root", 0311).WriteFile(kDir + "/blind/x");
+    const struct {
+        const char *relative;
+        int outcome;
+    } table[] = {{"/closed", 7}, {"/blind", 50}, {"/none", 8}, {"", 51}};
+    for (const auto &row : table) {
+        EXPECT_EQ(app_.RunAs("bob", [&row] { return Outcome(ListIn(row.relative)); }), row.outcome) << row.relative;
+    }
+    const std::string hidden = kDir + "/closed/x";
+    EXPECT_EQ(app_.RunAs("bob", [&hidden] {
+                  NvoEnum enumeration;
+                  DIRENTRY_INFO e;
+                  const int got = enumeration.FillFileInfo("/public/dir/closed/x", hidden.c_str(), "x",
+                                                           DIR_ENTRY_TYPE_ALL, DT_UNKNOWN, 0, e);
+                  return got == -1 ? NvoLibGetErr() - 400 : 99;
+              }),
+              7);
+    EXPECT_EQ(app_.Logs(),
+              std::vector<LogLine>{Err("norvoenum.cpp:306 Failed to stat " + hidden + ". Permission denied")});
+}
+
+TEST_F(Listing, ADeadRemoteMountIsListedButCannotBeEntered) {
+    app_.MountDeadRemote(kDir + "/remote");
+    const Listed r = ListIn("", "name", NVO_INFO_MOUNT_POINT_TYPE | NVO_INFO_SIZE);
+    ASSERT_EQ(r.rc, 1);
+    EXPECT_EQ(r.Names().substr(0, 11), "remote sub ");
+    EXPECT_TRUE(r.out.front().isdir);
+    EXPECT_EQ(r.out.front().mount_point_type, "remotefail");
+    EXPECT_EQ(std::next(r.out.begin())->mount_point_type, "");
+    EXPECT_EQ(ListIn("/remote").err, NVO_ERR_REMOTE_FS);
+    EXPECT_EQ(ListIn("/remote/deeper").err, NVO_ERR_REMOTE_FS);
+
+    NvoEnum enumeration;
+    DIRENTRY_INFO e;
+    const std::string inside = kDir + "/remote/x";
+    EXPECT_EQ(enumeration.FillFileInfo("/public/dir/remote/x", inside.c_str(), "x", DIR_ENTRY_TYPE_FILE, DT_REG,
+                                       NVO_INFO_SIZE, e), 1);
+    EXPECT_TRUE(e.isdir);
+    EXPECT_EQ(e.mount_point_type, "remotefail");
+    EXPECT_TRUE(app_.ErrorLines().empty());
+}
+
+// Conditions decide on the bare name; the stat record they are given is not filled.
+class NameSpy : public FileSearch::FindComp {
+public:
+    bool operator()(const char *path, const _tag_QUIBSTAT_ &st) override {
+        const _tag_QUIBSTAT_ zero{};
+        unfilled = unfilled && memcmp(&st, &zero, sizeof st) == 0;
+        names += std::string(path) + " ";
+        return std::string(path) != "a.txt";
+    }
+    std::string names;
+    bool unfilled = true;
+};
+
+TEST_F(Listing, ConditionsSeeTheBareNameOnly) {
+    NameSpy spy;
+    FileSearch::FindNameComp notA("*b*");  // "sub", "B.TXT", "b.txt"
+    const Listed r = List(kUserDir.c_str(), kDir.c_str(), "size", 0x7F, true, 0, 0, {&spy, nullptr, &notA});
+    EXPECT_EQ(r.rc, 1);
+    EXPECT_EQ(r.Names().substr(0, 4), "sub ");
+    EXPECT_EQ(r.out.size(), 3u);
+    EXPECT_TRUE(spy.unfilled);
+    EXPECT_EQ(spy.names.find('/'), std::string::npos);
+    EXPECT_NE(spy.names.find("sub "), std::string::npos);
+}
+
+}  // namespace

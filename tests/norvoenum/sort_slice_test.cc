@@ -1,0 +1,174 @@
+// The order of listings and the page cut: the case-insensitive comparison against ICU's whole
+// string comparison, every sort key with ties, and slices at the edges.
+#include <random>
+#include <string>
+#include <vector>
+
+#include <gtest/gtest.h>
+#include <unicode/uchar.h>
+#include <unicode/unistr.h>
+#include <unicode/ustring.h>
+
+#include "norvo/norvoenum.h"
+#include "norvoenum/info_flags.h"
+#include "vlibc_unicode.h"
+
+namespace {
+
+int Sign(int v) {
+    return (v > 0) - (v < 0);
+}
+
+TEST(CaseCompare, FoldsCaseInCodePointOrder) {
+    const struct {
+        const char *a;
+        const char *b;
+        int sign;
+    } table[] = {
+        {"abc", "ABC", 0},       {"a", "B", -1},           {"_", "a", -1},  // '_' sorts before letters
+        {"", "a", -1},           {"ab", "a", 1},           {"Stra\xc3\x9f" "e", "STRASSE", 0},
+        {"\xc3\xa9", "\xc3\x89", 0},  {"\xc3\xa4", "b", 1},  {"k", "\xe2\x84\xaa", 0},  // Kelvin sign
+        {"x\xff", "X\xff", 0},   {"\xff", "\xfe", 1},      {"a\xff", "a\xef\xbf\xbd", -1},  // not U+FFFD
+        {nullptr, "", -1},       {nullptr, nullptr, 0},    {"", nullptr, 1},
+    };
+    for (const auto &row : table) {
+        EXPECT_EQ(Sign(VLIBCUnicodeUTF8StrCaseCmp(row.a, row.b)), row.sign)
+            << (row.a ? row.a : "null") << " / " << (row.b ? row.b : "null");
+    }
+    const std::string longName = std::string(3000, 'a') + "\xc3\xa9";
+    EXPECT_EQ(VLIBCUnicodeUTF8StrCaseCmp(longName.c_str(), (std::string(3000, 'A') + "\xc3\x89").c_str()), 0);
+}
+
+// Generated names against ICU comparing the whole strings (valid UTF-8), and the order's
+// consistency where bytes are not UTF-8.
+TEST(CaseCompare, AgreesWithIcuAndStaysATotalOrder) {
+    const std::vector<std::string> valid = {"a", "A", "z", "_", "1", "\xc3\xa9", "\xc3\x89", "\xc3\x9f", "ss",
+                                            "\xe2\x84\xaa", "k", "\xf0\x9f\x98\x80", "\xef\xbf\xbd"};
+    const std::vector<std::string> invalid = {"\xff", "\xfe", "\xc3", "\xe2\x84"};
+    std::mt19937 random(7);
+    const auto make = [&random](const std::vector<std::string> &pieces, size_t bad,
+                                const std::vector<std::string> &extra) {
+        std::string out;
+        const size_t n = random() % 5;
+        for (size_t i = 0; i < n; ++i) {
+            out += random() % 8 < bad ? extra[random() % extra.size()] : pieces[random() % pieces.size()];
+        }
+        return out;
+    };
+    for (int round = 0; round < 3000; ++round) {
+        const std::string a = make(valid, 0, invalid);
+        const std::string b = make(valid, 0, invalid);
+        const int want = icu::UnicodeString::fromUTF8(a).caseCompare(
+            icu::UnicodeString::fromUTF8(b), U_FOLD_CASE_DEFAULT | U_COMPARE_CODE_POINT_ORDER);
+        ASSERT_EQ(Sign(VLIBCUnicodeUTF8StrCaseCmp(a.c_str(), b.c_str())), Sign(want)) << a << " / " << b;
+    }
+    for (int round = 0; round < 3000; ++round) {
+        const std::string s[3] = {make(valid, 3, invalid), make(valid, 3, invalid), make(valid, 3, invalid)};
+        const auto cmp = [&s](int i, int j) { return Sign(VLIBCUnicodeUTF8StrCaseCmp(s[i].c_str(), s[j].c_str())); };
+        ASSERT_EQ(cmp(0, 1), -cmp(1, 0)) << s[0] << " / " << s[1];
+        if (cmp(0, 1) <= 0 && cmp(1, 2) <= 0) {
+            ASSERT_LE(cmp(0, 2), 0) << s[0] << " / " << s[1] << " / " << s[2];
+        }
+    }
+}
+
+DIRENTRY_INFO Entry(const char *name, bool dir, uint64_t size, int32_t time, uint32_t id, uint32_t mode,
+                    const char *type) {
+    DIRENTRY_INFO e;
+    e.name = name;
+    e.isdir = dir;
+    e.size = size;
+    e.mtime = e.crtime = e.ctime = e.atime = time;
+    e.uid = e.gid = id;
+    e.mode = mode;
+    e.type = type;
+    return e;
+}
+
+std::string Names(const std::list<DIRENTRY_INFO> &list) {
+    std::string out;
+    for (const DIRENTRY_INFO &e : list) {
+        out += (out.empty() ? "" : " ") + e.name;
+    }
+    return out;
+}
+
+// Reader order; "B" and "b" tie on every key, so they keep this order.
+std::list<DIRENTRY_INFO> Sample() {
+    return {
+        Entry("b", false, 5, 300, 1026, 0100644, "txt"),   Entry("Zed", true, 9, 100, 100, 040755, ""),
+        Entry("c.TXT", false, 1, -5, 100, 0100600, "TXT"), Entry("B", false, 5, 300, 1026, 0100644, "txt"),
+        Entry("dir", true, 1, 200, 1026, 040700, ""),      Entry("a.bin", false, 7, 300, 1, 0100777, "bin"),
+    };
+}
+
+TEST(EntrySort, EveryKeyWithTiesDirectoriesFirst) {
+    const struct {
+        const char *key;
+        const char *order;
+    } table[] = {
+        {"size", "dir Zed c.TXT b B a.bin"},   // folders by name, never by size
+        {"mtime", "Zed dir c.TXT a.bin b B"},  // signed: -5 first
+        {"crtime", "Zed dir c.TXT a.bin b B"}, {"ctime", "Zed dir c.TXT a.bin b B"},
+        {"atime", "Zed dir c.TXT a.bin b B"},  {"user", "Zed dir a.bin c.TXT b B"},  // by uid
+        {"group", "Zed dir a.bin c.TXT b B"},  {"posix", "dir Zed c.TXT b B a.bin"},
+        {"type", "dir Zed a.bin b B c.TXT"},   // "TXT" ties "txt": then the name
+        {"name", "dir Zed a.bin b B c.TXT"},   {"", "dir Zed a.bin b B c.TXT"},
+        {"SIZE", "dir Zed a.bin b B c.TXT"},   // keys are exact
+    };
+    NvoEnum enumeration;
+    for (const auto &row : table) {
+        std::list<DIRENTRY_INFO> list = Sample();
+        enumeration.EntryListSort(list, row.key);
+        EXPECT_EQ(Names(list), row.order) << row.key;
+    }
+    std::list<DIRENTRY_INFO> empty;
+    enumeration.EntryListSort(empty, "size");
+    EXPECT_TRUE(empty.empty());
+    EXPECT_FALSE(EnumCompare("name")(Sample().front(), Sample().front()));  // strict
+}
+
+TEST(EntrySlice, PagesAtTheEdges) {
+    const struct {
+        unsigned long offset;
+        unsigned long limit;
+        const char *kept;
+    } table[] = {
+        {2, 3, "3 4 5"},          {8, 3, "9 10"},      {10, 3, ""},           {0, 20, "1 2 3 4 5 6 7 8 9 10"},
+        {0, 0, "1 2 3 4 5 6 7 8 9 10"},                {7, 0, "1 2 3 4 5 6 7 8 9 10"},
+        {0xFFFFFFFFul, 3, ""},    // -1: the cursor walks back onto the end
+        {0xFFFFFFFEul, 3, "10"},  {0xFFFFFFFDul, 5, "9 10"},
+        {0x100000002ul, 3, "3 4 5"},  // only the low 32 bits count
+        {9, 1, "10"},
+    };
+    NvoEnum enumeration;
+    for (const auto &row : table) {
+        std::list<DIRENTRY_INFO> list;
+        for (int i = 1; i <= 10; ++i) {
+            list.emplace_back().name = std::to_string(i);
+        }
+        enumeration.NvoLibDirEntrySlice(list, row.offset, row.limit);
+        EXPECT_EQ(Names(list), row.kept) << row.offset << "+" << row.limit;
+    }
+    std::list<DIRENTRY_INFO> empty;
+    enumeration.NvoLibDirEntrySlice(empty, 0xFFFFFFFFul, 1);
+    EXPECT_TRUE(empty.empty());
+}
+
+TEST(InfoFlags, TheSortKeyWidensWhatIsFilled) {
+    const struct {
+        const char *key;
+        int added;
+    } table[] = {
+        {"size", NVO_INFO_SIZE},   {"mtime", NVO_INFO_TIME}, {"crtime", NVO_INFO_TIME}, {"ctime", NVO_INFO_TIME},
+        {"atime", NVO_INFO_TIME},  {"user", NVO_INFO_OWNER}, {"group", NVO_INFO_OWNER}, {"posix", NVO_INFO_PERM},
+        {"type", NVO_INFO_TYPE},   {"name", 0},              {"", 0},                   {nullptr, 0},
+        {"Size", 0},
+    };
+    for (const auto &row : table) {
+        EXPECT_EQ(norvo::WidenInfoBySortKey(row.key, NVO_INFO_REAL_PATH), NVO_INFO_REAL_PATH | row.added)
+            << (row.key ? row.key : "null");
+    }
+}
+
+}  // namespace
