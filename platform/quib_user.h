@@ -99,9 +99,13 @@ QUIB_API int QUIBGroupIsAdminGroupMemEx(const char *user, int blWithDomain);
 // the homes root (whole components), 0 when not (0x0D00 for a null user). The kind is the
 // record's authType, or told by szName when authType is not one of the three.
 QUIB_API int QUIBServiceUserHomeIsEnabled(const PQUIBUSER user);
-// The homes root ("/volume1/homes") into buf. 0 on success; -1 with 0x0900 when the service is
-// off for every kind of account or the root is unset, 0x0D00 when buf is null or too small.
-QUIB_API int QUIBServiceHomePathGet(char *buf, int size);
+// The home folder of user into buf (size bytes), normalised: "/volume1/homes/alice". 0 when
+// user has one: the home service is on for the account's kind and its home lies below the
+// homes root (QUIBServiceUserHomeIsEnabled). The folder itself is not created nor required to
+// exist. -1 otherwise, with 0xBE00 when the service is off for the account or its home lies
+// elsewhere, 0x0900 when the settings can't be read, QUIBUserGet's codes (0x1D00 unknown user),
+// 0xC300 when buf is too small, 0x0D00 for a null user or buf or a size below 1.
+QUIB_API int QUIBServiceHomePathGet(const char *user, char *buf, int size);
 
 // 1 when user holds the application privilege priv (see platform/README.md), 0 when not: also
 // for unknown users, a missing file, and on failure (the error slot then says why).

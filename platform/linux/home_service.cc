@@ -6,6 +6,7 @@
 #include <errno.h>
 #include <string.h>
 
+#include <memory>
 #include <string>
 #include <vector>
 
@@ -36,7 +37,7 @@ bool IsOn(const std::vector<SettingsLine> &lines, const char *key) {
 // file exists but can't be read.
 bool LoadHomeSettings(HomeSettings *settings) {
     std::string text;
-    if (int err = ReadLockedFile(QUIB_INFO_CONF, &text); err != 0) {
+    if (int err = ReadWholeFile(QUIB_INFO_CONF, &text); err != 0) {
         if (err == ENOENT) {
             return true;
         }
@@ -56,6 +57,10 @@ bool LoadHomeSettings(HomeSettings *settings) {
     return true;
 }
 
+struct UserFree {
+    void operator()(PQUIBUSER user) const { QUIBUserFree(user); }
+};
+
 bool EnabledFor(const HomeSettings &settings, AUTH_TYPE kind) {
     switch (kind) {
     case AUTH_DOMAIN:
@@ -65,6 +70,27 @@ bool EnabledFor(const HomeSettings &settings, AUTH_TYPE kind) {
     default:
         return settings.local;
     }
+}
+
+enum class Home { kYes, kNo, kFailed };
+
+// Whether user has a home folder, and its normalised path in *home. kFailed with 0x0900 when
+// the settings can't be read.
+Home HomeOf(const QUIBUSER &user, std::string *home) {
+    HomeSettings settings;
+    if (!LoadHomeSettings(&settings)) {
+        return Home::kFailed;
+    }
+    // A record built by hand may carry no kind; the name tells it then.
+    AUTH_TYPE kind = user.authType;
+    if (kind != AUTH_LOCAL && kind != AUTH_DOMAIN && kind != AUTH_LDAP) {
+        kind = QUIBUserAuthTypeOf(user.szName);
+    }
+    if (settings.root.empty() || !EnabledFor(settings, kind) || user.szHome == nullptr) {
+        return Home::kNo;
+    }
+    *home = NormalizePath(user.szHome);
+    return !home->empty() && *home != settings.root && PathIsWithin(settings.root, *home) ? Home::kYes : Home::kNo;
 }
 
 }  // namespace
@@ -80,42 +106,37 @@ int QUIBServiceUserHomeIsEnabled(const PQUIBUSER user) {
         return 0;
     }
     return np::Guarded(0, [&] {
-        np::HomeSettings settings;
-        if (!np::LoadHomeSettings(&settings) || settings.root.empty()) {
-            return 0;
-        }
-        // A record built by hand may carry no kind; the name tells it then.
-        AUTH_TYPE kind = user->authType;
-        if (kind != AUTH_LOCAL && kind != AUTH_DOMAIN && kind != AUTH_LDAP) {
-            kind = QUIBUserAuthTypeOf(user->szName);
-        }
-        if (!np::EnabledFor(settings, kind) || user->szHome == nullptr) {
-            return 0;
-        }
-        std::string home = np::NormalizePath(user->szHome);
-        return !home.empty() && home != settings.root && np::PathIsWithin(settings.root, home) ? 1 : 0;
+        std::string home;
+        return np::HomeOf(*user, &home) == np::Home::kYes ? 1 : 0;
     });
 }
 
-int QUIBServiceHomePathGet(char *buf, int size) {
-    if (buf == nullptr || size <= 0) {
+int QUIBServiceHomePathGet(const char *user, char *buf, int size) {
+    if (user == nullptr || buf == nullptr || size <= 0) {
         QUIB_SET_ERR(QUIB_ERR_BAD_PARAMETER);
         return -1;
     }
     return np::Guarded(-1, [&] {
-        np::HomeSettings settings;
-        if (!np::LoadHomeSettings(&settings)) {
+        PQUIBUSER raw = nullptr;
+        if (QUIBUserGet(user, &raw) != 0) {
+            return -1;  // the slot says why: 0x1D00 unknown, 0x0D00 a bad name, NSS codes
+        }
+        const std::unique_ptr<QUIBUSER, np::UserFree> record(raw);
+        std::string home;
+        switch (np::HomeOf(*record, &home)) {
+        case np::Home::kFailed:
+            return -1;
+        case np::Home::kNo:
+            QUIB_SET_ERR(QUIB_ERR_NO_PATH);
+            return -1;
+        case np::Home::kYes:
+            break;
+        }
+        if (home.size() + 1 > static_cast<size_t>(size)) {
+            QUIB_SET_ERR(QUIB_ERR_NAME_TOO_LONG);
             return -1;
         }
-        if (settings.root.empty() || !(settings.local || settings.domain || settings.directory)) {
-            QUIB_SET_ERR(QUIB_ERR_OPEN_FAILED);
-            return -1;
-        }
-        if (settings.root.size() + 1 > static_cast<size_t>(size)) {
-            QUIB_SET_ERR(QUIB_ERR_BAD_PARAMETER);
-            return -1;
-        }
-        memcpy(buf, settings.root.c_str(), settings.root.size() + 1);
+        memcpy(buf, home.c_str(), home.size() + 1);
         return 0;
     });
 }

@@ -140,6 +140,8 @@ bool ApplyKey(const std::string &key, std::string_view value, Section *section) 
             return false;
         }
         share.aclMode = on;
+    } else if (key == "synced") {
+        return ParseBool(value, &share.synced);
     }
     return true;
 }

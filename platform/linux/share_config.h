@@ -17,6 +17,7 @@ struct ShareEntry {
     unsigned restrict = 0;  // SHARE_RESTRICT_*
     int ftpPrivilege = 0;   // 0 none, 1 read-only, 2 read-write
     bool aclMode = true;
+    bool synced = false;    // "synced = yes": synchronised to another appliance
 };
 
 // The shares of text in file order. Sections that can't be trusted are skipped whole, so a

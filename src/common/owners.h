@@ -5,6 +5,7 @@
 
 #include <memory>
 
+#include "quib_sdk_share.h"
 #include "quib_share.h"
 #include "quib_user.h"
 #include "vlibc_szlist.h"
@@ -35,6 +36,9 @@ struct GroupDBClose {
 struct MallocFree {
     void operator()(void *p) const { free(p); }
 };
+struct SdkShareRelease {
+    void operator()(SDK::Share *s) const { SDK::Share::Release(s); }
+};
 struct DirClose {
     void operator()(DIR *d) const { closedir(d); }
 };
@@ -48,6 +52,7 @@ using UserDB = std::unique_ptr<QUIBUSER_DB, UserDBClose>;
 using GroupDB = std::unique_ptr<QUIBGROUP_DB, GroupDBClose>;
 using CString = std::unique_ptr<char, MallocFree>;
 using DirHandle = std::unique_ptr<DIR, DirClose>;
+using SdkShare = std::unique_ptr<SDK::Share, SdkShareRelease>;
 
 // The record slot a platform cursor refills in place: the cursor frees the record passed in
 // and leaves the last one to the caller, which this frees whatever way the walk ends.

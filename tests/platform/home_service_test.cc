@@ -13,11 +13,11 @@
 
 namespace {
 
-// The homes root, or "<none 0xcode>".
-std::string HomePath() {
+// user's home folder, or "<none 0xcode>".
+std::string HomePath(const char *user) {
     char buf[256];
     VLIBCErrSetEx(0, "", 0);
-    if (QUIBServiceHomePathGet(buf, sizeof buf) == 0) {
+    if (QUIBServiceHomePathGet(user, buf, sizeof buf) == 0) {
         return buf;
     }
     snprintf(buf, sizeof buf, "<none %#x>", VLIBCErrGet());
@@ -54,29 +54,46 @@ TEST_F(HomeService, EnabledForHomesBelowTheRoot) {
     }
     EXPECT_EQ(QUIBServiceUserHomeIsEnabled(nullptr), 0);
     EXPECT_EQ(VLIBCErrGet(), QUIB_ERR_BAD_PARAMETER);
-    char exact[sizeof "/volume1/homes"];
-    for (int size : {0, static_cast<int>(sizeof exact) - 1}) {
-        VLIBCErrSetEx(0, "", 0);
-        EXPECT_EQ(QUIBServiceHomePathGet(exact, size), -1) << size;
-        EXPECT_EQ(VLIBCErrGet(), QUIB_ERR_BAD_PARAMETER) << size;
+}
+
+// A user's home folder by name: the account's own home, normalised, when the service covers it.
+TEST_F(HomeService, HomePathOfAUser) {
+    app_.SetHomeService(true, "/volume1/homes", false, true);
+    app_.AddUser("alice").AddUser(norvo::testing::UserSpec{.name = "messy", .home = "/volume1//homes/./messy/"});
+    app_.AddUser(norvo::testing::UserSpec{.name = "outsider", .home = "/var/lib/outsider"}).AddUser("CORP\\carl").AddUser("erin@corp.example");
+    const struct { const char *user, *path; } rows[] = {
+        {"alice", "/volume1/homes/alice"},
+        {"messy", "/volume1/homes/messy"}, {"erin@corp.example", "/volume1/homes/erin@corp.example"},
+        {"outsider", "<none 0xbe00>"}, {"CORP\\carl", "<none 0xbe00>"},  // domain homes are off
+        {"nobody-here", "<none 0x1d00>"}, {"", "<none 0xd00>"},
+    };
+    for (const auto &row : rows) {
+        EXPECT_EQ(HomePath(row.user), row.path) << row.user;
     }
-    EXPECT_EQ(QUIBServiceHomePathGet(nullptr, 64), -1);
-    EXPECT_EQ(QUIBServiceHomePathGet(exact, sizeof exact), 0);
-    EXPECT_STREQ(exact, "/volume1/homes");
+    char exact[sizeof "/volume1/homes/alice"];
+    for (int size : {0, -1, static_cast<int>(sizeof exact) - 1}) {
+        VLIBCErrSetEx(0, "", 0);
+        EXPECT_EQ(QUIBServiceHomePathGet("alice", exact, size), -1) << size;
+        EXPECT_EQ(VLIBCErrGet(), size > 0 ? QUIB_ERR_NAME_TOO_LONG : QUIB_ERR_BAD_PARAMETER) << size;
+    }
+    EXPECT_EQ(QUIBServiceHomePathGet(nullptr, exact, sizeof exact), -1);
+    EXPECT_EQ(QUIBServiceHomePathGet("alice", nullptr, 64), -1);
+    EXPECT_EQ(QUIBServiceHomePathGet("alice", exact, sizeof exact), 0);
+    EXPECT_STREQ(exact, "/volume1/homes/alice");
 }
 
 // Each row writes the settings file (a null value leaves its line out) and expects the service
-// for the accounts alice, CORP\dave and erin@corp.example, and the homes root.
+// for the accounts alice, CORP\dave and erin@corp.example, and alice's home folder.
 TEST_F(HomeService, SwitchesAndRoot) {
     app_.AddUser("alice").AddUser("CORP\\dave").AddUser("erin@corp.example");
     const char *keys[] = {"userHomeEnable", "domainUserHomeEnable", "ldapUserHomeEnable", "userHomeRoot"};
-    const char *const off = "<none 0x900>";
+    const char *const off = "<none 0xbe00>";
     const struct { const char *values[4], *enabled, *root; } rows[] = {
-        {{"yes", "yes", "yes", "/volume1/homes/"}, "111", "/volume1/homes"},
-        {{"yes", "no", "yes", "/volume1/homes"}, "101", "/volume1/homes"},
-        {{"yes", "yes", "no", "/volume1/homes"}, "110", "/volume1/homes"},
-        {{"no", "yes", nullptr, "/volume1/homes"}, "010", "/volume1/homes"},  // on for some kind
-        {{"YES", "maybe", nullptr, "/volume1/homes"}, "100", "/volume1/homes"},
+        {{"yes", "yes", "yes", "/volume1/homes/"}, "111", "/volume1/homes/alice"},
+        {{"yes", "no", "yes", "/volume1/homes"}, "101", "/volume1/homes/alice"},
+        {{"yes", "yes", "no", "/volume1/homes"}, "110", "/volume1/homes/alice"},
+        {{"no", "yes", nullptr, "/volume1/homes"}, "010", off},  // on for other kinds only
+        {{"YES", "maybe", nullptr, "/volume1/homes"}, "100", "/volume1/homes/alice"},
         {{"no", "no", "no", "/volume1/homes"}, "000", off},
         {{"yes", "yes", "yes", nullptr}, "000", off},
         {{"yes", "yes", "yes", "relative/homes"}, "000", off},
@@ -99,11 +116,11 @@ TEST_F(HomeService, SwitchesAndRoot) {
         }
         app_.WriteFile(QUIB_INFO_CONF, text);
         EXPECT_EQ(enabled(), row.enabled) << text;
-        EXPECT_EQ(HomePath(), row.root) << text;
+        EXPECT_EQ(HomePath("alice"), row.root) << text;
     }
     ASSERT_EQ(unlink(QUIB_INFO_CONF), 0);
     EXPECT_EQ(enabled(), "000");
-    EXPECT_EQ(HomePath(), off);
+    EXPECT_EQ(HomePath("alice"), off);  // no settings: the service was never turned on
 }
 
 }  // namespace
