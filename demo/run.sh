@@ -19,5 +19,5 @@ fi
 build=$(cd "$build" && pwd)  # the sandbox may start the tour elsewhere
 
 # --no-log: the library's syslog lines would mix with the tour.
-"$build/tools/norvo-sandbox" --no-log "$root/demo/appliance.conf" -- \
+"$build/tools/sandbox/norvo-sandbox" --no-log "$root/demo/appliance.conf" -- \
     /usr/bin/env NORVO_IN_SANDBOX=1 NORVO="$build/tools/norvo" /bin/sh "$root/demo/tour.sh"

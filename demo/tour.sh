@@ -60,6 +60,30 @@ show "A name beginning with ._ is reserved" \
     check-name /volume1/photo ._thumbs
 show "Before making new/sub/dir: the longest existing part is what gets checked" \
     check-path --find-existing /volume1/photo/new/sub/dir
+show "What alice's file manager shows at the top: her home, then her shares (vault included)" \
+    ls --user alice /
+show "bob sees no vault; archive lies on the read-only /volume2" \
+    ls --user bob /
+show "The same folder for both: alice enters alice-only ..." \
+    ls --user alice /public/alice-only
+show "... bob is refused by its mode (0700), judged as bob" \
+    ls --user bob /public/alice-only
+show "carol is on photo's no-access list: the share refuses the listing" \
+    ls --user carol /photo
+show "Sorted by size: folders first, then the files from the smallest up" \
+    ls --user alice --sort size /photo/2024
+show "... descending: the whole list reversed, folders last" \
+    ls --user alice --sort size --desc /photo/2024
+show "Sorted by owner: by user id (root is 0), not by name" \
+    ls --user alice --sort user /photo/2024
+show "Paging: the total counts every entry, the page holds two from offset 1" \
+    ls --user alice --sort size --offset 1 --limit 2 /photo/2024
+show "Only the names the terms match" \
+    ls --user bob --name jpg,mov /photo/2024
+show "The read-only volume: its share's volume status, as the web interface receives it" \
+    --json ls --user bob --info volume_status --sort name --offset 0 --limit 1 /
+show "A file entry as the web interface receives it" \
+    --json ls --user bob --info size,owner,perm --name sunset /photo/2024
 
 step=$((step + 1))
 printf '\n== %d. %s\n' "$step" "A domain account logs in; the sid is kept for the next calls"

@@ -129,6 +129,32 @@ std::vector<CommandDef> MakeCommands() {
           {"size", "OP:BYTES", false, "size: equal:N, less:N, or greater than with any other word"}},
          {{"FILE...", "real paths to test in memory"}},
          RunConditions},
+        {"ls", "a directory's page of entries, or the shares at /, as the web interface gets it",
+         "Lists PATH as the file manager's listing request does for USER: resolved first\n"
+         "(NvoFullPathGet), refused unless USER may list its share (CheckShareListPrivilege; 407\n"
+         "when the check gives no code), then read as USER (initgroups, setegid, seteuid: needs\n"
+         "root) so modes and ACL masks are USER's (NvoEnum::NvoLibDirEntryListEnum). \"/\" lists the\n"
+         "home folder and the shares USER may see (NvoEnum::NvoLibShareEntryListEnum).\n"
+         "\n"
+         "Sorting, order and paging are the library's: directories first, then the key (size,\n"
+         "mtime, crtime, ctime, atime, user and group by id, posix, type; anything else sorts by\n"
+         "name); --desc reverses the whole list; the total counts every entry before the page is\n"
+         "cut, and --limit 0 (the default) gives every entry. A page past the end is empty.\n"
+         "\n"
+         "--json prints {\"total\",\"offset\",\"files\"} with each entry as DumpFileInfo renders it\n"
+         "for the --info groups; the text is a table of the same groups, a folder's name ending in\n"
+         "\"/\". Default info: every group but volume_status and sync_share; at \"/\" volume_status too.",
+         {{"user", "USER", true, kUserHelp},
+          {"sort", "KEY", false, "sort key: size, mtime, crtime, ctime, atime, user, group, posix, type, name"},
+          {"desc", nullptr, false, "descending: the sorted list reversed"},
+          {"offset", "N", false, "the page's first entry, from 0"},
+          {"limit", "N", false, "at most N entries (0: all)"},
+          {"info", "NAMES", false,
+           "comma-separated: real_path,size,owner,time,perm,type,mount_point_type,volume_status,sync_share"},
+          {"type", "WORD", false, "dir, file or all (default); not at /"},
+          {"name", "TERMS", false, "name terms as norvo conditions --name takes them; not at /"}},
+         {{"PATH", "a user-visible path (/share/dir, /home/...), or / for the shares"}},
+         RunLs},
     };
 }
 

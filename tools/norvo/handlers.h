@@ -13,5 +13,6 @@ int RunLogin(const Invocation &inv);       // cmd_login.cc
 int RunMounts(const Invocation &inv);      // cmd_enum.cc
 int RunWhois(const Invocation &inv);       // cmd_enum.cc
 int RunConditions(const Invocation &inv);  // cmd_conditions.cc
+int RunLs(const Invocation &inv);          // cmd_ls.cc
 
 }  // namespace norvo::cli

@@ -1,0 +1,319 @@
+// ls: the page of a directory (or of the share list at "/") that the web interface receives.
+#include <time.h>
+
+#include <algorithm>
+#include <list>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "accounts.h"
+#include "exit_status.h"
+#include "handlers.h"
+#include "identity.h"
+#include "norvo/errors.h"
+#include "norvo/norvodir.h"
+#include "norvo/norvoenum.h"
+#include "norvo/norvomisc.h"
+#include "norvo/norvosearch.h"
+#include "number.h"
+#include "output.h"
+#include "text_safe.h"
+
+namespace norvo::cli {
+namespace {
+
+using FileSearch::FindComp;
+using FileSearch::FindFactory;
+
+constexpr int kLargestPageNumber = 0x7fffffff;  // the library reads the offset as signed 32-bit
+constexpr int kDirInfo = NVO_INFO_REAL_PATH | NVO_INFO_SIZE | NVO_INFO_OWNER | NVO_INFO_TIME | NVO_INFO_PERM |
+                         NVO_INFO_TYPE | NVO_INFO_MOUNT_POINT_TYPE;
+constexpr int kShareInfo = kDirInfo | NVO_INFO_VOLUME_STATUS;
+
+struct InfoName {
+    const char *name;
+    int flag;
+};
+constexpr InfoName kInfoNames[] = {
+    {"real_path", NVO_INFO_REAL_PATH},
+    {"size", NVO_INFO_SIZE},
+    {"owner", NVO_INFO_OWNER},
+    {"time", NVO_INFO_TIME},
+    {"perm", NVO_INFO_PERM},
+    {"type", NVO_INFO_TYPE},
+    {"mount_point_type", NVO_INFO_MOUNT_POINT_TYPE},
+    {"volume_status", NVO_INFO_VOLUME_STATUS},
+    {"sync_share", NVO_INFO_SYNC_SHARE},
+};
+
+// The name condition the request's --name makes; deletes what the factory appended (a name
+// condition frees the alternatives joined to it).
+struct Conditions {
+    std::vector<FindComp *> items;
+    Conditions() = default;
+    Conditions(const Conditions &) = delete;
+    Conditions &operator=(const Conditions &) = delete;
+    ~Conditions() {
+        for (FindComp *item : items) {
+            delete item;
+        }
+    }
+};
+
+// The comma-separated info names as flags; false with *bad set to the first unknown name.
+bool ParseInfo(const std::string &text, int *info, std::string *bad) {
+    *info = 0;
+    size_t start = 0;
+    while (start <= text.size()) {
+        size_t end = text.find(',', start);
+        if (end == std::string::npos) {
+            end = text.size();
+        }
+        const std::string word = text.substr(start, end - start);
+        int flag = 0;
+        for (const InfoName &known : kInfoNames) {
+            if (word == known.name) {
+                flag = known.flag;
+            }
+        }
+        if (flag == 0) {
+            *bad = word;
+            return false;
+        }
+        *info |= flag;
+        start = end + 1;
+    }
+    return true;
+}
+
+// Columns in characters, not bytes: a UTF-8 owner name counts once per character.
+size_t Width(const std::string &text) {
+    size_t width = 0;
+    for (const char c : text) {
+        width += (static_cast<unsigned char>(c) & 0xC0) != 0x80 ? 1 : 0;
+    }
+    return width;
+}
+
+std::string HumanSize(uint64_t size) {
+    char buf[64];
+    if (FileUnitGet(static_cast<long long>(size), buf, sizeof buf, true) != 1) {
+        return "0 Bytes";  // the library writes nothing for 0
+    }
+    return buf;
+}
+
+std::string Date(int32_t seconds) {
+    const time_t when = seconds;
+    struct tm parts;
+    char buf[32];
+    if (localtime_r(&when, &parts) == nullptr || strftime(buf, sizeof buf, "%Y-%m-%d %H:%M", &parts) == 0) {
+        return "?";
+    }
+    return buf;
+}
+
+// One aligned line per entry, the name last (it may be long or odd); columns only for the
+// groups info asked for.
+void AddTable(const std::list<DIRENTRY_INFO> &files, int info, bool shares, TextTable *text) {
+    std::vector<std::vector<std::string>> rows;
+    std::vector<bool> rightAligned;
+    std::vector<std::string> header;
+    auto column = [&](const char *name, bool right) {
+        header.push_back(name);
+        rightAligned.push_back(right);
+    };
+    if (info & NVO_INFO_PERM) column("posix", false);
+    if (info & NVO_INFO_OWNER) column("owner", false);
+    if (info & NVO_INFO_SIZE) column("size", true);
+    if (info & NVO_INFO_TIME) column("modified", false);
+    const bool volume = shares && (info & NVO_INFO_VOLUME_STATUS);
+    if (volume) column("volume", false);
+    column("name", false);
+    rows.push_back(header);
+    for (const DIRENTRY_INFO &entry : files) {
+        std::vector<std::string> row;
+        if (info & NVO_INFO_PERM) row.push_back(GetPrivilegeStr(entry.mode));
+        if (info & NVO_INFO_OWNER) row.push_back(TerminalSafe(entry.user.empty() ? std::to_string(entry.uid) : entry.user));
+        if (info & NVO_INFO_SIZE) row.push_back(entry.isdir ? "-" : HumanSize(entry.size));
+        if (info & NVO_INFO_TIME) row.push_back(Date(entry.mtime));
+        if (volume) {
+            row.push_back(entry.mount_point_type == "remotefail"
+                              ? std::string("unreachable")
+                              : std::string(entry.readonly ? "read-only" : "read-write") + ", " +
+                                    HumanSize(entry.freespace) + " free");
+        }
+        row.push_back(TerminalSafe(entry.name) + (entry.isdir ? "/" : ""));
+        rows.push_back(std::move(row));
+    }
+    std::vector<size_t> widths(header.size(), 0);
+    for (const auto &row : rows) {
+        for (size_t i = 0; i + 1 < row.size(); ++i) {
+            widths[i] = std::max(widths[i], Width(row[i]));
+        }
+    }
+    for (const auto &row : rows) {
+        std::string line;
+        for (size_t i = 0; i < row.size(); ++i) {
+            const std::string pad(i + 1 < row.size() ? widths[i] - Width(row[i]) : 0, ' ');
+            line += rightAligned[i] ? pad + row[i] : row[i] + (i + 1 < row.size() ? pad : "");
+            if (i + 1 < row.size()) {
+                line += "  ";
+            }
+        }
+        text->Line(line);
+    }
+}
+
+bool HasDotComponent(const std::string &path) {
+    size_t start = 0;
+    while (start <= path.size()) {
+        size_t end = path.find('/', start);
+        if (end == std::string::npos) {
+            end = path.size();
+        }
+        const size_t length = end - start;
+        if ((length == 1 || length == 2) && path.compare(start, length, std::string(length, '.')) == 0) {
+            return true;
+        }
+        start = end + 1;
+    }
+    return false;
+}
+
+std::string PageText(unsigned long total, unsigned long offset, size_t shown) {
+    std::string text = "total " + std::to_string(total);
+    if (shown == 0) {
+        return text + (total == 0 ? "" : ", nothing from offset " + std::to_string(offset));
+    }
+    if (shown == total) {
+        return text;
+    }
+    return text + ", showing " + std::to_string(offset + 1) + "-" + std::to_string(offset + shown);
+}
+
+}  // namespace
+
+int RunLs(const Invocation &inv) {
+    const std::string &userName = *inv.Value("user");
+    std::string path = inv.arguments[0];
+    while (path.size() > 1 && path.back() == '/') {
+        path.pop_back();  // "/photo/" lists /photo; only "/" itself is the share list
+    }
+    const bool shares = path == "/";
+    if (HasDotComponent(path)) {
+        // The resolution would take /share/../other as a path of share; its check would be
+        // the wrong share's.
+        return ReportUsageError(inv.command, "PATH may not hold . or .. components: " + path);
+    }
+
+    // The command line first: nothing is asked of the system for a wrong one.
+    int info = shares ? kShareInfo : kDirInfo;
+    if (const std::string *text = inv.Value("info")) {
+        std::string bad;
+        if (!ParseInfo(*text, &info, &bad)) {
+            return ReportUsageError(inv.command, "--info does not know \"" + bad +
+                                                     "\"; names: real_path, size, owner, time, perm, type, "
+                                                     "mount_point_type, volume_status, sync_share");
+        }
+    }
+    int offset = 0;
+    int limit = 0;
+    if (const std::string *text = inv.Value("offset"); text && !ParseNumber(*text, 0, kLargestPageNumber, &offset)) {
+        return ReportUsageError(inv.command, "--offset wants a number from 0 to 2147483647, not " + *text);
+    }
+    if (const std::string *text = inv.Value("limit"); text && !ParseNumber(*text, 0, kLargestPageNumber, &limit)) {
+        return ReportUsageError(inv.command, "--limit wants a number from 0 to 2147483647, not " + *text);
+    }
+    _tag_dir_entry_type_ type = DIR_ENTRY_TYPE_ALL;
+    if (const std::string *word = inv.Value("type")) {
+        if (*word == "dir") {
+            type = DIR_ENTRY_TYPE_DIR;
+        } else if (*word == "file") {
+            type = DIR_ENTRY_TYPE_FILE;
+        } else if (*word != "all") {
+            return ReportUsageError(inv.command, "--type wants dir, file or all, not " + *word);
+        }
+    }
+    if (shares && (inv.Has("type") || inv.Has("name"))) {
+        return ReportUsageError(inv.command, "--type and --name filter a directory, not the share list at /");
+    }
+    const char *sortKey = inv.CStr("sort");
+    const bool ascending = !inv.Has("desc");
+
+    int status = kExitFailure;
+    UserRecord user = RequireUser(inv, userName, &status);
+    if (!user) {
+        return status;
+    }
+    Conditions conditions;
+    if (const std::string *terms = inv.Value("name")) {
+        NvoLibSetErr(NVO_ERR_NONE);
+        if (!FindFactory::createFindOp(FindFactory::FIND_FIELD_NAME, "", terms->c_str(), conditions.items)) {
+            return ReportLibraryFailure(inv, "the --name condition");
+        }
+    }
+    std::string realPath;
+    if (!shares) {
+        std::string share;
+        std::string volumePath;
+        std::string sharePath;
+        NvoLibSetErr(NVO_ERR_NONE);
+        if (!NvoFullPathGet(path.c_str(), realPath, share, volumePath, sharePath, userName)) {
+            return ReportLibraryFailure(inv, "resolving " + path);
+        }
+        NvoLibSetErr(NVO_ERR_NONE);
+        if (CheckShareListPrivilege(userName.c_str(), nullptr, path.c_str()) != 1) {
+            // The check refuses without a code of its own; the web interface shows 407 then.
+            const int code = NvoLibGetErr();
+            return ReportFailure(inv, code != NVO_ERR_NONE ? code : NVO_ERR_PRIVILEGE,
+                                 userName + " may not list " + path);
+        }
+    }
+
+    // As the user from here on: modes and ACL masks are judged for the user's identity.
+    std::string error;
+    std::unique_ptr<UserIdentity> identity = UserIdentity::Assume(*user, &error);
+    if (!identity) {
+        return ReportFailure(inv, NVO_ERR_SYSTEM, error);
+    }
+    NvoEnum lister;
+    std::list<DIRENTRY_INFO> files;
+    unsigned long total = 0;
+    NvoLibSetErr(NVO_ERR_NONE);
+    const int listed =
+        shares ? lister.NvoLibShareEntryListEnum(userName.c_str(), nullptr, false, sortKey, info,
+                                                  static_cast<unsigned long>(offset),
+                                                  static_cast<unsigned long>(limit), ascending, files, &total)
+               : lister.NvoLibDirEntryListEnum(path.c_str(), realPath.c_str(), sortKey, info,
+                                                static_cast<unsigned long>(offset), static_cast<unsigned long>(limit),
+                                                ascending, type, conditions.items, files, &total);
+    identity.reset();
+    if (listed != 1) {
+        return ReportLibraryFailure(inv, "listing " + path);
+    }
+    if (limit != 0 && static_cast<unsigned long>(offset) >= total) {
+        files.clear();  // a page past the end is empty (the library leaves that case open)
+    }
+
+    Json::Value data(Json::objectValue);
+    data["total"] = static_cast<Json::UInt64>(total);
+    data["offset"] = offset;
+    Json::Value &list = data["files"] = Json::Value(Json::arrayValue);
+    TextTable text;
+    if (inv.json) {
+        for (const DIRENTRY_INFO &entry : files) {
+            Json::Value &item = list.append(Json::Value(Json::objectValue));
+            DumpFileInfo(info, entry, item);
+        }
+    } else {
+        text.Line(PageText(total, static_cast<unsigned long>(offset), files.size()));
+        if (!files.empty()) {
+            AddTable(files, info, shares, &text);
+        }
+    }
+    return ReportSuccess(inv, data, text);
+}
+
+}  // namespace norvo::cli
