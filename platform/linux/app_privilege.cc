@@ -68,7 +68,7 @@ int HasPrivilege(const char *userName, const char *priv) {
         return 1;
     }
     std::string text;
-    if (int readErr = ReadLockedFile(QUIB_APP_PRIVILEGE_CONF, &text); readErr != 0) {
+    if (int readErr = ReadWholeFile(QUIB_APP_PRIVILEGE_CONF, &text); readErr != 0) {
         if (readErr != ENOENT) {
             QUIB_SET_ERR(QUIB_ERR_OPEN_FAILED);
         }

@@ -34,7 +34,7 @@ constexpr size_t kMaxSharePathArg = 4096;
 // The configured shares; false with 0x0900 when the configuration can't be read.
 bool LoadShares(std::vector<ShareEntry> *shares) {
     std::string text;
-    if (ReadLockedFile(QUIB_SHARE_CONF, &text) != 0) {
+    if (ReadWholeFile(QUIB_SHARE_CONF, &text) != 0) {
         QUIB_SET_ERR(QUIB_ERR_OPEN_FAILED);
         return false;
     }
