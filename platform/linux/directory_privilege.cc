@@ -6,6 +6,7 @@
 #include <memory>
 #include <string>
 
+#include "account_service.h"
 #include "api_guard.h"
 #include "login_session.h"
 #include "quib_login.h"
@@ -22,26 +23,12 @@ struct ShareFree {
     void operator()(PQUIBSHARE share) const { QUIBShareFree(share); }
 };
 
-struct Service {
-    AUTH_TYPE kind;
-    const char *nameKey;     // must be non-empty
-    const char *enabledKey;  // must be "yes"
-};
-
-constexpr Service kDomain = {AUTH_DOMAIN, "workgroup", "domain_joined"};
-constexpr Service kDirectory = {AUTH_LDAP, "ldap_server", "ldap_enabled"};
-
-bool IsConfigured(const Service &service) {
-    char name[256];
-    return VLIBCFileGetKeyValue(QUIB_INFO_CONF, service.nameKey, name, sizeof name, 0) > 1 &&
-           VLIBCFileCheckKeyValue(QUIB_INFO_CONF, service.enabledKey, "yes", 1) == 1;
-}
-
 bool InList(const char *user, const char *list) {
     return list != nullptr && BlSDKUserIsInList(user, list) == 1;
 }
 
-int GetPrivilege(const Service &service, const char *share, const char *user, const char *sid, int *priv) {
+int GetPrivilege(const AccountService &service, const char *share, const char *user, const char *sid,
+                 int *priv) {
     if (!IsConfigured(service)) {
         QUIB_SET_ERR(QUIB_ERR_OPEN_FAILED);
         return -2;
@@ -80,11 +67,11 @@ using namespace norvo::platform;
 extern "C" {
 
 int QuibCgiDomGetPrivilege(const char *share, const char *user, const char *sid, int *priv) {
-    return Guarded(-1, [&] { return GetPrivilege(kDomain, share, user, sid, priv); });
+    return Guarded(-1, [&] { return GetPrivilege(kDomainService, share, user, sid, priv); });
 }
 
 int QuibCgiLDAPGetPrivilege(const char *share, const char *user, const char *sid, int *priv) {
-    return Guarded(-1, [&] { return GetPrivilege(kDirectory, share, user, sid, priv); });
+    return Guarded(-1, [&] { return GetPrivilege(kDirectoryService, share, user, sid, priv); });
 }
 
 }  // extern "C"

@@ -3,6 +3,7 @@
 // sssd), so no domain controller or directory server is asked.
 #include <memory>
 
+#include "account_service.h"
 #include "api_guard.h"
 #include "quib_paths.h"
 #include "quib_share.h"
@@ -22,22 +23,6 @@ struct ShareDBClose {
     void operator()(PQUIBSHARE_DB db) const { QUIBShareDBClose(db); }
 };
 
-struct Service {
-    AUTH_TYPE kind;
-    const char *nameKey;     // must be non-empty
-    const char *enabledKey;  // must be "yes"
-};
-
-// The same keys QuibCgiDomGetPrivilege and QuibCgiLDAPGetPrivilege require.
-constexpr Service kDomain = {AUTH_DOMAIN, "workgroup", "domain_joined"};
-constexpr Service kDirectory = {AUTH_LDAP, "ldap_server", "ldap_enabled"};
-
-bool IsConfigured(const Service &service) {
-    char name[256];
-    return VLIBCFileGetKeyValue(QUIB_INFO_CONF, service.nameKey, name, sizeof name, 0) > 1 &&
-           VLIBCFileCheckKeyValue(QUIB_INFO_CONF, service.enabledKey, "yes", 1) == 1;
-}
-
 bool Visible(const char *user, const QUIBSHARE &share, bool writableOnly) {
     if ((share.fStatus & SHARE_STATUS_HIDDEN) != 0 || BlSDKUserIsInList(user, share.szNoAccessList) != 0) {
         return false;
@@ -46,7 +31,7 @@ bool Visible(const char *user, const QUIBSHARE &share, bool writableOnly) {
            (!writableOnly && BlSDKUserIsInList(user, share.szROList) == 1);
 }
 
-PSZLIST ValidShares(const Service &service, const char *user, int sort, int writableOnly) {
+PSZLIST ValidShares(const AccountService &service, const char *user, int sort, int writableOnly) {
     if (!IsConfigured(service)) {
         QUIB_SET_ERR(QUIB_ERR_OPEN_FAILED);
         return nullptr;
@@ -92,11 +77,13 @@ namespace np = norvo::platform;
 extern "C" {
 
 PSZLIST QuibCgiDomValidShareGen(const char * /*context*/, const char *user, int sort, int writableOnly) {
-    return np::Guarded<PSZLIST>(nullptr, [&] { return np::ValidShares(np::kDomain, user, sort, writableOnly); });
+    return np::Guarded<PSZLIST>(
+        nullptr, [&] { return np::ValidShares(np::kDomainService, user, sort, writableOnly); });
 }
 
 PSZLIST QuibCgiLDAPValidShareGen(const char * /*context*/, const char *user, int sort, int writableOnly) {
-    return np::Guarded<PSZLIST>(nullptr, [&] { return np::ValidShares(np::kDirectory, user, sort, writableOnly); });
+    return np::Guarded<PSZLIST>(
+        nullptr, [&] { return np::ValidShares(np::kDirectoryService, user, sort, writableOnly); });
 }
 
 }  // extern "C"
