@@ -4,6 +4,8 @@
 #include <string.h>
 #include <unistd.h>
 
+#include <list>
+#include <optional>
 #include <string>
 
 #include "common/log.h"
@@ -14,6 +16,7 @@
 #include "norvo/norvoenum.h"
 #include "norvo/norvosearch.h"
 #include "norvoenum/info_flags.h"
+#include "norvoenum/listing_scope.h"
 #include "norvoenum/remote_mount.h"
 #include "quib_fs.h"
 #include "quib_stat.h"
@@ -50,6 +53,27 @@ bool PassesAll(const std::vector<FileSearch::FindComp *> &conditions, const char
     return true;
 }
 
+// The paths FillFileInfo sets when no listing defers them: the directory's paths, '/', the name
+// (the directory entry's name, which holds no NUL).
+void SetPaths(std::list<DIRENTRY_INFO> &out, const char *userPath, const char *realPath, int fillInfo) {
+    std::string userChild(userPath);
+    userChild += '/';
+    const size_t userBase = userChild.size();
+    std::string realChild(realPath);
+    realChild += '/';
+    const size_t realBase = realChild.size();
+    for (DIRENTRY_INFO &entry : out) {
+        userChild.resize(userBase);
+        userChild += entry.name;
+        entry.path = userChild;
+        if (fillInfo & NVO_INFO_REAL_PATH) {
+            realChild.resize(realBase);
+            realChild += entry.name;
+            entry.real_path = realChild;
+        }
+    }
+}
+
 }  // namespace
 
 int NvoEnum::NvoLibDirEntryListEnum(const char *userPath, const char *realPath, const char *sortKey, int info,
@@ -67,6 +91,7 @@ int NvoEnum::NvoLibDirEntryListEnum(const char *userPath, const char *realPath, 
         return 0;
     }
     *total = 0;
+    bool deferred = false;
     try {
         if (chdir(realPath) != 0) {
             NvoLibSetErr(EnterError(realPath, errno));
@@ -108,6 +133,13 @@ int NvoEnum::NvoLibDirEntryListEnum(const char *userPath, const char *realPath, 
         std::string userChild(userPath);
         userChild += '/';
         const size_t userBase = userChild.size();
+        // Into an empty list, the kept records get their paths at the end, after the page is cut
+        // (SetPaths); records the caller passed in are never touched that way.
+        deferred = out.empty();
+        std::optional<norvo::ListingScope> scope;
+        if (deferred) {
+            scope.emplace();
+        }
         while (const struct dirent *found = readdir(dir.get())) {
             const char *name = found->d_name;
             if (QUIBEAIsHiddenFile(name) == 1 || !PassesAll(conditions, name)) {
@@ -123,6 +155,10 @@ int NvoEnum::NvoLibDirEntryListEnum(const char *userPath, const char *realPath, 
                                           fillInfo, entry);
             if (kept < 0) {
                 out.pop_back();
+                scope.reset();
+                if (deferred) {
+                    SetPaths(out, userPath, realPath, fillInfo);
+                }
                 return 0;
             }
             if (kept != 0 && entry.mount_point_type != "remotefail") {
@@ -130,6 +166,7 @@ int NvoEnum::NvoLibDirEntryListEnum(const char *userPath, const char *realPath, 
             }
         }
         dir.reset();
+        scope.reset();
         if (sortKey != nullptr) {
             EntryListSort(out, sortKey);
         }
@@ -141,9 +178,18 @@ int NvoEnum::NvoLibDirEntryListEnum(const char *userPath, const char *realPath, 
         if (limit != 0) {
             NvoLibDirEntrySlice(out, offset, limit);
         }
+        if (deferred) {
+            SetPaths(out, userPath, realPath, fillInfo);
+        }
         return 1;
     } catch (...) {
         // Only memory can run out here.
+        if (deferred) {
+            try {
+                SetPaths(out, userPath, realPath, norvo::WidenInfoBySortKey(sortKey, info));
+            } catch (...) {
+            }
+        }
         NvoLibSetErr(NVO_ERR_SYSTEM);
         return 0;
     }

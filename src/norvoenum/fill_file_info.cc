@@ -10,6 +10,7 @@
 #include "norvo/errors.h"
 #include "norvo/norvoenum.h"
 #include "norvo/norvomisc.h"
+#include "norvoenum/listing_scope.h"
 #include "norvoenum/remote_mount.h"
 #include "quib_fs.h"
 #include "quib_stat.h"
@@ -88,7 +89,19 @@ void SetType(const char *name, std::string &type) {
     }
 }
 
+thread_local bool t_pathsDeferred = false;
+
 }  // namespace
+
+namespace norvo {
+
+ListingScope::ListingScope() : outer_(t_pathsDeferred) { t_pathsDeferred = true; }
+
+ListingScope::~ListingScope() { t_pathsDeferred = outer_; }
+
+bool ListingScope::PathsDeferred() { return t_pathsDeferred; }
+
+}  // namespace norvo
 
 int NvoEnum::FillFileInfo(const char *userPath, const char *realPath, const char *name, _tag_dir_entry_type_ type,
                           unsigned char dtype, int info, DIRENTRY_INFO &entry) {
@@ -98,10 +111,12 @@ int NvoEnum::FillFileInfo(const char *userPath, const char *realPath, const char
     }
     try {
         entry.name = name;
-        entry.path = userPath;
         entry.isdir = (dtype & DT_DIR) != 0;
-        if (info & NVO_INFO_REAL_PATH) {
-            entry.real_path = realPath;
+        if (!t_pathsDeferred) {
+            entry.path = userPath;
+            if (info & NVO_INFO_REAL_PATH) {
+                entry.real_path = realPath;
+            }
         }
         if (dtype != DT_UNKNOWN) {
             // Links, devices, pipes and sockets are never listed.

@@ -278,6 +278,37 @@ TEST_F(Listing, BadArgumentsAndPathsGetTheirErrors) {
     EXPECT_EQ(app_.Logs(), std::vector<LogLine>{Err("norvoenum.cpp:306 Failed to stat " + notDir + ". Not a directory")});
 }
 
+// Every listed record carries the user path and (when asked) the real path of its entry, on a
+// cut page, in reverse, and appended to a list that already held records, which stay as they were.
+TEST_F(Listing, RecordsCarryTheirPathsAndEarlierRecordsStayAsTheyWere) {
+    NvoEnum enumeration;
+    for (const int info : {0, static_cast<int>(NVO_INFO_REAL_PATH), 0x7F}) {
+        for (const bool prefilled : {false, true}) {
+            std::list<DIRENTRY_INFO> out;
+            if (prefilled) {
+                DIRENTRY_INFO &earlier = out.emplace_back();
+                earlier.name = "zz-earlier";
+                earlier.path = "/kept/as/is";
+                earlier.real_path = "kept";
+            }
+            unsigned long total = 0;
+            ASSERT_EQ(enumeration.NvoLibDirEntryListEnum(kUserDir.c_str(), kDir.c_str(), "name", info, 1, 3, false,
+                                                         DIR_ENTRY_TYPE_ALL, {}, out, &total), 1);
+            EXPECT_EQ(total, prefilled ? 5u : 4u);
+            EXPECT_EQ(out.size(), 3u);
+            for (const DIRENTRY_INFO &e : out) {
+                if (e.name == "zz-earlier") {
+                    EXPECT_EQ(e.path, "/kept/as/is");
+                    EXPECT_EQ(e.real_path, "kept");
+                    continue;
+                }
+                EXPECT_EQ(e.path, kUserDir + "/" + e.name) << info;
+                EXPECT_EQ(e.real_path, (info & NVO_INFO_REAL_PATH) ? kDir + "/" + e.name : "") << info;
+            }
+        }
+    }
+}
+
 TEST_F(Listing, AFailurePartWayKeepsTheRecordsSoFarAndClosesTheDirectory) {
     // A folder whose path leaves no room for a long name: that entry's stat fails.
     std::string deep = "/volume1/public";
@@ -299,6 +330,9 @@ TEST_F(Listing, AFailurePartWayKeepsTheRecordsSoFarAndClosesTheDirectory) {
     EXPECT_EQ(r.err, NVO_ERR_SYSTEM);
     EXPECT_EQ(r.total, 0u);
     EXPECT_LE(r.out.size(), 1u);
+    for (const DIRENTRY_INFO &e : r.out) {  // the records so far carry their paths
+        EXPECT_EQ(e.path, "/public" + deep.substr(15) + "/" + e.name);
+    }
     EXPECT_EQ(openFds(), fds);
     EXPECT_EQ(app_.Logs(), std::vector<LogLine>{Err("norvoenum.cpp:306 Failed to stat " + deep + "/" + longName +
                                                     ". File name too long")});
