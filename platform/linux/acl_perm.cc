@@ -62,18 +62,24 @@ std::string ProbeTargetOf(const char *path, const struct statx &info) {
     return parent;
 }
 
-// Whether unlink or rmdir of path would pass the kernel's may_delete: write and search on the
-// directory, its append-only flag, the sticky bit, and the entry's own immutable, append-only
-// and mount-root states.
-bool MayDelete(const char *path, const struct statx &entry) {
+// The entry's own side of may_delete: not immutable, append-only or a mount root, and not the
+// root, "." or ".." (what rmdir refuses). True with the parent's path when those pass.
+bool EntryMayGo(const char *path, const struct statx &entry, std::string *parent) {
     if (HasAttribute(entry, STATX_ATTR_IMMUTABLE) || HasAttribute(entry, STATX_ATTR_APPEND) ||
         HasAttribute(entry, STATX_ATTR_MOUNT_ROOT)) {
         return false;
     }
-    std::string parent;
     std::string_view last;
-    if (!SplitLastComponent(path, &parent, &last) || last == "." || last == "..") {
-        return false;  // the root, and what rmdir refuses (EINVAL, ENOTEMPTY)
+    return SplitLastComponent(path, parent, &last) && last != "." && last != "..";
+}
+
+// Whether unlink or rmdir of path would pass the kernel's may_delete: write and search on the
+// directory, its append-only flag, the sticky bit, and the entry's own immutable, append-only
+// and mount-root states.
+bool MayDelete(const char *path, const struct statx &entry) {
+    std::string parent;
+    if (!EntryMayGo(path, entry, &parent)) {
+        return false;
     }
     struct statx dir;
     if (statx(AT_FDCWD, parent.c_str(), 0, STATX_MODE | STATX_UID, &dir) != 0 ||
@@ -189,14 +195,9 @@ bool ParentWriteSearch(const char *parent, const struct statx &dir, const acl::I
 
 // MayDelete, with the parent's facts evaluated once per parent.
 bool FastMayDelete(const char *path, const struct statx &entry, const acl::Identity &who) {
-    if (HasAttribute(entry, STATX_ATTR_IMMUTABLE) || HasAttribute(entry, STATX_ATTR_APPEND) ||
-        HasAttribute(entry, STATX_ATTR_MOUNT_ROOT)) {
-        return false;
-    }
     std::string parent;
-    std::string_view last;
-    if (!SplitLastComponent(path, &parent, &last) || last == "." || last == "..") {
-        return false;  // the root, and what rmdir refuses (EINVAL, ENOTEMPTY)
+    if (!EntryMayGo(path, entry, &parent)) {
+        return false;
     }
     struct statx dir;
     if (statx(AT_FDCWD, parent.c_str(), 0, kInodeMask | STATX_INO | STATX_CTIME | acl::MountIdMask(), &dir) != 0 ||
