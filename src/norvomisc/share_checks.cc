@@ -29,25 +29,34 @@ bool SharePrivilege(const char *user, const char *sid, const char *path, int &pr
     return true;
 }
 
+enum Verdict { kAllowed, kRefused, kLookupFailed };
+
+// Home folders pass; a share passes when the user holds any privilege there and none of the
+// blocking restriction flags is set. A refusal is logged here.
+Verdict ShareAllows(const char *user, const char *sid, const char *path, unsigned int blocking) {
+    if (IsHomePath(path)) {
+        return kAllowed;
+    }
+    int priv = 0;
+    unsigned int flags = 0;
+    if (!SharePrivilege(user, sid, path, priv, flags)) {
+        return kLookupFailed;
+    }
+    if (priv != 0 && (flags & blocking) == 0) {
+        return kAllowed;
+    }
+    NVO_LOG(kNorvoMisc, "%s:%d No privilege in path %s", path);
+    return kRefused;
+}
+
 }  // namespace
+
 
 int CheckShareListPrivilege(const char *user, const char *sid, const char *path) {
     if (path == nullptr) {
         return 0;
     }
-    if (IsHomePath(path)) {
-        return 1;
-    }
-    int priv = 0;
-    unsigned int flags = 0;
-    if (!SharePrivilege(user, sid, path, priv, flags)) {
-        return 0;
-    }
-    if (priv != 0 && (flags & SHARE_RESTRICT_NO_BROWSE) == 0) {
-        return 1;
-    }
-    NVO_LOG(kNorvoMisc, "%s:%d No privilege in path %s", path);
-    return 0;
+    return ShareAllows(user, sid, path, SHARE_RESTRICT_NO_BROWSE) == kAllowed ? 1 : 0;
 }
 
 int CheckShareDownloadPrivilege(const char *user, const char *sid, const char *path) {
@@ -55,20 +64,12 @@ int CheckShareDownloadPrivilege(const char *user, const char *sid, const char *p
         NvoLibSetErr(NVO_ERR_GENERAL);
         return 0;
     }
-    if (IsHomePath(path)) {
-        return 1;
+    // Only a refusal by the share sets the code; a failed lookup keeps its own.
+    const Verdict verdict = ShareAllows(user, sid, path, SHARE_RESTRICT_NO_DOWNLOAD | SHARE_RESTRICT_NO_BROWSE);
+    if (verdict == kRefused) {
+        NvoLibSetErr(NVO_ERR_PRIVILEGE);
     }
-    int priv = 0;
-    unsigned int flags = 0;
-    if (!SharePrivilege(user, sid, path, priv, flags)) {
-        return 0;
-    }
-    if (priv != 0 && (flags & (SHARE_RESTRICT_NO_DOWNLOAD | SHARE_RESTRICT_NO_BROWSE)) == 0) {
-        return 1;
-    }
-    NVO_LOG(kNorvoMisc, "%s:%d No privilege in path %s", path);
-    NvoLibSetErr(NVO_ERR_PRIVILEGE);
-    return 0;
+    return verdict == kAllowed ? 1 : 0;
 }
 
 int CheckShareUploadPrivilege(const char *user, const char *sid, const char *path, int *type) {
