@@ -1,6 +1,6 @@
-// VLIBCFile*: the appliance's key="value" settings files. Readers share a flock on the file;
-// writers hold an exclusive one and replace the file by rename, so a reader sees the old text
-// or the new, never a mixture.
+// VLIBCFile*: the appliance's key="value" settings files. Writers hold an exclusive flock and
+// replace the file by rename, so a reader needs no lock: it sees the old text or the new, never
+// a mixture.
 #include <errno.h>
 #include <fcntl.h>
 #include <limits.h>
@@ -62,7 +62,7 @@ bool IsReadableKey(const char *key) {
     return IsValidUtf8(view) && TrimSpace(view).size() == len;
 }
 
-// What every reader does around its own work: reads and parses file under a shared lock and
+// What every reader does around its own work: reads and parses file (no lock: see above) and
 // returns read(lines), all under Guarded; -1 with 0x0900 when the file can't be read.
 template <typename Read>
 int ReadSettings(const char *file, Read read) {

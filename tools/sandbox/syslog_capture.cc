@@ -1,6 +1,7 @@
 #include "syslog_capture.h"
 
 #include <poll.h>
+#include <pthread.h>
 #include <sys/eventfd.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
@@ -12,6 +13,7 @@
 #include <cerrno>
 #include <cstdint>
 #include <cstring>
+#include <future>
 
 #include "fail.h"
 
@@ -20,6 +22,24 @@ namespace norvo::testing::internal {
 namespace {
 
 constexpr int kReceiveBuffer = 4 << 20;
+
+// The capture's thread does its allocating work only while it holds this gate, and every fork
+// of the process waits for it. Tests fork children that allocate: one forked while the thread
+// was inside the allocator would inherit a held lock and hang at its first allocation
+// (sanitizer allocators don't guard fork by themselves).
+std::mutex &ForkGate() {
+    static std::mutex gate;
+    return gate;
+}
+
+void GuardForksWithGate() {
+    static std::once_flag once;
+    std::call_once(once, [] {
+        if (pthread_atfork([] { ForkGate().lock(); }, [] { ForkGate().unlock(); },
+                           [] { ForkGate().unlock(); }) != 0)
+            Fail("can't install the fork handlers of the syslog capture");
+    });
+}
 
 bool IsNameChar(char c) { return std::isalnum(static_cast<unsigned char>(c)) || c == '_' || c == '-'; }
 
@@ -117,7 +137,15 @@ SyslogCapture::SyslogCapture(const std::string &path) {
         FailErrno("can't enlarge the syslog socket's buffer");
     wake_ = UniqueFd(eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK));
     if (!wake_) FailErrno("can't create an eventfd");
-    thread_ = std::thread([this] { Run(); });
+    GuardForksWithGate();
+    // Forks must not overlap the thread's own start-up either: wait until it is about to poll.
+    std::promise<void> started;
+    std::future<void> running = started.get_future();
+    thread_ = std::thread([this, started = std::move(started)]() mutable {
+        started.set_value();
+        Run();
+    });
+    running.wait();
 }
 
 SyslogCapture::~SyslogCapture() {
@@ -136,6 +164,7 @@ void SyslogCapture::Run() {
             FailErrno("can't wait for syslog lines");
         }
         if (fds[1].revents != 0) return;
+        const std::lock_guard<std::mutex> gate(ForkGate());
         const std::lock_guard<std::mutex> lock(mutex_);
         DrainLocked();
     }
