@@ -3,8 +3,10 @@
 // user-space evaluation (acl_eval.h), and the facts of the parent directory that deletion needs
 // are kept while the parent stays the same. Elsewhere the kernel judges: faccessat with
 // AT_EACCESS applies the effective ids, supplementary groups, capabilities and POSIX ACLs
-// exactly as an open or unlink would.
+// exactly as an open or unlink would. Inside a directory pass the entry's statx, the caller's
+// identity and the directory's facts are the pass's (dir_pass.h).
 #include <errno.h>
+#include <string.h>
 #include <fcntl.h>
 #include <linux/capability.h>
 #include <linux/magic.h>
@@ -21,6 +23,7 @@
 
 #include "acl_eval.h"
 #include "api_guard.h"
+#include "dir_pass.h"
 #include "fs_path.h"
 #include "quib_fs.h"
 
@@ -135,10 +138,14 @@ int KernelMask(const char *path, const struct statx &info, const acl::MountFacts
 
 enum class AclRead { kNone, kFound, kUnsupported, kMalformed, kFailed };
 
-// Reads the access ACL of path (follow: through a final link) into *acl.
-AclRead ReadAcl(const char *path, bool follow, acl::Acl *acl) {
+// Reads the access ACL of path (follow: through a final link) into *acl; inside a pass, of the
+// pass's entry name (never followed).
+AclRead ReadAcl(const char *path, bool follow, acl::Acl *acl, QUIBDirPass *pass = nullptr, const char *name = nullptr) {
     char buffer[512];
     const auto get = [&](void *value, size_t size) {
+        if (pass != nullptr) {
+            return PassGetXattr(pass, name, path, "system.posix_acl_access", value, size);
+        }
         return follow ? getxattr(path, "system.posix_acl_access", value, size)
                       : lgetxattr(path, "system.posix_acl_access", value, size);
     };
@@ -158,6 +165,15 @@ AclRead ReadAcl(const char *path, bool follow, acl::Acl *acl) {
 }
 
 constexpr unsigned kInodeMask = STATX_TYPE | STATX_MODE | STATX_UID | STATX_GID;
+
+// The statx of path itself (a final link not followed): the pass's when it has the entry. 0 or
+// the errno.
+int StatEntry(const char *path, QUIBDirPass *pass, const char *name, unsigned fields, struct statx *info) {
+    if (pass != nullptr) {
+        return PassEntryStat(pass, name, info);
+    }
+    return statx(AT_FDCWD, path, AT_SYMLINK_NOFOLLOW, fields, info) == 0 ? 0 : errno;
+}
 
 // The parent facts deletion needs, kept per thread while the parent directory, its state (inode,
 // change time, mount) and the caller stay the same: a listing asks once for all its entries.
@@ -193,6 +209,27 @@ bool ParentWriteSearch(const char *parent, const struct statx &dir, const acl::I
     return Check(parent, W_OK | X_OK, 0) == Access::kGranted;
 }
 
+// The sticky directory's last word (check_sticky).
+bool StickyAllows(const struct statx &dir, const struct statx &entry, const acl::Identity &who) {
+    return (dir.stx_mode & S_ISVTX) == 0 || entry.stx_uid == who.fsuid || dir.stx_uid == who.fsuid || who.fowner;
+}
+
+// MayDelete for an entry of a pass: the directory's facts are the pass's, judged once.
+bool PassMayDelete(QUIBDirPass *pass, const char *name, const struct statx &entry, const acl::Identity &who) {
+    if (HasAttribute(entry, STATX_ATTR_IMMUTABLE) || HasAttribute(entry, STATX_ATTR_APPEND) ||
+        HasAttribute(entry, STATX_ATTR_MOUNT_ROOT) || strcmp(name, ".") == 0 || strcmp(name, "..") == 0) {
+        return false;
+    }
+    struct statx dir;
+    if (PassDirStat(pass, &dir) != 0 || HasAttribute(dir, STATX_ATTR_APPEND)) {
+        return false;
+    }
+    if (pass->dirWriteSearch < 0) {
+        pass->dirWriteSearch = ParentWriteSearch(pass->dirPath.c_str(), dir, who) ? 1 : 0;
+    }
+    return pass->dirWriteSearch == 1 && StickyAllows(dir, entry, who);
+}
+
 // MayDelete, with the parent's facts evaluated once per parent.
 bool FastMayDelete(const char *path, const struct statx &entry, const acl::Identity &who) {
     std::string parent;
@@ -219,22 +256,24 @@ bool FastMayDelete(const char *path, const struct statx &entry, const acl::Ident
         // Without a unique mount id the cache would not see a remount: keep nothing then.
         facts.valid = (dir.stx_mask & acl::MountIdMask()) != 0;
     }
-    if (!facts.writeSearch) {
-        return false;
-    }
-    if ((dir.stx_mode & S_ISVTX) == 0) {
-        return true;
-    }
-    return entry.stx_uid == who.fsuid || dir.stx_uid == who.fsuid || who.fowner;  // check_sticky
+    return facts.writeSearch && StickyAllows(dir, entry, who);
 }
 
 // The mask from the evaluation: the same bits, in the same way, as KernelMask.
+// Inside a pass (pass and name set) the identity and the directory's facts are the pass's.
 int EvaluatedMask(const char *path, const struct statx &info, const acl::MountFacts &mount, const acl::Acl *entries,
-                  unsigned int *mask) {
-    acl::Identity who;
-    if (!acl::ReadIdentity(&who)) {
+                  unsigned int *mask, QUIBDirPass *pass, const char *name) {
+    acl::Identity own;
+    const acl::Identity *identity = &own;
+    if (pass != nullptr) {
+        identity = PassIdentity(pass);
+        if (identity == nullptr) {
+            return NORVO_FAIL_ERRNO(errno);
+        }
+    } else if (!acl::ReadIdentity(&own)) {
         return NORVO_FAIL_ERRNO(errno);
     }
+    const acl::Identity &who = *identity;
     const bool immutable = HasAttribute(info, STATX_ATTR_IMMUTABLE);
     const bool appendOnly = HasAttribute(info, STATX_ATTR_APPEND);
     const acl::Inode inode{info.stx_mode, info.stx_uid, info.stx_gid, immutable, entries};
@@ -257,7 +296,7 @@ int EvaluatedMask(const char *path, const struct statx &info, const acl::MountFa
     if (!mount.readOnly && !immutable && !appendOnly && (info.stx_uid == who.fsuid || who.fowner)) {
         result |= ACL_PERM_WRITE_ATTR | ACL_PERM_WRITE_ACL | ACL_PERM_CHANGE_OWNER;
     }
-    if (FastMayDelete(path, info, who)) {
+    if (pass != nullptr ? PassMayDelete(pass, name, info, who) : FastMayDelete(path, info, who)) {
         result |= ACL_PERM_DELETE;
     }
     *mask = result;
@@ -307,9 +346,11 @@ int QUIBACLPermGet(const char *path, unsigned int *mask) {
         return NORVO_FAIL_ERRNO(err);
     }
     return Guarded(-1, [&] {
+        const char *name = nullptr;
+        QUIBDirPass *pass = PassOf(path, &name);
         struct statx info;
-        if (statx(AT_FDCWD, path, AT_SYMLINK_NOFOLLOW, kInodeMask | acl::MountIdMask(), &info) != 0) {
-            return NORVO_FAIL_ERRNO(errno);
+        if (const int err = StatEntry(path, pass, name, kInodeMask | acl::MountIdMask(), &info); err != 0) {
+            return NORVO_FAIL_ERRNO(err);
         }
         const bool link = S_ISLNK(info.stx_mode);
         const std::string target = link ? ProbeTargetOf(path, info) : std::string();
@@ -333,7 +374,7 @@ int QUIBACLPermGet(const char *path, unsigned int *mask) {
                 return NORVO_FAIL_ERRNO(errno);
             }
         } else {
-            read = ReadAcl(path, false, &entries);
+            read = ReadAcl(path, false, &entries, pass, name);
             switch (read) {
             case AclRead::kNone:
             case AclRead::kFound:
@@ -351,7 +392,7 @@ int QUIBACLPermGet(const char *path, unsigned int *mask) {
         if (!generic || read == AclRead::kMalformed) {
             return KernelMask(path, info, mount, mask);
         }
-        return EvaluatedMask(path, info, mount, read == AclRead::kFound ? &entries : nullptr, mask);
+        return EvaluatedMask(path, info, mount, read == AclRead::kFound ? &entries : nullptr, mask, pass, name);
     });
 }
 
@@ -364,10 +405,16 @@ int QUIBACLIsSupport(const char *path, int fd, int flags) {
     }
     return Guarded(-1, [&] {
         struct statx info;
-        const int got = fd >= 0 ? statx(fd, "", AT_EMPTY_PATH, STATX_TYPE | acl::MountIdMask(), &info)
-                                : statx(AT_FDCWD, path, AT_SYMLINK_NOFOLLOW, STATX_TYPE | acl::MountIdMask(), &info);
-        if (got != 0) {
-            return NORVO_FAIL_ERRNO(errno);
+        if (fd >= 0) {
+            if (statx(fd, "", AT_EMPTY_PATH, STATX_TYPE | acl::MountIdMask(), &info) != 0) {
+                return NORVO_FAIL_ERRNO(errno);
+            }
+        } else {
+            const char *name = nullptr;
+            QUIBDirPass *pass = PassOf(path, &name);
+            if (const int err = StatEntry(path, pass, name, STATX_TYPE | acl::MountIdMask(), &info); err != 0) {
+                return NORVO_FAIL_ERRNO(err);
+            }
         }
         std::string target;
         if (fd >= 0) {

@@ -1,5 +1,6 @@
 // VLIBCFileLStat: one statx system call per file. statx is the only call that reports a birth
-// time, and asking it for exactly the fields wanted spares network file systems the rest.
+// time, and asking it for exactly the fields wanted spares network file systems the rest. Inside
+// a directory pass the entry's statx is the pass's, shared with the other calls about it.
 #include <errno.h>
 #include <fcntl.h>
 #include <stdint.h>
@@ -7,6 +8,7 @@
 
 #include <limits>
 
+#include "dir_pass.h"
 #include "fs_path.h"
 #include "quib_stat.h"
 
@@ -38,9 +40,16 @@ extern "C" int VLIBCFileLStat(const char *path, int flags, PQUIBSTAT st) {
     }
     const bool wantCrtime = (flags & QUIB_STAT_CRTIME) != 0;
     struct statx info;
-    const unsigned mask = np::kBasicFields | (wantCrtime ? STATX_BTIME : 0u);
-    if (statx(AT_FDCWD, path, AT_SYMLINK_NOFOLLOW | AT_NO_AUTOMOUNT, mask, &info) != 0) {
-        return NORVO_FAIL_ERRNO(errno);
+    const char *name = nullptr;
+    if (QUIBDirPass *pass = np::PassOf(path, &name)) {
+        if (const int err = np::PassEntryStat(pass, name, &info); err != 0) {
+            return NORVO_FAIL_ERRNO(err);
+        }
+    } else {
+        const unsigned mask = np::kBasicFields | (wantCrtime ? STATX_BTIME : 0u);
+        if (statx(AT_FDCWD, path, AT_SYMLINK_NOFOLLOW | AT_NO_AUTOMOUNT, mask, &info) != 0) {
+            return NORVO_FAIL_ERRNO(errno);
+        }
     }
     QUIBSTAT out{};
     out.st_mode = info.stx_mode;

@@ -1,5 +1,5 @@
-// Descriptors that close themselves, and whole-file reads under the shared flock that the
-// appliance's settings readers take.
+// Descriptors that close themselves, and the whole-file reads of the appliance's settings
+// readers.
 #pragma once
 #include <string>
 

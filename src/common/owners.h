@@ -5,6 +5,7 @@
 
 #include <memory>
 
+#include "quib_dir_pass.h"
 #include "quib_sdk_share.h"
 #include "quib_share.h"
 #include "quib_user.h"
@@ -42,6 +43,9 @@ struct SdkShareRelease {
 struct DirClose {
     void operator()(DIR *d) const { closedir(d); }
 };
+struct DirPassEnd {
+    void operator()(QUIBDirPass *p) const { QUIBDirPassEnd(p); }
+};
 
 using ShareRecord = std::unique_ptr<QUIBSHARE, ShareFree>;
 using UserRecord = std::unique_ptr<QUIBUSER, UserFree>;
@@ -52,6 +56,7 @@ using UserDB = std::unique_ptr<QUIBUSER_DB, UserDBClose>;
 using GroupDB = std::unique_ptr<QUIBGROUP_DB, GroupDBClose>;
 using CString = std::unique_ptr<char, MallocFree>;
 using DirHandle = std::unique_ptr<DIR, DirClose>;
+using DirPass = std::unique_ptr<QUIBDirPass, DirPassEnd>;
 using SdkShare = std::unique_ptr<SDK::Share, SdkShareRelease>;
 
 // The record slot a platform cursor refills in place: the cursor frees the record passed in

@@ -140,6 +140,9 @@ int NvoEnum::NvoLibDirEntryListEnum(const char *userPath, const char *realPath, 
         if (deferred) {
             scope.emplace();
         }
+        // Lets the entries' stat, ACL mask and ACL support share one statx each. Without it (it
+        // can't be opened) the answers are the same, only dearer.
+        norvo::DirPass pass(QUIBDirPassBegin(realPath));
         while (const struct dirent *found = readdir(dir.get())) {
             const char *name = found->d_name;
             if (QUIBEAIsHiddenFile(name) == 1 || !PassesAll(conditions, name)) {
@@ -155,6 +158,7 @@ int NvoEnum::NvoLibDirEntryListEnum(const char *userPath, const char *realPath, 
                                           fillInfo, entry);
             if (kept < 0) {
                 out.pop_back();
+                pass.reset();
                 scope.reset();
                 if (deferred) {
                     SetPaths(out, userPath, realPath, fillInfo);
@@ -166,6 +170,7 @@ int NvoEnum::NvoLibDirEntryListEnum(const char *userPath, const char *realPath, 
             }
         }
         dir.reset();
+        pass.reset();
         scope.reset();
         if (sortKey != nullptr) {
             EntryListSort(out, sortKey);

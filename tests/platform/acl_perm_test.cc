@@ -21,7 +21,9 @@
 
 #include "appliance.h"
 #include "platform_test_util.h"
+#include "quib_dir_pass.h"
 #include "quib_fs.h"
+#include "quib_stat.h"
 
 namespace {
 
@@ -249,6 +251,68 @@ TEST_F(AclPerm, AgreesWithTheKernelForEveryUser) {
                 MakeTree(appliance_, "/volume1/" + std::string(user) + std::to_string(seed), seed);
             ASSERT_FALSE(entries.empty());
             EXPECT_EQ(appliance_.RunAs(user, [&] { return CountDisagreements(entries); }), 0) << user << " " << seed;
+        }
+    }
+}
+
+// Everything the file calls answer about path: the stat, the mask and the ACL support, or the
+// error slot of each failure.
+std::string AnswersAbout(const std::string &path) {
+    QUIBSTAT st{};
+    unsigned mask = 0;
+    std::string out;
+    if (VLIBCFileLStat(path.c_str(), QUIB_STAT_BASIC | QUIB_STAT_CRTIME, &st) == 0) {
+        out += std::to_string(st.st_mode) + " " + std::to_string(st.st_uid) + " " + std::to_string(st.st_gid) + " " +
+               std::to_string(st.st_size) + " " + std::to_string(st.st_mtim.tv_sec) + "." +
+               std::to_string(st.st_mtim.tv_nsec) + " " + std::to_string(st.st_crtim.tv_sec);
+    } else {
+        out += "stat error " + std::to_string(VLIBCErrGet());
+    }
+    out += QUIBACLPermGet(path.c_str(), &mask) == 0 ? " mask " + std::to_string(mask)
+                                                    : " mask error " + std::to_string(VLIBCErrGet());
+    const int support = QUIBACLIsSupport(path.c_str(), -1, 2);
+    out += " support " + std::to_string(support) + (support < 0 ? " " + std::to_string(VLIBCErrGet()) : "");
+    return out;
+}
+
+// The number of entries (links and missing names among them) whose answers inside a pass over
+// their directory differ from the answers outside one.
+int CountPassDifferences(const std::vector<std::string> &entries) {
+    int differences = 0;
+    for (const std::string &entry : entries) {
+        const std::string dir = entry.substr(0, entry.rfind('/'));
+        const std::vector<std::string> paths = {entry, dir + "/link", dir + "/missing", entry + "/child"};
+        std::vector<std::string> outside;
+        for (const std::string &path : paths) outside.push_back(AnswersAbout(path));
+        QUIBDirPass *pass = QUIBDirPassBegin(dir.c_str());
+        if (pass == nullptr) {
+            // Only a directory the caller can't reach has no pass.
+            if (VLIBCErrGet() != QUIB_ERR_ACCESS_DENIED) ++differences;
+            continue;
+        }
+        for (size_t i = 0; i < paths.size(); ++i) {
+            const std::string inside = AnswersAbout(paths[i]);
+            if (inside != outside[i]) {
+                fprintf(stderr, "%s: outside [%s], inside [%s]\n", paths[i].c_str(), outside[i].c_str(), inside.c_str());
+                ++differences;
+            }
+        }
+        QUIBDirPassEnd(pass);
+    }
+    return std::min(differences, 100);
+}
+
+// A pass changes what the calls cost, never what they answer.
+TEST_F(AclPerm, APassAnswersAsTheCallsDoAlone) {
+    for (const unsigned seed : {1u, 2u}) {
+        for (const char *user : {"root", "alice", "bob", "admin"}) {
+            const std::string root = "/volume1/pass-" + std::string(user) + std::to_string(seed);
+            const std::vector<std::string> entries = MakeTree(appliance_, root, seed);
+            ASSERT_FALSE(entries.empty());
+            for (int d = 0; d < 12; ++d) {
+                ASSERT_EQ(symlink("e0", (root + "/d" + std::to_string(d) + "/link").c_str()), 0);
+            }
+            EXPECT_EQ(appliance_.RunAs(user, [&] { return CountPassDifferences(entries); }), 0) << user << " " << seed;
         }
     }
 }
