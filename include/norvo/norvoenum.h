@@ -185,7 +185,6 @@ public:
     // number of at most 32 bits (line 606); the ids before that element stay appended.
     int EnumUserGroups(std::list<unsigned int> &gids, std::string user);
 
-    // The name caches, which live as long as this object.
     // Lists one directory for a user: entries not hidden and passing every condition (asked
     // with the bare name), filled as info asks (widened by the sort key), sorted by sortKey,
     // reversed unless ascending, counted into *total, then cut to the page [offset, +limit)
@@ -213,6 +212,7 @@ public:
     // number, walks backward around the ring). limit 0 leaves the list as it is.
     void NvoLibDirEntrySlice(std::list<DIRENTRY_INFO> &list, unsigned long offset, unsigned long limit);
 
+    // The name caches, which live as long as this object.
     NorvoUserEnum &UserEnum() { return userEnum_; }
 
 private:

@@ -4,9 +4,12 @@
 #include <string.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <list>
+#include <numeric>
 #include <optional>
 #include <string>
+#include <vector>
 
 #include "common/log.h"
 #include "common/modules.h"
@@ -15,7 +18,9 @@
 #include "norvo/errors.h"
 #include "norvo/norvoenum.h"
 #include "norvo/norvosearch.h"
+#include "norvoenum/entry_order.h"
 #include "norvoenum/info_flags.h"
+#include "norvoenum/kept_entries.h"
 #include "norvoenum/listing_scope.h"
 #include "norvoenum/remote_mount.h"
 #include "quib_fs.h"
@@ -74,6 +79,36 @@ void SetPaths(std::list<DIRENTRY_INFO> &out, const char *userPath, const char *r
     }
 }
 
+// A fresh record in place of the last one, keeping its strings' buffers for the next fill.
+DIRENTRY_INFO &FreshRecord(DIRENTRY_INFO &record) {
+    std::string name = std::move(record.name);
+    std::string type = std::move(record.type);
+    std::string user = std::move(record.user);
+    std::string group = std::move(record.group);
+    record = DIRENTRY_INFO{};
+    name.clear();
+    type.clear();
+    user.clear();
+    group.clear();
+    record.name = std::move(name);
+    record.type = std::move(type);
+    record.user = std::move(user);
+    record.group = std::move(group);
+    return record;
+}
+
+// What a failed listing leaves in out: the records kept so far, in the reader's order, with
+// their paths, as they would be had each gone into the list when it was filled.
+void RestoreInReaderOrder(const norvo::KeptEntries &kept, const char *userPath, const char *realPath, int fillInfo,
+                          std::list<DIRENTRY_INFO> &out) {
+    std::list<DIRENTRY_INFO> records;
+    for (size_t i = 0; i < kept.Size(); ++i) {
+        kept.Restore(i, records.emplace_back());
+    }
+    SetPaths(records, userPath, realPath, fillInfo);
+    out.splice(out.end(), records);
+}
+
 }  // namespace
 
 int NvoEnum::NvoLibDirEntryListEnum(const char *userPath, const char *realPath, const char *sortKey, int info,
@@ -91,7 +126,13 @@ int NvoEnum::NvoLibDirEntryListEnum(const char *userPath, const char *realPath, 
         return 0;
     }
     *total = 0;
-    bool deferred = false;
+    const int fillInfo = norvo::WidenInfoBySortKey(sortKey, info);
+    const norvo::SortRule rule = norvo::SortRuleOf(sortKey != nullptr ? sortKey : "");
+    // Into an empty list, the kept records wait compactly (kept) and only the page becomes
+    // records, with their paths; records the caller passed in are sorted with the new ones, so
+    // then every record is built in the list itself.
+    const bool compact = out.empty();
+    std::optional<norvo::KeptEntries> kept;
     try {
         if (chdir(realPath) != 0) {
             NvoLibSetErr(EnterError(realPath, errno));
@@ -125,7 +166,6 @@ int NvoEnum::NvoLibDirEntryListEnum(const char *userPath, const char *realPath, 
             NvoLibSetErr(NVO_ERR_ACCESS);
             return 0;
         }
-        const int fillInfo = norvo::WidenInfoBySortKey(sortKey, info);
         // The child paths reuse one buffer each: only the name part changes per entry.
         std::string realChild(realPath);
         realChild += '/';
@@ -133,11 +173,10 @@ int NvoEnum::NvoLibDirEntryListEnum(const char *userPath, const char *realPath, 
         std::string userChild(userPath);
         userChild += '/';
         const size_t userBase = userChild.size();
-        // Into an empty list, the kept records get their paths at the end, after the page is cut
-        // (SetPaths); records the caller passed in are never touched that way.
-        deferred = out.empty();
         std::optional<norvo::ListingScope> scope;
-        if (deferred) {
+        DIRENTRY_INFO scratch;  // the record being filled, when kept compactly
+        if (compact) {
+            kept.emplace(rule);
             scope.emplace();
         }
         // Lets the entries' stat, ACL mask and ACL support share one statx each. Without it (it
@@ -152,46 +191,68 @@ int NvoEnum::NvoLibDirEntryListEnum(const char *userPath, const char *realPath, 
             realChild += name;
             userChild.resize(userBase);
             userChild += name;
-            // Filled in place, so the record's strings are built once.
-            DIRENTRY_INFO &entry = out.emplace_back();
-            const int kept = FillFileInfo(userChild.c_str(), realChild.c_str(), name, type, found->d_type,
-                                          fillInfo, entry);
-            if (kept < 0) {
+            DIRENTRY_INFO &entry = compact ? FreshRecord(scratch) : out.emplace_back();
+            const int result = FillFileInfo(userChild.c_str(), realChild.c_str(), name, type, found->d_type,
+                                            fillInfo, entry);
+            const bool keep = result == 0 || (result > 0 && entry.mount_point_type == "remotefail");
+            if (compact && result >= 0 && keep) {
+                kept->Add(entry);
+            } else if (!compact && (result < 0 || !keep)) {
                 out.pop_back();
+            }
+            if (result < 0) {
                 pass.reset();
                 scope.reset();
-                if (deferred) {
-                    SetPaths(out, userPath, realPath, fillInfo);
+                if (compact) {
+                    RestoreInReaderOrder(*kept, userPath, realPath, fillInfo, out);
                 }
                 return 0;
-            }
-            if (kept != 0 && entry.mount_point_type != "remotefail") {
-                out.pop_back();
             }
         }
         dir.reset();
         pass.reset();
         scope.reset();
+        if (!compact) {
+            if (sortKey != nullptr) {
+                EntryListSort(out, sortKey);
+            }
+            // Descending order reverses the whole list, ties and the folders-first rule included.
+            if (!ascending) {
+                out.reverse();
+            }
+            *total = out.size();
+            if (limit != 0) {
+                NvoLibDirEntrySlice(out, offset, limit);
+            }
+            return 1;
+        }
+        // The same steps on the kept records' positions.
+        std::vector<size_t> order;
         if (sortKey != nullptr) {
-            EntryListSort(out, sortKey);
+            order = norvo::SortedPositions(kept->Size(), rule, [&](size_t i) { return kept->FactsAt(i); });
+        } else {
+            order.resize(kept->Size());
+            std::iota(order.begin(), order.end(), size_t{0});
         }
-        // Descending order reverses the whole list, ties and the folders-first rule included.
         if (!ascending) {
-            out.reverse();
+            std::reverse(order.begin(), order.end());
         }
-        *total = out.size();
-        if (limit != 0) {
-            NvoLibDirEntrySlice(out, offset, limit);
+        size_t first = 0;
+        size_t last = 0;
+        norvo::PageRange(order.size(), offset, limit, &first, &last);
+        std::list<DIRENTRY_INFO> page;
+        for (size_t i = first; i < last; ++i) {
+            kept->Restore(order[i], page.emplace_back());
         }
-        if (deferred) {
-            SetPaths(out, userPath, realPath, fillInfo);
-        }
+        SetPaths(page, userPath, realPath, fillInfo);
+        out.splice(out.end(), page);
+        *total = order.size();
         return 1;
     } catch (...) {
         // Only memory can run out here.
-        if (deferred) {
+        if (kept.has_value()) {
             try {
-                SetPaths(out, userPath, realPath, norvo::WidenInfoBySortKey(sortKey, info));
+                RestoreInReaderOrder(*kept, userPath, realPath, fillInfo, out);
             } catch (...) {
             }
         }

@@ -11,24 +11,13 @@
 #include <vector>
 
 #include "norvo/norvoenum.h"
+#include "norvoenum/entry_order.h"
 #include "vlibc_unicode.h"
 
 namespace {
 
-enum Rule { kByName, kBySize, kByMtime, kByCrtime, kByCtime, kByAtime, kByUser, kByGroup, kByPosix, kByType };
-
-Rule RuleOf(const std::string &key) {
-    static const std::pair<const char *, Rule> kKeys[] = {
-        {"size", kBySize}, {"mtime", kByMtime}, {"crtime", kByCrtime}, {"ctime", kByCtime}, {"atime", kByAtime},
-        {"user", kByUser}, {"group", kByGroup}, {"posix", kByPosix},   {"type", kByType},
-    };
-    for (const auto &entry : kKeys) {
-        if (key == entry.first) {
-            return entry.second;
-        }
-    }
-    return kByName;
-}
+using norvo::SortFacts;
+using norvo::SortRule;
 
 // Decides a and b when the values differ; otherwise leaves the decision to the name.
 template <typename T>
@@ -42,57 +31,75 @@ bool Differ(T a, T b, bool *before) {
 
 }  // namespace
 
-EnumCompare::EnumCompare(std::string key) : key_(std::move(key)), rule_(RuleOf(key_)) {}
+namespace norvo {
+
+SortRule SortRuleOf(const std::string &key) {
+    static const std::pair<const char *, SortRule> kKeys[] = {
+        {"size", SortRule::kSize},   {"mtime", SortRule::kMtime}, {"crtime", SortRule::kCrtime},
+        {"ctime", SortRule::kCtime}, {"atime", SortRule::kAtime}, {"user", SortRule::kUser},
+        {"group", SortRule::kGroup}, {"posix", SortRule::kPosix}, {"type", SortRule::kType},
+    };
+    for (const auto &entry : kKeys) {
+        if (key == entry.first) {
+            return entry.second;
+        }
+    }
+    return SortRule::kName;
+}
+
+}  // namespace norvo
+
+EnumCompare::EnumCompare(std::string key) : key_(std::move(key)), rule_(static_cast<int>(norvo::SortRuleOf(key_))) {}
 
 bool EnumCompare::operator()(const DIRENTRY_INFO &a, const DIRENTRY_INFO &b) const {
     if (a.isdir != b.isdir) {
         return a.isdir;
     }
     bool before = false;
-    switch (rule_) {
-    case kBySize:
+    switch (static_cast<SortRule>(rule_)) {
+    case SortRule::kSize:
         // Folders carry no meaningful size: they stay in name order.
         if (!a.isdir && Differ(a.size, b.size, &before)) {
             return before;
         }
         break;
-    case kByMtime:
+    case SortRule::kMtime:
         if (Differ(a.mtime, b.mtime, &before)) {
             return before;
         }
         break;
-    case kByCrtime:
+    case SortRule::kCrtime:
         if (Differ(a.crtime, b.crtime, &before)) {
             return before;
         }
         break;
-    case kByCtime:
+    case SortRule::kCtime:
         if (Differ(a.ctime, b.ctime, &before)) {
             return before;
         }
         break;
-    case kByAtime:
+    case SortRule::kAtime:
         if (Differ(a.atime, b.atime, &before)) {
             return before;
         }
         break;
     // By number on purpose: the owner's id, not the owner's name, orders "user" and "group".
-    case kByUser:
+    case SortRule::kUser:
         if (Differ(a.uid, b.uid, &before)) {
             return before;
         }
         break;
-    case kByGroup:
+    case SortRule::kGroup:
         if (Differ(a.gid, b.gid, &before)) {
             return before;
         }
         break;
-    case kByPosix:
+    case SortRule::kPosix:
         if (Differ(a.mode & 0x1FFu, b.mode & 0x1FFu, &before)) {
             return before;
         }
         break;
-    case kByType: {
+    case SortRule::kType: {
         const int order = VLIBCUnicodeUTF8StrCaseCmp(a.type.c_str(), b.type.c_str());
         if (order != 0) {
             return order < 0;
@@ -108,13 +115,15 @@ bool EnumCompare::operator()(const DIRENTRY_INFO &a, const DIRENTRY_INFO &b) con
 namespace {
 
 // One record as the sort sees it: the deciding facts copied out, so comparisons touch a small
-// array instead of the list's nodes. The order is exactly EnumCompare's: directories first, then
+// array instead of the records. The order is exactly EnumCompare's: directories first, then
 // the rule's field, then the case-insensitive name. Each name's ASCII prefix is also kept
 // lower-cased (in one shared buffer): VLIBCUnicodeUTF8StrCaseCmp compares exactly those bytes
 // while both names are ASCII, so a difference there, or two whole ASCII names, decide as the
 // function would. Any other pair asks the function itself.
 struct SortRef {
-    std::list<DIRENTRY_INFO>::iterator it;
+    size_t position;
+    const char *name;
+    const char *type;
     int64_t value;        // the rule's field (0 where the rule doesn't look)
     size_t foldedAt;      // offset of the name's lower-cased ASCII prefix in the buffer
     uint32_t foldedSize;  // its length
@@ -122,46 +131,23 @@ struct SortRef {
     bool isdir;
 };
 
-int64_t ValueOf(Rule rule, const DIRENTRY_INFO &entry) {
-    switch (rule) {
-    case kBySize:
-        return entry.isdir ? 0 : static_cast<int64_t>(entry.size);
-    case kByMtime:
-        return entry.mtime;
-    case kByCrtime:
-        return entry.crtime;
-    case kByCtime:
-        return entry.ctime;
-    case kByAtime:
-        return entry.atime;
-    case kByUser:
-        return entry.uid;
-    case kByGroup:
-        return entry.gid;
-    case kByPosix:
-        return entry.mode & 0x1FFu;
-    default:
-        return 0;
-    }
-}
-
 class RefLess {
 public:
-    RefLess(Rule rule, const std::string &folded) : rule_(rule), folded_(folded.data()) {}
+    RefLess(SortRule rule, const std::string &folded) : rule_(rule), folded_(folded.data()) {}
 
     bool operator()(const SortRef &a, const SortRef &b) const {
         if (a.isdir != b.isdir) {
             return a.isdir;
         }
-        if (rule_ == kBySize) {
+        if (rule_ == SortRule::kSize) {
             // Sizes are unsigned: compare as such (folders carry 0 and so stay in name order).
             const auto sa = static_cast<uint64_t>(a.value);
             const auto sb = static_cast<uint64_t>(b.value);
             if (sa != sb) {
                 return sa < sb;
             }
-        } else if (rule_ == kByType) {
-            const int order = VLIBCUnicodeUTF8StrCaseCmp(a.it->type.c_str(), b.it->type.c_str());
+        } else if (rule_ == SortRule::kType) {
+            const int order = VLIBCUnicodeUTF8StrCaseCmp(a.type, b.type);
             if (order != 0) {
                 return order < 0;
             }
@@ -178,19 +164,17 @@ public:
         if (a.ascii && b.ascii) {
             return a.foldedSize < b.foldedSize;
         }
-        return VLIBCUnicodeUTF8StrCaseCmp(a.it->name.c_str(), b.it->name.c_str()) < 0;
+        return VLIBCUnicodeUTF8StrCaseCmp(a.name, b.name) < 0;
     }
 
 private:
-    Rule rule_;
+    SortRule rule_;
     const char *folded_;
 };
 
-// Appends the lower-cased ASCII prefix of the name (as a C string: up to its first NUL) to folded:
-// its bytes before the first one of 0x80 or above. Returns its length; *whole tells whether it is
-// the whole C string.
-size_t FoldAsciiPrefix(const std::string &name, std::string *folded, bool *whole) {
-    const char *text = name.c_str();
+// Appends the lower-cased ASCII prefix of the C string text to folded: its bytes before the
+// first one of 0x80 or above. Returns its length; *whole tells whether it is all of text.
+size_t FoldAsciiPrefix(const char *text, std::string *folded, bool *whole) {
     size_t length = 0;
     while (text[length] != '\0' && static_cast<unsigned char>(text[length]) < 0x80) {
         const auto byte = static_cast<unsigned char>(text[length]);
@@ -201,37 +185,96 @@ size_t FoldAsciiPrefix(const std::string &name, std::string *folded, bool *whole
     return length;
 }
 
-// Sorts through the array of references, then relinks the nodes in that order (no record moves).
-// Throws only while building the array, before the list is touched.
-void SortByRefs(std::list<DIRENTRY_INFO> &list, Rule rule) {
-    std::vector<SortRef> refs;
-    refs.reserve(list.size());
-    std::string folded;
+// Sorts the list through SortedPositions, then relinks the nodes in that order (no record
+// moves). Throws only before the list is touched.
+void SortByPositions(std::list<DIRENTRY_INFO> &list, SortRule rule) {
+    std::vector<std::list<DIRENTRY_INFO>::iterator> nodes;
+    nodes.reserve(list.size());
     for (auto it = list.begin(); it != list.end(); ++it) {
-        SortRef ref{it, ValueOf(rule, *it), folded.size(), 0, false, it->isdir};
-        if (it->name.size() <= UINT32_MAX) {
-            ref.foldedSize = static_cast<uint32_t>(FoldAsciiPrefix(it->name, &folded, &ref.ascii));
-        }
-        refs.push_back(ref);
+        nodes.push_back(it);
     }
-    // The same strict weak order as EnumCompare, and stable like the list's own sort: the same
-    // result, ties in reader order.
-    std::stable_sort(refs.begin(), refs.end(), RefLess(rule, folded));
+    const std::vector<size_t> order =
+        norvo::SortedPositions(nodes.size(), rule, [&](size_t i) { return norvo::SortFactsOf(rule, *nodes[i]); });
     std::list<DIRENTRY_INFO> sorted;
-    for (const SortRef &ref : refs) {
-        sorted.splice(sorted.end(), list, ref.it);
+    for (const size_t position : order) {
+        sorted.splice(sorted.end(), list, nodes[position]);
     }
     list.swap(sorted);
 }
 
 }  // namespace
 
+namespace norvo {
+
+SortFacts SortFactsOf(SortRule rule, const DIRENTRY_INFO &entry) {
+    SortFacts facts{entry.name.c_str(), entry.type.c_str(), 0, entry.isdir};
+    switch (rule) {
+    case SortRule::kSize:
+        facts.value = entry.isdir ? 0 : static_cast<int64_t>(entry.size);
+        break;
+    case SortRule::kMtime:
+        facts.value = entry.mtime;
+        break;
+    case SortRule::kCrtime:
+        facts.value = entry.crtime;
+        break;
+    case SortRule::kCtime:
+        facts.value = entry.ctime;
+        break;
+    case SortRule::kAtime:
+        facts.value = entry.atime;
+        break;
+    case SortRule::kUser:
+        facts.value = entry.uid;
+        break;
+    case SortRule::kGroup:
+        facts.value = entry.gid;
+        break;
+    case SortRule::kPosix:
+        facts.value = entry.mode & 0x1FFu;
+        break;
+    default:
+        break;
+    }
+    return facts;
+}
+
+std::vector<size_t> SortedPositions(size_t count, SortRule rule, const std::function<SortFacts(size_t)> &factsAt) {
+    std::vector<SortRef> refs;
+    refs.reserve(count);
+    std::string folded;
+    for (size_t i = 0; i < count; ++i) {
+        const SortFacts facts = factsAt(i);
+        SortRef ref{i, facts.name, facts.type, facts.value, folded.size(), 0, false, facts.isdir};
+        const size_t before = folded.size();
+        const size_t length = FoldAsciiPrefix(facts.name, &folded, &ref.ascii);
+        if (length > UINT32_MAX) {  // never for a file name; compared by the function then
+            folded.resize(before);
+            ref.ascii = false;
+        } else {
+            ref.foldedSize = static_cast<uint32_t>(length);
+        }
+        refs.push_back(ref);
+    }
+    // The same strict weak order as EnumCompare, and stable like the list's own sort: the same
+    // result, ties in their first order.
+    std::stable_sort(refs.begin(), refs.end(), RefLess(rule, folded));
+    std::vector<size_t> order;
+    order.reserve(count);
+    for (const SortRef &ref : refs) {
+        order.push_back(ref.position);
+    }
+    return order;
+}
+
+}  // namespace norvo
+
 void NvoEnum::EntryListSort(std::list<DIRENTRY_INFO> &list, std::string key) {
     if (list.empty()) {
         return;
     }
     try {
-        SortByRefs(list, RuleOf(key));
+        SortByPositions(list, norvo::SortRuleOf(key));
         return;
     } catch (...) {
         // Out of memory for the references: the list is untouched; sort it in place instead.
