@@ -1,6 +1,7 @@
 #!/usr/bin/env bash
 # The whole-process time of `norvo ls` on a 1,000-entry directory against GNU `ls -l` of it,
-# both run as alice inside the appliance sandbox with hyperfine; prints the ratio.
+# inside the appliance sandbox with hyperfine: ls -l as alice (through setpriv) and as root;
+# prints the ratios of the medians.
 #   bench-listing.sh [BUILD-DIR]   (default build-bench; built optimised when missing)
 set -euo pipefail
 root=$(cd "$(dirname "$0")/.." && pwd)
@@ -13,8 +14,9 @@ norvo=$(cd "$build/tools" && pwd)/norvo
 sandbox=$(cd "$build/tools/sandbox" && pwd)/norvo-sandbox
 command -v hyperfine >/dev/null || { echo "bench-listing.sh: hyperfine is missing" >&2; exit 1; }
 
-work=$(mktemp -d)
-trap 'rm -rf "$work"' EXIT
+# Inside the sandbox /tmp is private: the results go beside the build.
+work=$(cd "$build" && pwd)/bench-listing
+rm -rf "$work" && mkdir -p "$work"
 # 1,000 entries: 950 files and 50 folders, several owners and modes.
 {
   echo "basic"
@@ -32,9 +34,9 @@ trap 'rm -rf "$work"' EXIT
 } > "$work/thousand.appliance"
 
 "$sandbox" --no-log "$work/thousand.appliance" -- \
-  hyperfine --style basic --warmup 5 --min-runs 50 --export-json "$work/result.json" \
+  hyperfine -N --style basic --warmup 5 --min-runs 100 --export-json "$work/result.json" \
   -n "norvo ls" "$norvo ls --user alice --sort name --limit 100 --info real_path,size,owner,time,perm,type,mount_point_type /public/thousand" \
-  -n "ls -l" "su -s /bin/sh alice -c 'ls -l /volume1/public/thousand' >/dev/null" \
+  -n "ls -l" "setpriv --reuid=alice --regid=users --init-groups ls -l /volume1/public/thousand" \
   -n "ls -l (as root)" "ls -l /volume1/public/thousand"
 
 python3 - "$work/result.json" <<'PY'
