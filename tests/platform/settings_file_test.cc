@@ -1,11 +1,13 @@
 // Settings files: what readers make of hand-written files, what writers keep, the errors,
 // and that concurrent writers neither tear a reader's view nor lose each other's updates.
 #include <limits.h>
+#include <signal.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
+#include <chrono>
 #include <filesystem>
 #include <fstream>
 #include <iterator>
@@ -269,7 +271,9 @@ TEST_F(SettingsFile, NoDescriptorLeaksOnAnyPath) {
 }
 
 // Runs body(index) in count children, calling between() until every child has exited; true
-// when each returned 0.
+// when each returned 0. Children still running after 30 s (the whole normally takes well under
+// a second) are stopped with SIGSEGV first, so that a sanitized build prints where each was
+// stuck, then killed; that counts as failure.
 template <typename Body, typename Between>
 bool InChildren(int count, Body body, Between between) {
     std::vector<pid_t> pids;
@@ -280,8 +284,19 @@ bool InChildren(int count, Body body, Between between) {
             _exit(body(i));
         }
     }
+    const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(30);
     bool ok = true;
     while (!pids.empty()) {
+        if (std::chrono::steady_clock::now() > deadline) {
+            ADD_FAILURE() << pids.size() << " writer(s) still running after 30 s";
+            for (const pid_t pid : pids) kill(pid, SIGSEGV);
+            sleep(2);
+            for (const pid_t pid : pids) {
+                kill(pid, SIGKILL);
+                waitpid(pid, nullptr, 0);
+            }
+            return false;
+        }
         between();
         int status = 0;
         pid_t done = waitpid(pids.back(), &status, WNOHANG);
