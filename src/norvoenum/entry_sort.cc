@@ -19,14 +19,35 @@ namespace {
 using norvo::SortFacts;
 using norvo::SortRule;
 
-// Decides a and b when the values differ; otherwise leaves the decision to the name.
-template <typename T>
-bool Differ(T a, T b, bool *before) {
-    if (a == b) {
+// Decides a and b by the folders-first rule and the rule's field: true with *before set when
+// they differ there; false when they tie, and the name decides.
+bool DecidedBeforeName(SortRule rule, const SortFacts &a, const SortFacts &b, bool *before) {
+    if (a.isdir != b.isdir) {
+        *before = a.isdir;
+        return true;
+    }
+    switch (rule) {
+    case SortRule::kName:
+        return false;
+    case SortRule::kSize:
+        // Sizes are unsigned: compared as such (folders carry 0 and so stay in name order).
+        if (static_cast<uint64_t>(a.value) != static_cast<uint64_t>(b.value)) {
+            *before = static_cast<uint64_t>(a.value) < static_cast<uint64_t>(b.value);
+            return true;
+        }
+        return false;
+    case SortRule::kType: {
+        const int order = VLIBCUnicodeUTF8StrCaseCmp(a.type, b.type);
+        *before = order < 0;
+        return order != 0;
+    }
+    default:
+        if (a.value != b.value) {
+            *before = a.value < b.value;
+            return true;
+        }
         return false;
     }
-    *before = a < b;
-    return true;
 }
 
 }  // namespace
@@ -52,62 +73,10 @@ SortRule SortRuleOf(const std::string &key) {
 EnumCompare::EnumCompare(std::string key) : key_(std::move(key)), rule_(static_cast<int>(norvo::SortRuleOf(key_))) {}
 
 bool EnumCompare::operator()(const DIRENTRY_INFO &a, const DIRENTRY_INFO &b) const {
-    if (a.isdir != b.isdir) {
-        return a.isdir;
-    }
+    const auto rule = static_cast<SortRule>(rule_);
     bool before = false;
-    switch (static_cast<SortRule>(rule_)) {
-    case SortRule::kSize:
-        // Folders carry no meaningful size: they stay in name order.
-        if (!a.isdir && Differ(a.size, b.size, &before)) {
-            return before;
-        }
-        break;
-    case SortRule::kMtime:
-        if (Differ(a.mtime, b.mtime, &before)) {
-            return before;
-        }
-        break;
-    case SortRule::kCrtime:
-        if (Differ(a.crtime, b.crtime, &before)) {
-            return before;
-        }
-        break;
-    case SortRule::kCtime:
-        if (Differ(a.ctime, b.ctime, &before)) {
-            return before;
-        }
-        break;
-    case SortRule::kAtime:
-        if (Differ(a.atime, b.atime, &before)) {
-            return before;
-        }
-        break;
-    // By number on purpose: the owner's id, not the owner's name, orders "user" and "group".
-    case SortRule::kUser:
-        if (Differ(a.uid, b.uid, &before)) {
-            return before;
-        }
-        break;
-    case SortRule::kGroup:
-        if (Differ(a.gid, b.gid, &before)) {
-            return before;
-        }
-        break;
-    case SortRule::kPosix:
-        if (Differ(a.mode & 0x1FFu, b.mode & 0x1FFu, &before)) {
-            return before;
-        }
-        break;
-    case SortRule::kType: {
-        const int order = VLIBCUnicodeUTF8StrCaseCmp(a.type.c_str(), b.type.c_str());
-        if (order != 0) {
-            return order < 0;
-        }
-        break;
-    }
-    default:
-        break;
+    if (DecidedBeforeName(rule, norvo::SortFactsOf(rule, a), norvo::SortFactsOf(rule, b), &before)) {
+        return before;
     }
     return VLIBCUnicodeUTF8StrCaseCmp(a.name.c_str(), b.name.c_str()) < 0;
 }
@@ -122,13 +91,10 @@ namespace {
 // function would. Any other pair asks the function itself.
 struct SortRef {
     size_t position;
-    const char *name;
-    const char *type;
-    int64_t value;        // the rule's field (0 where the rule doesn't look)
+    SortFacts facts;
     size_t foldedAt;      // offset of the name's lower-cased ASCII prefix in the buffer
     uint32_t foldedSize;  // its length
     bool ascii;           // the prefix is the whole name
-    bool isdir;
 };
 
 class RefLess {
@@ -136,23 +102,9 @@ public:
     RefLess(SortRule rule, const std::string &folded) : rule_(rule), folded_(folded.data()) {}
 
     bool operator()(const SortRef &a, const SortRef &b) const {
-        if (a.isdir != b.isdir) {
-            return a.isdir;
-        }
-        if (rule_ == SortRule::kSize) {
-            // Sizes are unsigned: compare as such (folders carry 0 and so stay in name order).
-            const auto sa = static_cast<uint64_t>(a.value);
-            const auto sb = static_cast<uint64_t>(b.value);
-            if (sa != sb) {
-                return sa < sb;
-            }
-        } else if (rule_ == SortRule::kType) {
-            const int order = VLIBCUnicodeUTF8StrCaseCmp(a.type, b.type);
-            if (order != 0) {
-                return order < 0;
-            }
-        } else if (a.value != b.value) {
-            return a.value < b.value;
+        bool before = false;
+        if (DecidedBeforeName(rule_, a.facts, b.facts, &before)) {
+            return before;
         }
         // The lower-cased ASCII prefixes decide where they differ, or where both are the whole
         // names; otherwise the function compares the names from the start.
@@ -164,7 +116,7 @@ public:
         if (a.ascii && b.ascii) {
             return a.foldedSize < b.foldedSize;
         }
-        return VLIBCUnicodeUTF8StrCaseCmp(a.name, b.name) < 0;
+        return VLIBCUnicodeUTF8StrCaseCmp(a.facts.name, b.facts.name) < 0;
     }
 
 private:
@@ -224,6 +176,7 @@ SortFacts SortFactsOf(SortRule rule, const DIRENTRY_INFO &entry) {
     case SortRule::kAtime:
         facts.value = entry.atime;
         break;
+    // By number on purpose: the owner's id, not the owner's name, orders "user" and "group".
     case SortRule::kUser:
         facts.value = entry.uid;
         break;
@@ -245,7 +198,7 @@ std::vector<size_t> SortedPositions(size_t count, SortRule rule, const std::func
     std::string folded;
     for (size_t i = 0; i < count; ++i) {
         const SortFacts facts = factsAt(i);
-        SortRef ref{i, facts.name, facts.type, facts.value, folded.size(), 0, false, facts.isdir};
+        SortRef ref{i, facts, folded.size(), 0, false};
         const size_t before = folded.size();
         const size_t length = FoldAsciiPrefix(facts.name, &folded, &ref.ascii);
         if (length > UINT32_MAX) {  // never for a file name; compared by the function then
