@@ -195,9 +195,9 @@ int NvoEnum::NvoLibDirEntryListEnum(const char *userPath, const char *realPath, 
             const int result = FillFileInfo(userChild.c_str(), realChild.c_str(), name, type, found->d_type,
                                             fillInfo, entry);
             const bool keep = result == 0 || (result > 0 && entry.mount_point_type == "remotefail");
-            if (compact && result >= 0 && keep) {
+            if (compact && keep) {
                 kept->Add(entry);
-            } else if (!compact && (result < 0 || !keep)) {
+            } else if (!compact && !keep) {
                 out.pop_back();
             }
             if (result < 0) {
