@@ -6,7 +6,6 @@
 // exactly as an open or unlink would. Inside a directory pass the entry's statx, the caller's
 // identity and the directory's facts are the pass's (dir_pass.h).
 #include <errno.h>
-#include <string.h>
 #include <fcntl.h>
 #include <linux/capability.h>
 #include <linux/magic.h>
@@ -65,15 +64,17 @@ std::string ProbeTargetOf(const char *path, const struct statx &info) {
     return parent;
 }
 
-// The entry's own side of may_delete: not immutable, append-only or a mount root, and not the
-// root, "." or ".." (what rmdir refuses). True with the parent's path when those pass.
+// The entry's own side of may_delete, for an entry named last in its directory: not immutable,
+// append-only or a mount root, and not "." or ".." (what rmdir refuses).
+bool EntryItselfMayGo(const struct statx &entry, std::string_view last) {
+    return !HasAttribute(entry, STATX_ATTR_IMMUTABLE) && !HasAttribute(entry, STATX_ATTR_APPEND) &&
+           !HasAttribute(entry, STATX_ATTR_MOUNT_ROOT) && last != "." && last != "..";
+}
+
+// The same for path, which must not be the root. True with the parent's path when all pass.
 bool EntryMayGo(const char *path, const struct statx &entry, std::string *parent) {
-    if (HasAttribute(entry, STATX_ATTR_IMMUTABLE) || HasAttribute(entry, STATX_ATTR_APPEND) ||
-        HasAttribute(entry, STATX_ATTR_MOUNT_ROOT)) {
-        return false;
-    }
     std::string_view last;
-    return SplitLastComponent(path, parent, &last) && last != "." && last != "..";
+    return SplitLastComponent(path, parent, &last) && EntryItselfMayGo(entry, last);
 }
 
 // Whether unlink or rmdir of path would pass the kernel's may_delete: write and search on the
@@ -216,8 +217,7 @@ bool StickyAllows(const struct statx &dir, const struct statx &entry, const acl:
 
 // MayDelete for an entry of a pass: the directory's facts are the pass's, judged once.
 bool PassMayDelete(QUIBDirPass *pass, const char *name, const struct statx &entry, const acl::Identity &who) {
-    if (HasAttribute(entry, STATX_ATTR_IMMUTABLE) || HasAttribute(entry, STATX_ATTR_APPEND) ||
-        HasAttribute(entry, STATX_ATTR_MOUNT_ROOT) || strcmp(name, ".") == 0 || strcmp(name, "..") == 0) {
+    if (!EntryItselfMayGo(entry, name)) {
         return false;
     }
     struct statx dir;
