@@ -14,6 +14,7 @@
 #include "common/log.h"
 #include "common/modules.h"
 #include "common/owners.h"
+#include "common/remote_mount.h"
 #include "common/text.h"
 #include "norvo/errors.h"
 #include "norvo/norvoenum.h"
@@ -22,7 +23,6 @@
 #include "norvoenum/info_flags.h"
 #include "norvoenum/kept_entries.h"
 #include "norvoenum/listing_scope.h"
-#include "norvoenum/remote_mount.h"
 #include "quib_fs.h"
 #include "quib_stat.h"
 

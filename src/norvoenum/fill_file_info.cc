@@ -7,11 +7,11 @@
 
 #include "common/log.h"
 #include "common/modules.h"
+#include "common/remote_mount.h"
 #include "norvo/errors.h"
 #include "norvo/norvoenum.h"
 #include "norvo/norvomisc.h"
 #include "norvoenum/listing_scope.h"
-#include "norvoenum/remote_mount.h"
 #include "quib_fs.h"
 #include "quib_stat.h"
 

@@ -115,10 +115,11 @@ TEST(LongPathRule, EncryptedSharesGetTheirOwnCode) {
     EXPECT_EQ(NvoParseQuibErrToError(0xC300, nullptr), 412);
     // A home path is never encrypted.
     EXPECT_EQ(NvoParseErrnoToError(ENAMETOOLONG, "/home/x", nullptr), 412);
-    // No share at all: the check fails (writing 408) and the answer is the plain code.
+    // No share at all: the plain code, and the translation leaves the slot and the log alone.
     NvoLibSetErr(0);
     EXPECT_EQ(NvoParseErrnoToError(ENAMETOOLONG, "/nowhere/x", nullptr), 412);
-    EXPECT_EQ(NvoLibGetErr(), 408);
+    EXPECT_EQ(NvoLibGetErr(), 0);
+    EXPECT_TRUE(app.ErrorLines().empty());
 }
 
 TEST(BusyRule, AMountPointIsAFolderBusyError) {

@@ -88,11 +88,11 @@ int Reference(const std::vector<int32_t> &p, size_t pi, const std::vector<int32_
 
 // Pieces texts are built from: ASCII in both cases, characters whose folding matters (Kelvin
 // sign and k, capital sharp s and ß, the three sigmas), invalid bytes (a stray trail byte, 0xFF,
-// a lead byte that eats what follows or is cut short by the end), an overlong '*', a code point
-// above U+10FFFF, and four-byte characters.
+// a lead byte that eats what follows or is cut short by the end), an overlong '*' and overlong
+// letters, a code point above U+10FFFF, and four-byte characters.
 const std::vector<std::string> kLetters = {
     "a", "A", "b", "B", "k", "s", ".", "\xC3\xA9", "\xC3\x89", "\xE2\x84\xAA", "\xE1\xBA\x9E", "\xC3\x9F",
-    "\xCE\xA3", "\xCF\x83", "\xCF\x82", "\x80", "\xFF", "\xC3", "\xE2\x84", "\xC0\xAA", "\xF4\x90\x80\x80",
+    "\xCE\xA3", "\xCF\x83", "\xCF\x82", "\x80", "\xFF", "\xC3", "\xE2\x84", "\xC0\xAA", "\xC1\x81", "\xC1\xA1", "\xF4\x90\x80\x80",
     "\xF0\x9F\x98\x80", "%"};
 const std::vector<std::string> kWild = {"*", "?", "\\", "**", "*?", "?*"};
 
@@ -191,6 +191,8 @@ TEST(Matcher, DescribedCases) {
         {"?", "\xF0\x9F\x98\x80", '\\', 1},             // one character, four bytes
         {"a?", "a\xC3", '\\', 1},                       // a cut-short sequence is one character
         {"\xC0\xAA", "anything", '\\', 1},              // an overlong '*' is a star
+        {"a", "\xC1\x81", '\\', 1},                    // an overlong 'A' folds on either side
+        {"\xC1\x81", "a", '\\', 1},
     };
     for (const Case &c : cases) {
         EXPECT_EQ(NvoLibStrLikeCompare(c.pattern, c.subject, c.esc), c.result)
