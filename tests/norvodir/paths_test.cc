@@ -78,6 +78,8 @@ TEST(Resolution, SharePathsAndFailures) {
         {"", "alice", nullptr, 400, 0xD00},
         {"/", "alice", nullptr, 401, 0x8100},
         {"/nosuch/a", "alice", nullptr, 408, 0x1400},
+        {"/photo/\xff", "alice", "/volume1/photo/\xff", 0, 0},  // bytes that are not UTF-8 are names too
+        {"/\xff/x", "alice", nullptr, 408, 0x1400},
     };
     for (const auto &row : table) {
         SCOPED_TRACE(row.path);
@@ -98,6 +100,8 @@ TEST(Resolution, SharePathsAndFailures) {
             }
         }
     }
+    // Over-long user paths are cut to the buffer, not refused.
+    EXPECT_EQ(Resolve(("/photo/" + std::string(5000, 'x')).c_str(), "alice").share, "photo");
     const Resolved r = Resolve("/archive/x", "alice");
     EXPECT_EQ(r.share, "archive");
     EXPECT_EQ(r.volume, "/volume2");
@@ -111,6 +115,7 @@ TEST(Resolution, SharePathsAndFailures) {
               (Lines{"norvodir.cpp(#) bad parameter, oldpath=, new path=", "norvodir.cpp(#) error path",
                      "norvodir.cpp:# NvoLibGetTokOfPath fail", "norvodir.cpp(#) error path",
                      "norvodir.cpp(#) NvoLibGetTokOfPath fail", "norvodir.cpp:# QUIBShareGet fail",
+                     "norvodir.cpp:# QUIBShareGet fail",
                      "norvodir.cpp(#) bad parameter, oldpath=(null), new path=",
                      "norvodir.cpp(#) bad parameter, oldpath=/photo, new path="}));
 }
