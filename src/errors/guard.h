@@ -7,18 +7,29 @@
 
 namespace norvo {
 
-// Runs body and returns its result. An escaping exception becomes failResult with the slot
-// set: 401 for bad_alloc (as ENOMEM maps), 400 for anything else (a bug, never a crash).
-template <typename R, typename F>
-R Guarded(R failResult, F &&body) noexcept {
+// Inside a catch handler: records the exception being handled in the slot, 401 for bad_alloc
+// (as ENOMEM maps) and 400 for anything else (a bug, never a crash), and gives failResult.
+// Entry points written as function-try-blocks end in `catch (...) { return Failed(x); }`.
+template <typename R>
+R Failed(R failResult) noexcept {
     try {
-        return body();
+        throw;
     } catch (const std::bad_alloc &) {
         NvoLibSetErr(NVO_ERR_SYSTEM);
     } catch (...) {
         NvoLibSetErr(NVO_ERR_GENERAL);
     }
     return failResult;
+}
+
+// Runs body and returns its result; an escaping exception gives failResult (see Failed).
+template <typename R, typename F>
+R Guarded(R failResult, F &&body) noexcept {
+    try {
+        return body();
+    } catch (...) {
+        return Failed(failResult);
+    }
 }
 
 // For entry points without a result: the slot alone tells the caller.
