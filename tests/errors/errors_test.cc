@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include "appliance.h"
+#include "errors/guard.h"
 #include "norvo/errors.h"
 
 namespace {
@@ -13,6 +14,15 @@ TEST(ErrorSlot, SetReturnsTheCodeAndGetReadsIt) {
     EXPECT_EQ(NvoLibGetErr(), 407);
     NvoLibSetErr(0);
     EXPECT_EQ(NvoLibGetErr(), 0);
+}
+
+// What every entry point answers instead of letting an exception out.
+TEST(ErrorSlot, TheGuardTurnsExceptionsIntoFailureAndACode) {
+    EXPECT_EQ(norvo::Guarded(-1, [] { return 7; }), 7);
+    EXPECT_EQ(norvo::Guarded(-1, []() -> int { throw std::bad_alloc(); }), -1);
+    EXPECT_EQ(NvoLibGetErr(), NVO_ERR_SYSTEM);
+    EXPECT_EQ(norvo::Guarded(-1, []() -> int { throw 1; }), -1);
+    EXPECT_EQ(NvoLibGetErr(), NVO_ERR_GENERAL);
 }
 
 TEST(ErrnoMapping, EveryErrnoMapsAsTabled) {
