@@ -1,0 +1,322 @@
+// The fault loop: every exported operation that takes platform resources runs with its Nth
+// platform or system call failing (tools/faults), for N = 1, 2, ... until it runs through
+// untouched. After every run nothing it took is left (descriptors, platform records; memory is
+// LeakSanitizer's in the sanitized build), a reported failure has a code in the error slot, and
+// no file is left half-written; the untouched run must give the right answer.
+#include <dirent.h>
+#include <errno.h>
+#include <limits.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <fstream>
+#include <functional>
+#include <map>
+#include <sstream>
+
+#include <gtest/gtest.h>
+
+#include "appliance.h"
+#include "faults.h"
+#include "norvo/norvo.h"
+#include "quib_fs.h"
+#include "quib_login.h"
+#include "quib_paths.h"
+#include "vlibc_err.h"
+#include "vlibc_file.h"
+
+namespace {
+
+using norvo::testing::Appliance;
+namespace fs = std::filesystem;
+
+// What one run of an operation gave.
+enum Outcome {
+    kRight,   // succeeded with the expected answer
+    kFailed,  // reported failure: the error slot must say why
+    kOther,   // succeeded with another answer (acceptable only while a call was made to fail)
+};
+
+Outcome Expect(bool ok, bool right) {
+    return !ok ? kFailed : right ? kRight : kOther;
+}
+
+// Where an operation says why it failed.
+enum Slot { kLibrarySlot, kPlatformSlot, kNoSlot };
+
+struct Op {
+    const char *name;
+    std::function<Outcome()> run;  // the call is made before its answer is looked at
+    Slot slot = kLibrarySlot;
+    std::function<void()> prepare;      // before each run: the state the run starts from
+    std::function<std::string()> torn;  // after each run: what is left half-written, or ""
+};
+
+void PrintTo(const Op &op, std::ostream *out) {
+    *out << op.name;
+}
+
+// Open descriptors with what they name, without the one reading the list.
+std::map<int, std::string> OpenDescriptors() {
+    std::map<int, std::string> open;
+    DIR *dir = opendir("/proc/self/fd");
+    while (const dirent *entry = readdir(dir)) {
+        const int fd = atoi(entry->d_name);
+        char target[PATH_MAX] = "";
+        if (entry->d_name[0] != '.' && fd != dirfd(dir) &&
+            readlink(("/proc/self/fd/" + std::string(entry->d_name)).c_str(), target, sizeof target - 1) >= 0) {
+            open[fd] = target;
+        }
+    }
+    closedir(dir);
+    return open;
+}
+
+std::string Read(const std::string &path) {
+    std::ifstream in(path, std::ios::binary);
+    std::stringstream text;
+    text << in.rdbuf();
+    return text.str();
+}
+
+void Write(const std::string &path, const std::string &text) {
+    std::ofstream(path, std::ios::binary | std::ios::trunc) << text;
+}
+
+// Temporaries a settings writer left beside file.
+std::string Leftovers(const std::string &file) {
+    const fs::path path(file);
+    std::string left;
+    for (const auto &entry : fs::directory_iterator(path.parent_path())) {
+        if (entry.path().filename().string().rfind("." + path.filename().string() + ".", 0) == 0) {
+            left += entry.path().string() + " ";
+        }
+    }
+    return left;
+}
+
+// A settings file must be the old or the new version, whole, with no temporary beside it.
+std::function<std::string()> OldOrNew(std::string file, std::string before, std::string after) {
+    return [=] {
+        const std::string text = Read(file);
+        return (text == before || text == after ? "" : "torn text: " + text) + Leftovers(file);
+    };
+}
+
+const std::string kDir = "/volume1/public/dir";
+const std::string kOldSettings = "# appliance\nuserHomeEnable=\"yes\"\nuserHomeRoot=\"/volume1/homes\"\n";
+char g_sid[64];
+
+void Login() {
+    ASSERT_EQ(QUIBLoginCreate("alice", "secret", "192.0.2.1", g_sid, sizeof g_sid), 0);
+}
+
+std::string Names(const std::list<DIRENTRY_INFO> &entries) {
+    std::string names;
+    for (const DIRENTRY_INFO &entry : entries) {
+        names += entry.name + " ";
+    }
+    return names;
+}
+
+const Op kOps[] = {
+    {"DirListing",
+     [] {
+         NvoEnum enumeration;
+         std::list<DIRENTRY_INFO> out;
+         unsigned long total = 0;
+         const int rc = enumeration.NvoLibDirEntryListEnum("/public/dir", kDir.c_str(), "name", 0xFF, 0, 0, true,
+                                                           DIR_ENTRY_TYPE_ALL, {}, out, &total);
+         return Expect(rc == 1, total == 2 && Names(out) == "sub a.txt ");
+     }},
+    {"ShareListing",
+     [] {
+         NvoEnum enumeration;
+         std::list<DIRENTRY_INFO> out;
+         unsigned long total = 0;
+         const int rc = enumeration.NvoLibShareEntryListEnum("alice", nullptr, false, "name", 0x1FF, 0, 0, true, out,
+                                                             &total);
+         return Expect(rc == 1, Names(out) == "home photo public secret ");
+     }},
+    {"Privilege",
+     [] {
+         int priv = -1;
+         unsigned flags = 99;
+         const bool ok = NvoLibGetPrivilege("/photo/a", "bob", nullptr, &priv, &flags) == 0;
+         return Expect(ok, priv == 1 && flags == 0);
+     }},
+    {"ValidShares",
+     [] {
+         PSZLIST list = NvoLibValidShareGen("alice", 1, 0);
+         const bool right = VLIBCSzListCount(list) == 3;
+         VLIBCSzListFree(list);
+         return Expect(list != nullptr, right);
+     }},
+    {"ShareChecks",
+     [] {
+         int type = 1;
+         const bool ok = CheckShareListPrivilege("bob", nullptr, "/photo/a") == 1 &&
+                         CheckShareDownloadPrivilege("bob", nullptr, "/photo/a") == 1 &&
+                         CheckShareUploadPrivilege("alice", nullptr, "/photo/a", &type) == 1;
+         return Expect(ok, type == 1);
+     },
+     kNoSlot},
+    {"EncryptedShare",
+     [] {
+         bool encrypted = false;
+         const bool ok = NvoLibCheckEncryptShare("secret", &encrypted) == 1;
+         return Expect(ok, encrypted);
+     }},
+    {"AclChecks",
+     [] {
+         const bool ok = ACLAccess((kDir + "/a.txt").c_str(), 0x1 | 0x2) == 0 && CheckDirListPrivilege(kDir.c_str()) == 1;
+         return Expect(ok, GetACLPrivilege((kDir + "/a.txt").c_str()) == ACL_PERM_ALL &&
+                               NvoLibFileSystemSupported(kDir.c_str()) == 1);
+     }},
+    {"FullPath",
+     [] {
+         std::string full, share, volume, sharePath;
+         const bool ok = NvoFullPathGet("/photo/a", full, share, volume, sharePath, "alice") == 1;
+         return Expect(ok, full == "/volume1/photo/a" && share == "photo" && sharePath == "/volume1/photo");
+     }},
+    {"HomePath",
+     [] {
+         std::string full, share, volume, sharePath;
+         const bool ok = NvoFullPathGet("/home/a", full, share, volume, sharePath, "alice") == 1;
+         return Expect(ok, full == "/volume1/homes/alice/a" && fs::is_directory("/volume1/homes/alice"));
+     },
+     kLibrarySlot, [] { fs::remove_all("/volume1/homes/alice"); }},
+    {"PathInfo",
+     [] {
+         PathInfo info;
+         const bool ok = PathInfoFactory::create("alice", "/public/dir", info) == 1;
+         return Expect(ok, info.fullPath == kDir);
+     }},
+    {"TransFullPath",
+     [] {
+         char out[256] = "";
+         const bool ok = NvoLibTransFullPath("/photo/a", out, sizeof out) == 0;
+         return Expect(ok, std::string(out) == "/volume1/photo/a");
+     },
+     kPlatformSlot},
+    {"CheckPath",
+     [] {
+         std::string existing;
+         const bool ok = NvoCheckPath((kDir + "/new/deeper").c_str(), true, 0x2, &existing) == 0;
+         return Expect(ok, existing == kDir);
+     }},
+    {"TmpDir",
+     [] {
+         const bool ok = NvoCreateTmpDir("/volume1") == 0;
+         return Expect(ok, fs::is_directory("/volume1/@tmp/norvo"));
+     },
+     kNoSlot, [] { fs::remove_all("/volume1/@tmp"); }},
+    {"SettingsSet",
+     [] { return Expect(VLIBCFileSetKeyValue(QUIB_INFO_CONF, "fault", "new", 0) == 0, true); }, kPlatformSlot,
+     [] { Write(QUIB_INFO_CONF, kOldSettings); },
+     OldOrNew(QUIB_INFO_CONF, kOldSettings, kOldSettings + "fault=\"new\"\n")},
+    {"SettingsRemove", [] { return Expect(VLIBCFileRemoveKey(QUIB_INFO_CONF, "fault") == 0, true); }, kPlatformSlot,
+     [] { Write(QUIB_INFO_CONF, kOldSettings + "fault=\"old\"\n"); },
+     OldOrNew(QUIB_INFO_CONF, kOldSettings + "fault=\"old\"\n", kOldSettings)},
+    {"LoginCreate",
+     [] {
+         g_sid[0] = '\0';
+         return Expect(QUIBLoginCreate("alice", "secret", "192.0.2.1", g_sid, sizeof g_sid) == 0, true);
+     },
+     kPlatformSlot, nullptr,
+     [] {
+         // A login either exists whole under its sid or not at all.
+         char user[64] = "";
+         const bool found = g_sid[0] != '\0' && QUIBLoginGet(g_sid, user, sizeof user) == 0;
+         return !found || std::string(user) == "alice" ? "" : "half a login: " + std::string(user);
+     }},
+    {"LoginLookup",
+     [] {
+         char user[64] = "";
+         const bool ok = QUIBLoginGet(g_sid, user, sizeof user) == 0 && QUIBLoginRemove(g_sid) == 0;
+         return Expect(ok, std::string(user) == "alice");
+     },
+     kPlatformSlot, Login},
+    {"Conditions",
+     [] {
+         std::vector<FileSearch::FindComp *> out;
+         bool ok = true;
+         for (auto [field, value] : {std::pair{FileSearch::FindFactory::FIND_FIELD_USER, "alice"},
+                                     {FileSearch::FindFactory::FIND_FIELD_GROUP, "staff"},
+                                     {FileSearch::FindFactory::FIND_FIELD_NAME, "a*,\"b\",c"}}) {
+             ok = ok && FileSearch::FindFactory::createFindOp(field, nullptr, value, out);
+         }
+         const size_t made = out.size();
+         for (FileSearch::FindComp *condition : out) {
+             delete condition;
+         }
+         return Expect(ok, made == 3);
+     }},
+    {"Accounts",
+     [] {
+         NvoEnum enumeration;
+         std::map<unsigned, _tag_USER_INFO_> users;
+         std::map<unsigned, _tag_GROUP_INFO_> groups;
+         std::list<unsigned> gids;
+         const bool ok = enumeration.EnumAllUsers(users, AUTH_ALL) == 1 &&
+                         enumeration.EnumAllGroups(groups, AUTH_ALL) == 1 &&
+                         enumeration.EnumUserGroups(gids, "alice") == 1;
+         const bool named = enumeration.UserEnum().GetUserNameByUID(0) == "root" &&
+                            enumeration.UserEnum().GetGroupNameByGID(0) == "root";
+         return Expect(ok, named && users.size() == 5 && groups.size() > 3 && gids.size() == 2);
+     },
+     kNoSlot},
+    {"MountStatus",
+     [] {
+         NorvoMountStatus mounts;
+         const bool ok = mounts.GetMountStatus() == 1;
+         return Expect(ok, mounts.getFSTYPE("/volume1") == FSTYPE_TMPFS);
+     }},
+};
+
+class FaultLoop : public ::testing::TestWithParam<Op> {
+protected:
+    Appliance app_;
+};
+
+TEST_P(FaultLoop, ReleasesEverythingAndSaysWhy) {
+    app_.Basic().WriteFile(kDir + "/a.txt", "hello", "alice").MakeDir(kDir + "/sub").MakeDir("/volume1/homes/alice");
+    Write(QUIB_INFO_CONF, kOldSettings);
+    openlog(nullptr, LOG_NDELAY, LOG_USER);  // the log connection is the process's, not a run's
+    const Op &op = GetParam();
+    constexpr long kMaxCalls = 5000;
+    for (long n = 1; n <= kMaxCalls; ++n) {
+        if (op.prepare) {
+            op.prepare();
+        }
+        NvoLibSetErr(0);
+        VLIBCErrSetEx(0, nullptr, 0);
+        const auto fds = OpenDescriptors();
+        const auto records = norvo::faults::LiveRecords();
+        norvo::faults::Arm(n, ENOMEM);
+        const Outcome outcome = op.run();
+        norvo::faults::Disarm();
+        const std::string failed = norvo::faults::Fired();
+        const int slot = op.slot == kPlatformSlot ? VLIBCErrGet() : NvoLibGetErr();
+        const std::string where = "failing call " + std::to_string(n) + " (" + failed + ")";
+        ASSERT_EQ(OpenDescriptors(), fds) << where;
+        ASSERT_EQ(norvo::faults::LiveRecords(), records) << where;
+        if (op.torn) {
+            ASSERT_EQ(op.torn(), "") << where;
+        }
+        if (failed.empty()) {
+            ASSERT_EQ(outcome, kRight) << "the run without a failure (" << n - 1 << " calls)";
+            return;
+        }
+        if (outcome == kFailed && op.slot != kNoSlot) {
+            ASSERT_NE(slot, 0) << where << " left the error slot empty";
+        }
+    }
+    FAIL() << "still failing calls after " << kMaxCalls;
+}
+
+INSTANTIATE_TEST_SUITE_P(Ops, FaultLoop, ::testing::ValuesIn(kOps),
+                         [](const ::testing::TestParamInfo<Op> &param) { return std::string(param.param.name); });
+
+}  // namespace
