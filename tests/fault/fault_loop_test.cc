@@ -47,9 +47,12 @@ Outcome Expect(bool ok, bool right) {
 enum Slot { kLibrarySlot, kPlatformSlot, kEitherSlot, kNoSlot };
 
 struct Op {
+    Op(const char *n, std::function<Outcome()> r, Slot s = kLibrarySlot, std::function<void()> p = nullptr,
+       std::function<std::string()> t = nullptr)
+        : name(n), run(std::move(r)), slot(s), prepare(std::move(p)), torn(std::move(t)) {}
     const char *name;
     std::function<Outcome()> run;  // the call is made before its answer is looked at
-    Slot slot = kLibrarySlot;
+    Slot slot;
     std::function<void()> prepare;      // before each run: the state the run starts from
     std::function<std::string()> torn;  // after each run: what is left half-written, or ""
 };
@@ -276,7 +279,8 @@ const Op kOps[] = {
          NorvoMountStatus mounts;
          const bool ok = mounts.GetMountStatus() == 1;
          return Expect(ok, mounts.getFSTYPE("/volume1") == FSTYPE_TMPFS);
-     }},
+     },
+     kPlatformSlot},
 };
 
 class FaultLoop : public ::testing::TestWithParam<Op> {

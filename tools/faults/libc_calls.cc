@@ -8,6 +8,7 @@
 #include <errno.h>
 #include <fcntl.h>
 #include <grp.h>
+#include <mntent.h>
 #include <pwd.h>
 #include <shadow.h>
 #include <stdarg.h>
@@ -70,6 +71,7 @@ SEAM_OPENAT(openat64)
 
 SEAM_CALL(FILE *, fopen, nullptr, (const char *path, const char *mode), (path, mode))
 SEAM_CALL(FILE *, fopen64, nullptr, (const char *path, const char *mode), (path, mode))
+SEAM_CALL(FILE *, setmntent, nullptr, (const char *path, const char *mode), (path, mode))
 SEAM_CALL(DIR *, opendir, nullptr, (const char *path), (path))
 SEAM_CALL(DIR *, fdopendir, nullptr, (int fd), (fd))
 SEAM_CALL(int, statx, -1, (int dir, const char *path, int flags, unsigned mask, struct statx *out),
