@@ -101,19 +101,21 @@ std::string Leftovers(const std::string &file) {
 }
 
 // A settings file must be the old or the new version, whole, with no temporary beside it.
-std::function<std::string()> OldOrNew(std::string file, std::string before, std::string after) {
+// The versions are the appliance's settings with or without a line of ours.
+std::string g_settings;
+std::function<std::string()> OldOrNew(std::string before, std::string after) {
     return [=] {
-        const std::string text = Read(file);
-        return (text == before || text == after ? "" : "torn text: " + text) + Leftovers(file);
+        const std::string text = Read(QUIB_INFO_CONF);
+        return (text == g_settings + before || text == g_settings + after ? "" : "torn text: " + text) +
+               Leftovers(QUIB_INFO_CONF);
     };
 }
 
 const std::string kDir = "/volume1/public/dir";
-const std::string kOldSettings = "# appliance\nuserHomeEnable=\"yes\"\nuserHomeRoot=\"/volume1/homes\"\n";
 char g_sid[64];
 
-void Login() {
-    ASSERT_EQ(QUIBLoginCreate("alice", "secret", "192.0.2.1", g_sid, sizeof g_sid), 0);
+void Login(const char *user) {
+    ASSERT_EQ(QUIBLoginCreate(user, "secret", "192.0.2.1", g_sid, sizeof g_sid), 0);
 }
 
 std::string Names(const std::list<DIRENTRY_INFO> &entries) {
@@ -150,6 +152,14 @@ const Op kOps[] = {
          const bool ok = NvoLibGetPrivilege("/photo/a", "bob", nullptr, &priv, &flags) == 0;
          return Expect(ok, priv == 1 && flags == 0);
      }},
+    {"DomainPrivilege",  // asked through the platform with the login's sid
+     [] {
+         int priv = -1;
+         unsigned flags = 99;
+         const bool ok = NvoLibGetPrivilege("/public/a", "CORP\\dave", g_sid, &priv, &flags) == 0;
+         return Expect(ok, priv == 2 && flags == 0);
+     },
+     kLibrarySlot, [] { g_sid[0] == '\0' ? Login("CORP\\dave") : void(); }},
     {"ValidShares",
      [] {
          PSZLIST list = NvoLibValidShareGen("alice", 1, 0);
@@ -221,11 +231,9 @@ const Op kOps[] = {
      kNoSlot, [] { fs::remove_all("/volume1/@tmp"); }},
     {"SettingsSet",
      [] { return Expect(VLIBCFileSetKeyValue(QUIB_INFO_CONF, "fault", "new", 0) == 0, true); }, kPlatformSlot,
-     [] { Write(QUIB_INFO_CONF, kOldSettings); },
-     OldOrNew(QUIB_INFO_CONF, kOldSettings, kOldSettings + "fault=\"new\"\n")},
+     [] { Write(QUIB_INFO_CONF, g_settings); }, OldOrNew("", "fault=\"new\"\n")},
     {"SettingsRemove", [] { return Expect(VLIBCFileRemoveKey(QUIB_INFO_CONF, "fault") == 0, true); }, kPlatformSlot,
-     [] { Write(QUIB_INFO_CONF, kOldSettings + "fault=\"old\"\n"); },
-     OldOrNew(QUIB_INFO_CONF, kOldSettings + "fault=\"old\"\n", kOldSettings)},
+     [] { Write(QUIB_INFO_CONF, g_settings + "fault=\"old\"\n"); }, OldOrNew("fault=\"old\"\n", "")},
     {"LoginCreate",
      [] {
          g_sid[0] = '\0';
@@ -244,7 +252,7 @@ const Op kOps[] = {
          const bool ok = QUIBLoginGet(g_sid, user, sizeof user) == 0 && QUIBLoginRemove(g_sid) == 0;
          return Expect(ok, std::string(user) == "alice");
      },
-     kPlatformSlot, Login},
+     kPlatformSlot, [] { Login("alice"); }},
     {"Conditions",
      [] {
          std::vector<FileSearch::FindComp *> out;
@@ -271,7 +279,7 @@ const Op kOps[] = {
                          enumeration.EnumUserGroups(gids, "alice") == 1;
          const bool named = enumeration.UserEnum().GetUserNameByUID(0) == "root" &&
                             enumeration.UserEnum().GetGroupNameByGID(0) == "root";
-         return Expect(ok, named && users.size() == 5 && groups.size() > 3 && gids.size() == 2);
+         return Expect(ok, named && users.size() == 6 && groups.size() > 3 && gids.size() == 2);
      },
      kNoSlot},
     {"MountStatus",
@@ -290,7 +298,8 @@ protected:
 
 TEST_P(FaultLoop, ReleasesEverythingAndSaysWhy) {
     app_.Basic().WriteFile(kDir + "/a.txt", "hello", "alice").MakeDir(kDir + "/sub").MakeDir("/volume1/homes/alice");
-    Write(QUIB_INFO_CONF, kOldSettings);
+    app_.SetDomain("CORP").AddUser("CORP\\dave");
+    g_settings = Read(QUIB_INFO_CONF);
     openlog(nullptr, LOG_NDELAY, LOG_USER);  // the log connection is the process's, not a run's
     const Op &op = GetParam();
     constexpr long kMaxCalls = 5000;
