@@ -6,6 +6,8 @@
 #include <dirent.h>
 #include <errno.h>
 #include <limits.h>
+#include <pwd.h>
+#include <sys/stat.h>
 #include <syslog.h>
 #include <unistd.h>
 
@@ -113,6 +115,7 @@ std::function<std::string()> OldOrNew(std::string before, std::string after) {
 
 const std::string kDir = "/volume1/public/dir";
 char g_sid[64];
+bool g_created;
 
 void Login(const char *user) {
     ASSERT_EQ(QUIBLoginCreate(user, "secret", "192.0.2.1", g_sid, sizeof g_sid), 0);
@@ -202,7 +205,16 @@ const Op kOps[] = {
          const bool ok = NvoFullPathGet("/home/a", full, share, volume, sharePath, "alice") == 1;
          return Expect(ok, full == "/volume1/homes/alice/a" && fs::is_directory("/volume1/homes/alice"));
      },
-     kLibrarySlot, [] { fs::remove_all("/volume1/homes/alice"); }},
+     kLibrarySlot, [] { fs::remove_all("/volume1/homes/alice"); },
+     [] {
+         // A home is never left behind with another owner or mode.
+         struct stat st;
+         if (stat("/volume1/homes/alice", &st) != 0 ||
+             (st.st_uid == getpwnam("alice")->pw_uid && (st.st_mode & 07777) == 0755)) {
+             return std::string();
+         }
+         return "home of uid " + std::to_string(st.st_uid) + ", mode " + std::to_string(st.st_mode & 07777);
+     }},
     {"PathInfo",
      [] {
          PathInfo info;
@@ -237,14 +249,15 @@ const Op kOps[] = {
     {"LoginCreate",
      [] {
          g_sid[0] = '\0';
-         return Expect(QUIBLoginCreate("alice", "secret", "192.0.2.1", g_sid, sizeof g_sid) == 0, true);
+         g_created = QUIBLoginCreate("alice", "secret", "192.0.2.1", g_sid, sizeof g_sid) == 0;
+         return Expect(g_created, true);
      },
      kPlatformSlot, nullptr,
      [] {
-         // A login either exists whole under its sid or not at all.
+         // A login that was made is whole; one that failed left nothing.
          char user[64] = "";
          const bool found = g_sid[0] != '\0' && QUIBLoginGet(g_sid, user, sizeof user) == 0;
-         return !found || std::string(user) == "alice" ? "" : "half a login: " + std::string(user);
+         return found == g_created && (!found || std::string(user) == "alice") ? "" : "login: '" + std::string(user) + "'";
      }},
     {"LoginLookup",
      [] {
