@@ -310,9 +310,10 @@ protected:
 };
 
 TEST_P(FaultLoop, ReleasesEverythingAndSaysWhy) {
-    app_.Basic().WriteFile(kDir + "/a.txt", "hello", "alice").MakeDir(kDir + "/sub").MakeDir("/volume1/homes/alice");
-    app_.SetDomain("CORP").AddUser("CORP\\dave");
+    app_.Basic().WriteFile(kDir + "/a.txt", "hello", "alice").MakeDir(kDir + "/sub");
+    app_.MakeDir("/volume1/homes/alice", "alice").SetDomain("CORP").AddUser("CORP\\dave");
     g_settings = Read(QUIB_INFO_CONF);
+    g_sid[0] = '\0';
     openlog(nullptr, LOG_NDELAY, LOG_USER);  // the log connection is the process's, not a run's
     const Op &op = GetParam();
     constexpr long kMaxCalls = 5000;
