@@ -26,6 +26,7 @@
 #include "quib_fs.h"
 #include "quib_login.h"
 #include "quib_paths.h"
+#include "quib_user.h"
 #include "vlibc_err.h"
 #include "vlibc_file.h"
 
@@ -247,6 +248,15 @@ const Op kOps[] = {
      [] { Write(QUIB_INFO_CONF, g_settings); }, OldOrNew("", "fault=\"new\"\n")},
     {"SettingsRemove", [] { return Expect(VLIBCFileRemoveKey(QUIB_INFO_CONF, "fault") == 0, true); }, kPlatformSlot,
      [] { Write(QUIB_INFO_CONF, g_settings + "fault=\"old\"\n"); }, OldOrNew("fault=\"old\"\n", "")},
+    {"SettingsRead",
+     [] {
+         char value[8] = "";
+         const bool ok = VLIBCFileGetKeyValue(QUIB_INFO_CONF, "userHomeEnable", value, sizeof value, 0) > 0 &&
+                         VLIBCFileCheckKeyValue(QUIB_INFO_CONF, "userHomeEnable", "yes", 0) == 1 &&
+                         VLIBUserPrivilegeHas("alice", "QUIB.Fault.Loop") == 1;
+         return Expect(ok, std::string(value) == "yes");
+     },
+     kPlatformSlot},
     {"LoginCreate",
      [] {
          g_sid[0] = '\0';
@@ -351,6 +361,7 @@ protected:
 TEST_P(Faults, ReleaseEverythingAndSayWhy) {
     app_.Basic().WriteFile(kDir + "/a.txt", "hello", "alice").MakeDir(kDir + "/sub");
     app_.MakeDir("/volume1/homes/alice", "alice").SetDomain("CORP").AddUser("CORP\\dave");
+    app_.SetAppPrivilege("QUIB.Fault.Loop", "@staff");
     g_settings = Read(QUIB_INFO_CONF);
     g_sid[0] = '\0';
     openlog(nullptr, LOG_NDELAY, LOG_USER);  // the log connection is the process's, not a run's
