@@ -6,8 +6,8 @@
 #include <dirent.h>
 #include <errno.h>
 #include <limits.h>
-#include <string.h>
 #include <pwd.h>
+#include <string.h>
 #include <sys/stat.h>
 #include <syslog.h>
 #include <unistd.h>
