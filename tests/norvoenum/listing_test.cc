@@ -146,37 +146,21 @@ TEST_F(Listing, FillsWhatTheFlagsAsk) {
                                        DT_REG, 0x7F, e), 0);
     struct stat st {};
     ASSERT_EQ(lstat(real.c_str(), &st), 0);
-    EXPECT_EQ(e.name, "Mixed.TxT");
-    EXPECT_EQ(e.path, "/public/dir/Mixed.TxT");
-    EXPECT_EQ(e.real_path, real);
-    EXPECT_EQ(e.type, "txt");
-    EXPECT_EQ(e.size, 5u);
-    EXPECT_EQ(e.mode, 0100754u);
-    EXPECT_EQ(e.acl_privilege, GetACLPrivilege(real.c_str()));
-    EXPECT_EQ(e.is_acl_mode, QUIBACLIsSupport(real.c_str(), -1, 2) != 0);
-    EXPECT_EQ(e.mtime, st.st_mtime);
-    EXPECT_EQ(e.atime, st.st_atime);
-    EXPECT_EQ(e.ctime, st.st_ctime);
-    EXPECT_EQ(e.uid, app_.Uid("alice"));
-    EXPECT_EQ(e.user, "alice");
-    EXPECT_EQ(e.gid, app_.Gid("staff"));
-    EXPECT_EQ(e.group, "staff");
-    EXPECT_FALSE(e.isdir);
-    EXPECT_EQ(e.mount_point_type, "");
-
+    EXPECT_EQ(std::tuple(e.name, e.path, e.real_path, e.type, e.size, e.mode, e.isdir, e.mount_point_type),
+              std::tuple("Mixed.TxT", "/public/dir/Mixed.TxT", real, "txt", 5u, 0100754u, false, ""));
+    EXPECT_EQ(std::tuple(e.acl_privilege, e.is_acl_mode),
+              std::tuple(GetACLPrivilege(real.c_str()), QUIBACLIsSupport(real.c_str(), -1, 2) != 0));
+    EXPECT_EQ(std::tuple(e.mtime, e.atime, e.ctime), std::tuple(st.st_mtime, st.st_atime, st.st_ctime));
+    EXPECT_EQ(std::tuple(e.uid, e.user, e.gid, e.group),
+              std::tuple(app_.Uid("alice"), "alice", app_.Gid("staff"), "staff"));
     DIRENTRY_INFO bare;  // only what the reader told: no stat, no real path
     ASSERT_EQ(enumeration.FillFileInfo("/public/dir/sub", (kDir + "/sub").c_str(), "sub", DIR_ENTRY_TYPE_ALL, DT_DIR,
                                        0, bare), 0);
-    EXPECT_TRUE(bare.isdir);
-    EXPECT_EQ(bare.real_path, "");
-    EXPECT_EQ(bare.user, "");
-    EXPECT_EQ(bare.share_privilege, 4);
+    EXPECT_EQ(std::tuple(bare.isdir, bare.real_path, bare.user, bare.share_privilege), std::tuple(true, "", "", 4));
     DIRENTRY_INFO folder;
     ASSERT_EQ(enumeration.FillFileInfo("/public/dir/sub", (kDir + "/sub").c_str(), "sub", DIR_ENTRY_TYPE_ALL,
                                        DT_UNKNOWN, NVO_INFO_TYPE | NVO_INFO_MOUNT_POINT_TYPE, folder), 0);
-    EXPECT_TRUE(folder.isdir);
-    EXPECT_EQ(folder.type, "");
-    EXPECT_EQ(folder.mount_point_type, "");
+    EXPECT_EQ(std::tuple(folder.isdir, folder.type, folder.mount_point_type), std::tuple(true, "", ""));
     EXPECT_TRUE(app_.ErrorLines().empty());
 }
 

@@ -141,19 +141,15 @@ TEST_F(ShareListing, ShareFieldsAndVolumeFigures) {
     };
     for (const auto &row : rows) {
         const DIRENTRY_INFO &e = got.Entry(row.name);
-        EXPECT_TRUE(e.isdir) << row.name;
-        EXPECT_EQ(e.share_privilege, row.priv) << row.name;
-        EXPECT_EQ(e.acl_enabled, row.acl) << row.name;
-        EXPECT_EQ(e.ftp_privilege, 0) << row.name;
-        EXPECT_EQ(e.mount_point_type, row.type) << row.name;
-        EXPECT_EQ(e.readonly, row.readonly) << row.name;
         const uint64_t bsize = row.volume ? row.volume->f_bsize : 0;
-        EXPECT_EQ(e.freespace, row.volume ? row.volume->f_bavail * bsize : 0) << row.name;
-        EXPECT_EQ(e.totalspace, row.volume ? row.volume->f_blocks * bsize : 0) << row.name;
+        EXPECT_EQ(std::tuple(e.isdir, e.share_privilege, e.acl_enabled, e.ftp_privilege, e.mount_point_type, e.readonly,
+                             e.freespace, e.totalspace),
+                  std::tuple(true, row.priv, row.acl, 0, row.type, row.readonly,
+                             row.volume ? row.volume->f_bavail * bsize : 0, row.volume ? row.volume->f_blocks * bsize : 0))
+            << row.name;
     }
-    EXPECT_EQ(got.Entry("home").real_path, "");  // not asked for
-    EXPECT_EQ(got.Entry("home").path, "/home");
-    EXPECT_EQ(got.Entry("photo").path, "/photo");
+    EXPECT_EQ(std::tuple(got.Entry("home").real_path, got.Entry("home").path, got.Entry("photo").path),
+              std::tuple("", "/home", "/photo"));  // the real path was not asked for
     // Without the flags nothing share-level is filled.
     const Listed bare = List({"alice"});
     const DIRENTRY_INFO &plain = bare.Entry("archive");
