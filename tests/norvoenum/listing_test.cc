@@ -335,7 +335,7 @@ TEST_F(Listing, ThePageEqualsTheRecordsFilledOneByOne) {
     earlier.size = 2;
     earlier.extra = "earlier";
     NvoEnum enumeration;
-    const char *keys[] = {"name", "size", "user", "group", "type", "mtime", "posix", nullptr};
+    const char *keys[] = {"name", "size", "user", "group", "type", "mtime", "atime", "ctime", "posix", nullptr};
     const struct {
         unsigned long offset, limit;
     } pages[] = {{0, 0}, {0, 5}, {3, 4}, {0xFFFFFFFEul, 3}, {100, 3}};
@@ -346,7 +346,7 @@ TEST_F(Listing, ThePageEqualsTheRecordsFilledOneByOne) {
             if (key != nullptr && std::string(key) != "name") {
                 const std::string k = key;
                 widened |= k == "size" ? NVO_INFO_SIZE : k == "type" ? NVO_INFO_TYPE : k == "posix" ? NVO_INFO_PERM
-                           : k == "mtime" ? NVO_INFO_TIME : NVO_INFO_OWNER;
+                           : k == "user" || k == "group" ? NVO_INFO_OWNER : NVO_INFO_TIME;
             }
             std::list<DIRENTRY_INFO> filled;
             DIR *dir = opendir(kDir.c_str());
