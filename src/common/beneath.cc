@@ -20,11 +20,15 @@ int Openat2Beneath(int dir, const char *below, int flags) {
     struct open_how how {};
     how.flags = static_cast<unsigned long long>(flags);
     how.resolve = RESOLVE_BENEATH | RESOLVE_NO_SYMLINKS | RESOLVE_NO_MAGICLINKS;
-    int fd;
-    do {
+    int fd = -1;
+    // EAGAIN: a rename or mount raced the lookup's check that it stayed beneath; try again, a
+    // bounded number of times (renames can be made to race it forever).
+    for (int attempt = 0; attempt < 64; ++attempt) {
         fd = static_cast<int>(syscall(SYS_openat2, dir, below, &how, sizeof how));
-        // EAGAIN: a rename or mount raced the lookup's consistency check; try again.
-    } while (fd < 0 && (errno == EAGAIN || errno == EINTR));
+        if (fd >= 0 || (errno != EAGAIN && errno != EINTR)) {
+            break;
+        }
+    }
     return fd;
 }
 
