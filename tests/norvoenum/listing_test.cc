@@ -418,7 +418,7 @@ TEST_F(Listing, RealReadersAndCarolsLinksThatNeverLeadOutOfTheShare) {
     app_.AddUser("carol").MakeDir("/volume1/homes/alice", "alice", 0755).WriteFile("/volume1/photo/x.jpg");
     app_.MakeDir(kDir + "/closed", "root", 0700).WriteFile(kDir + "/closed/x")
         .MakeDir(kDir + "/blind", "root", 0311).WriteFile(kDir + "/blind/x");
-    app_.MakeDir("/volume1/public/carols", "carol");
+    app_.AddVolume(kDir + "/usb").WriteFile(kDir + "/usb/y").MakeDir("/volume1/public/carols", "carol");
     for (const auto &[link, target] : {std::pair{"photo", "/volume1/photo"}, {"alicehome", "/volume1/homes/alice"},
                                        {"etc", "/etc"}, {"inside", "dir"}, {"carols/up", ".."}}) {
         ASSERT_EQ(app_.RunAs("carol", [&] { return symlink(target, ("/volume1/public/" + std::string(link)).c_str()); }), 0)
@@ -433,6 +433,7 @@ TEST_F(Listing, RealReadersAndCarolsLinksThatNeverLeadOutOfTheShare) {
         {"/public/../photo", 0}, {"/public/dir/../../photo", 0},  // 400
         {"/public/dir", 51},   {"/public", 51}, {"/public/dir/closed", 7}, {"/public/dir/none", 8},
         {"/public/dir/blind", 50},  // entered but not read: empty, and a success
+        {"/public/dir/usb", 51},    // a mount below the share is no way out
     };
     for (const bool openat2 : {true, false}) {
         for (const auto &row : table) {
