@@ -419,10 +419,10 @@ TEST_F(Listing, RealReadersAndCarolsLinksThatNeverLeadOutOfTheShare) {
     app_.MakeDir(kDir + "/closed", "root", 0700).WriteFile(kDir + "/closed/x")
         .MakeDir(kDir + "/blind", "root", 0311).WriteFile(kDir + "/blind/x");
     app_.AddVolume(kDir + "/usb").WriteFile(kDir + "/usb/y").MakeDir("/volume1/public/carols", "carol");
-    for (const auto &[link, target] : {std::pair{"photo", "/volume1/photo"}, {"alicehome", "/volume1/homes/alice"},
-                                       {"etc", "/etc"}, {"inside", "dir"}, {"carols/up", ".."}}) {
-        ASSERT_EQ(app_.RunAs("carol", [&] { return symlink(target, ("/volume1/public/" + std::string(link)).c_str()); }), 0)
-            << link;
+    for (const auto &made : {std::pair{"photo", "/volume1/photo"}, {"alicehome", "/volume1/homes/alice"},
+                             {"etc", "/etc"}, {"inside", "dir"}, {"carols/up", ".."}}) {
+        const std::string link = "/volume1/public/" + std::string(made.first);
+        ASSERT_EQ(app_.RunAs("carol", [&] { return symlink(made.second, link.c_str()); }), 0) << link;
     }
     const struct {
         const char *userPath;
