@@ -453,7 +453,8 @@ TEST_F(Listing, RealReadersAndCarolsLinksThatNeverLeadOutOfTheShare) {
                                                   DT_UNKNOWN, 0, e) == -1 ? NvoLibGetErr() - 400 : 99;
               }),
               7);
-    EXPECT_EQ(app_.ErrorLines(), std::vector<std::string>{"norvoenum.cpp:# Failed to stat " + hidden + ". Permission denied"});
+    EXPECT_EQ(app_.ErrorLines(),
+              std::vector<std::string>{"norvoenum.cpp:# Failed to stat " + hidden + ". Permission denied"});
 }
 
 // Descriptors run out at each step of a listing that takes one (N more allowed, N = 0, 1, ...):
@@ -526,7 +527,8 @@ TEST_F(Listing, ConditionsSeeTheBareNameOnly) {
     const Listed r = List(kUserDir.c_str(), kDir.c_str(), "size", 0x7F, true, 0, 0, {&spy, nullptr, &notA});
     EXPECT_EQ(std::tuple(r.rc, r.out.size(), r.Names().substr(0, 4)), std::tuple(1, size_t{3}, "sub "));
     EXPECT_TRUE(spy.unfilled);
-    EXPECT_EQ(std::pair(spy.names.find('/'), spy.names.find("sub ") != std::string::npos), std::pair(std::string::npos, true));
+    EXPECT_EQ(std::pair(spy.names.find('/'), spy.names.find("sub ") != std::string::npos),
+              std::pair(std::string::npos, true));
 }
 
 }  // namespace

@@ -156,8 +156,8 @@ TEST_F(DirPass, BadDirectoriesGetNoPassAndLeakNothing) {
     } given[] = {{file, "/volume1/p/f", QUIB_ERR_NO_SUCH_PATH, ENOTDIR}, {-1, "/volume1/p", QUIB_ERR_FAILED, EBADF},
                  {999, "/volume1/p", QUIB_ERR_FAILED, EBADF}, {file, "", QUIB_ERR_BAD_PARAMETER, EINVAL}};
     for (const auto &c : given) {
-        EXPECT_EQ(OutcomeOf([&] { return QUIBDirPassBeginAt(c.fd, c.path) == nullptr ? -1 : 0; }), Failed(c.slot, c.err))
-            << c.fd << " " << c.path;
+        const auto begin = [&] { return QUIBDirPassBeginAt(c.fd, c.path) == nullptr ? -1 : 0; };
+        EXPECT_EQ(OutcomeOf(begin), Failed(c.slot, c.err)) << c.fd << " " << c.path;
     }
     close(file);
     app_.MakeDir("/volume1/closed", "root", 0700).MakeDir("/volume1/closed/in", "root", 0777);
