@@ -92,18 +92,6 @@ TEST_F(UsersAndGroups, Records) {
     EXPECT_EQ(GroupLine("big"), "big " + std::to_string(app_.Gid("big")) + ":" + members);
 }
 
-TEST(AuthType, ToldByTheName) {
-    const struct { const char *name; AUTH_TYPE type; } rows[] = {
-        {"alice", AUTH_LOCAL},      {"CORP\\dave", AUTH_DOMAIN}, {"erin@corp.example", AUTH_LDAP},
-        {"CORP\\x@y", AUTH_DOMAIN}, {"", AUTH_LOCAL},            {"\\", AUTH_DOMAIN},
-    };
-    for (const auto &row : rows) {
-        EXPECT_EQ(QUIBUserAuthTypeOf(row.name), row.type) << row.name;
-    }
-    EXPECT_EQ(QUIBUserAuthTypeOf(nullptr), AUTH_LOCAL);
-    EXPECT_EQ(VLIBCErrGet(), QUIB_ERR_BAD_PARAMETER);
-}
-
 TEST_F(UsersAndGroups, UnknownIsNotFoundAndBadInputIsRejected) {
     PQUIBUSER user = nullptr;
     PQUIBGROUP group = nullptr;
