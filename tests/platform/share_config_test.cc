@@ -148,6 +148,26 @@ TEST_F(ShareConfig, ADamagedLineSkipsItsSection) {
     EXPECT_EQ(All(), (Strings{"photo /volume1/photo"}));
 }
 
+// The parsed file is kept per process, yet every rewrite shows at once: one of the same size,
+// in place (same inode) and within one tick of the kernel's clock (same stamps) too, and one
+// made after the kept version has aged.
+TEST_F(ShareConfig, EveryRewriteIsSeen) {
+    const auto rewrite = [](const char *name) {
+        FILE *file = fopen(QUIB_SHARE_CONF, "w");
+        fprintf(file, "[%s]\npath = /volume1/x\n", name);
+        fclose(file);
+    };
+    for (int i = 0; i < 300; ++i) {
+        const char *name = i % 2 ? "odds" : "even";
+        rewrite(name);
+        ASSERT_EQ(Find(name), std::string(name) + " /volume1/x") << i;  // "odds": the same size
+    }
+    usleep(200000);
+    EXPECT_EQ(Find("even"), "error 0x1400");
+    rewrite("even");
+    EXPECT_EQ(Find("even"), "even /volume1/x");
+}
+
 TEST_F(ShareConfig, PathsFindTheShareHoldingThem) {
     Conf("[data]\npath = /volume1/data\n[inner]\npath = /volume1/data/inner\n"
          "[photo]\npath = /volume1/photo\n[usb]\npath = /volumeUSB1/usbshare1-1\n");
