@@ -122,6 +122,8 @@ int Verdict(const std::string &text, const char *privilege, const char *user) {
 
 }  // namespace
 
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size);
+
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     const std::string raw(reinterpret_cast<const char *>(data), size);
     for (const char *privilege : kPrivileges) (void)Verdict(raw, privilege, "root");

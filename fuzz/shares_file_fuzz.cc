@@ -151,6 +151,8 @@ void CheckSound(const std::vector<ShareEntry> &shares) {
 
 }  // namespace
 
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size);
+
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     CheckSound(norvo::platform::ParseShareConfig(std::string_view(reinterpret_cast<const char *>(data), size)));
 
