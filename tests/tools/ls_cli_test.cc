@@ -24,6 +24,8 @@ protected:
         ASSERT_EQ(access(NorvoCliPath().c_str(), X_OK), 0)
             << NorvoCliPath() << " is missing: build the norvo-cli target (or set NORVO_CLI)";
         appliance_.Basic();
+        appliance_.MakeDir("/volume1/homes/alice", "alice", 0755);
+        appliance_.MakeDir("/volume1/homes/bob", "bob", 0755);
         appliance_.MakeDir("/volume1/photo/2024", "alice", 0755);
         appliance_.WriteFile("/volume1/photo/big.jpg", std::string(300, 'b'), "alice");
         appliance_.WriteFile("/volume1/photo/small.txt", std::string(100, 's'), "bob");
@@ -142,9 +144,9 @@ TEST_F(LsCliTest, NamesCannotPassForOthers) {
 
     const CliResult text = RunNorvo({"ls", "--user", "alice", "--info", "size", "--sort", "name", "/photo/odd"});
     EXPECT_EQ(text.out, "total 6\n"
-                        "size     name\n"
-                        "     -   d\\xFE/\n"
-                        "     -   d\\xFF/\n"
+                        "   size  name\n"
+                        "      -  d\\xFE/\n"
+                        "      -  d\\xFF/\n"
                         "1 Bytes  \\x1B[2J\\x07\n"
                         "1 Bytes  a\\x0Ab\n"
                         "1 Bytes  a\\\\x0Ab\n"
