@@ -1,7 +1,8 @@
 #!/usr/bin/env bash
 # Time and peak memory of `norvo ls` (text and --json) of a 200,000-entry folder, inside the
-# appliance sandbox. Each run is a child whose own ru_maxrss (wait4) is its peak resident set;
-# prints the median wall time and the largest peak of five runs per form.
+# appliance sandbox. Each run is a child whose own rusage (wait4) gives its peak resident set
+# (ru_maxrss) and CPU time (user + system, steadier than wall time on a busy machine); prints
+# the medians of the times and the largest peak of five runs per form.
 #   bench-listing-large.sh [BUILD-DIR] [OTHER-NORVO]   (default build-bench, built optimised
 #   when missing; OTHER-NORVO, e.g. an older build, is measured the same way for comparison)
 set -euo pipefail
@@ -39,7 +40,7 @@ for i in range(ENTRIES):
 
 def measure(binary, json):
     args = [binary] + (["--json"] if json else []) + ["ls", "--user", "alice", "--sort", "name", "/public/big"]
-    times, peaks = [], []
+    times, cpus, peaks = [], [], []
     for _ in range(RUNS):
         with open("/dev/null", "wb") as sink:
             start = time.monotonic()
@@ -48,22 +49,23 @@ def measure(binary, json):
             times.append(time.monotonic() - start)
         if status != 0:
             sys.exit(f"{' '.join(args)} failed: {status}")
+        cpus.append(usage.ru_utime + usage.ru_stime)
         peaks.append(usage.ru_maxrss)  # KiB
-    return statistics.median(times), max(peaks) / 1024
+    return statistics.median(times), statistics.median(cpus), max(peaks) / 1024
 
 rows = []
 for label, binary in (("norvo", sys.argv[1]), ("other", sys.argv[2] if len(sys.argv) > 2 else "")):
     if binary:
         for form, json in (("text", False), ("json", True)):
-            seconds, mib = measure(binary, json)
-            rows.append((label, form, seconds, mib))
-print(f"{'binary':8} {'form':5} {'median s':>9} {'peak MiB':>9}   ({ENTRIES} entries, {RUNS} runs)")
-for label, form, seconds, mib in rows:
-    print(f"{label:8} {form:5} {seconds:9.2f} {mib:9.1f}")
-text = {label: (s, m) for label, form, s, m in rows if form == "text"}
-for label, form, seconds, mib in rows:
+            rows.append((label, form) + measure(binary, json))
+print(f"{'binary':8} {'form':5} {'wall s':>8} {'CPU s':>8} {'peak MiB':>9}   ({ENTRIES} entries, {RUNS} runs)")
+for label, form, wall, cpu, mib in rows:
+    print(f"{label:8} {form:5} {wall:8.2f} {cpu:8.2f} {mib:9.1f}")
+text = {row[0]: row for row in rows if row[1] == "text"}
+for label, form, wall, cpu, mib in rows:
     if form == "json":
-        print(f"{label}: json / text: time {seconds / text[label][0]:.2f}, peak memory {mib / text[label][1]:.2f}")
+        t = text[label]
+        print(f"{label}: json / text: wall {wall / t[2]:.2f}, CPU {cpu / t[3]:.2f}, peak memory {mib / t[4]:.2f}")
 PY
 
 "$sandbox" --no-log "$work/big.appliance" -- python3 "$work/measure.py" "$norvo" ${other:+"$other"}

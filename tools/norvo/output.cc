@@ -2,6 +2,9 @@
 
 #include <algorithm>
 #include <iostream>
+#include <string_view>
+#include <utility>
+#include <vector>
 
 #include "exit_status.h"
 #include "help.h"
@@ -38,20 +41,23 @@ void MakeJsonSafe(Json::Value &value) {
     if (!value.isObject()) {
         return;
     }
-    for (const std::string &key : value.getMemberNames()) {
-        Json::Value &member = value[key];
-        if (!member.isString()) {
-            MakeJsonSafe(member);
+    std::vector<std::pair<std::string, std::string>> siblings;  // added after the walk
+    for (auto member = value.begin(); member != value.end(); ++member) {
+        if (!member->isString()) {
+            MakeJsonSafe(*member);
             continue;
         }
         const char *begin = nullptr;
         const char *end = nullptr;
-        member.getString(&begin, &end);
+        member->getString(&begin, &end);
         const std::string_view text(begin, static_cast<size_t>(end - begin));
         if (!IsValidUtf8(text)) {
-            value[key + kEscapedSuffix] = TerminalSafe(text);
-            member = ValidUtf8(text);  // after: text points into member
+            siblings.emplace_back(member.name() + kEscapedSuffix, TerminalSafe(text));
+            *member = ValidUtf8(text);  // last: text points into the member
         }
+    }
+    for (auto &[key, form] : siblings) {
+        value[key] = std::move(form);
     }
 }
 
