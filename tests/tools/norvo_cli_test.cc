@@ -7,7 +7,10 @@
 #include <unicode/utf8.h>
 #include <unistd.h>
 
+#include <string.h>
+
 #include <algorithm>
+#include <functional>
 #include <random>
 #include <sstream>
 #include <string>
@@ -17,6 +20,7 @@
 #include "appliance_file.h"
 #include "cli_runner.h"
 #include "command.h"
+#include "json_text.h"
 #include "quib_fs.h"
 #include "text_safe.h"
 
@@ -270,6 +274,46 @@ TEST(EscapedForm, IsLosslessInertAndLeavesOrdinaryNames) {
     std::string out;
     for (const char *bad : {"\\", "a\\q", "\\x4", "\\xG1", "\\x00"}) {
         EXPECT_FALSE(cli::Unescape(bad, &out)) << bad;
+    }
+}
+
+// Random trees against jsoncpp's own writer: the fast one must write the same bytes.
+TEST(JsonText, MatchesJsoncppByteForByte) {
+    std::mt19937_64 random(1123);
+    const Strings strings = {"",         "a/b",          "\"q\"",         "back\\slash",    "\x01\x1F\x7F\b\f\n\r\t",
+                             "\xC3\xA9", "\xE2\x80\xAE", "\xEF\xBF\xBD", "\xF0\x9F\x98\x80"};
+    const auto pick = [&] { return strings[random() % strings.size()] + strings[random() % strings.size()]; };
+    std::function<Json::Value(int)> make = [&](int depth) {
+        uint64_t bits = random();
+        double real;
+        memcpy(&real, &bits, sizeof real);  // NaN, infinities and subnormals included
+        switch (random() % (depth > 3 ? 6 : 8)) {
+        case 0: return Json::Value();
+        case 1: return Json::Value(static_cast<Json::Int64>(bits));
+        case 2: return Json::Value(static_cast<Json::UInt64>(bits));
+        case 3: return Json::Value(bits % 2 ? real : static_cast<double>(bits % 100000) / (bits % 7 + 1));
+        case 4: return Json::Value(bits % 2 == 0);
+        case 5: return Json::Value(pick());
+        case 6: {
+            Json::Value array(Json::arrayValue);
+            for (uint64_t n = bits % 4; n > 0; --n) array.append(make(depth + 1));
+            return array;
+        }
+        default: {
+            Json::Value object(Json::objectValue);
+            for (uint64_t n = bits % 4; n > 0; --n) object[pick()] = make(depth + 1);
+            return object;
+        }
+        }
+    };
+    Json::StreamWriterBuilder builder;
+    builder["indentation"] = "";
+    builder["emitUTF8"] = false;
+    for (int n = 0; n < 5000; ++n) {
+        const Json::Value value = make(0);
+        std::string fast;
+        cli::AppendJson(fast, value);
+        ASSERT_EQ(fast, Json::writeString(builder, value));
     }
 }
 

@@ -8,6 +8,7 @@
 
 #include "exit_status.h"
 #include "help.h"
+#include "json_text.h"
 #include "norvo/errors.h"
 #include "text_safe.h"
 
@@ -15,15 +16,6 @@ namespace norvo::cli {
 namespace {
 
 constexpr char kEscapedSuffix[] = "_escaped";
-
-Json::StreamWriterBuilder OneLineAscii() {
-    Json::StreamWriterBuilder builder;
-    builder["indentation"] = "";  // one line: easy to grep and to split
-    // With the strings already valid, this escapes every non-ASCII character: the output is
-    // plain ASCII whatever the names hold.
-    builder["emitUTF8"] = false;
-    return builder;
-}
 
 }  // namespace
 
@@ -89,13 +81,14 @@ void TextTable::Print(std::ostream &out) const {
 std::string WriteJson(const Json::Value &value) {
     Json::Value safe = value;
     MakeJsonSafe(safe);
-    return Json::writeString(OneLineAscii(), safe);
+    std::string text;
+    AppendJson(text, safe);
+    return text;
 }
 
-JsonPageWriter::JsonPageWriter(std::ostream &out, Json::UInt64 total, int offset)
-    : out_(out), writer_(OneLineAscii().newStreamWriter()) {
-    // The frame is written by jsoncpp too, around an empty list, so the page comes out in
-    // exactly the bytes of the whole tree written at once.
+JsonPageWriter::JsonPageWriter(std::ostream &out, Json::UInt64 total, int offset) : out_(out) {
+    // The frame is written around an empty list, so the page comes out in exactly the bytes
+    // of the whole tree written at once.
     Json::Value root(Json::objectValue);
     root["success"] = true;
     root["data"]["total"] = total;
@@ -103,21 +96,20 @@ JsonPageWriter::JsonPageWriter(std::ostream &out, Json::UInt64 total, int offset
     root["data"]["files"] = Json::Value(Json::arrayValue);
     const std::string frame = WriteJson(root);
     static constexpr char kList[] = "\"files\":[]";
-    const size_t list = frame.find(kList);
-    const size_t split = list + sizeof kList - 2;
+    const size_t split = frame.find(kList) + sizeof kList - 2;
     out_ << frame.substr(0, split);
     tail_ = frame.substr(split);
 }
 
-JsonPageWriter::~JsonPageWriter() = default;
-
 void JsonPageWriter::Entry(Json::Value &entry) {
     MakeJsonSafe(entry);
+    text_.clear();
     if (!first_) {
-        out_ << ',';
+        text_ += ',';
     }
     first_ = false;
-    writer_->write(entry, &out_);
+    AppendJson(text_, entry);
+    out_.write(text_.data(), static_cast<std::streamsize>(text_.size()));
 }
 
 void JsonPageWriter::Finish() {

@@ -3,7 +3,6 @@
 #pragma once
 #include <json/json.h>
 
-#include <memory>
 #include <ostream>
 #include <string>
 #include <utility>
@@ -46,7 +45,7 @@ int ReportLibraryFailure(const Invocation &inv, const std::string &message = std
 // The message and the usage line on stderr, in text whatever --json says; returns kExitUsage.
 int ReportUsageError(const CommandDef *command, const std::string &message);
 
-// The JSON text of value, one line of plain ASCII, made safe by MakeJsonSafe.
+// The JSON text of value, one line of plain ASCII (AppendJson), made safe by MakeJsonSafe.
 std::string WriteJson(const Json::Value &value);
 
 // Makes every string of value valid UTF-8 (malformed bytes become U+FFFD) and gives each
@@ -60,7 +59,6 @@ void MakeJsonSafe(Json::Value &value);
 class JsonPageWriter {
 public:
     JsonPageWriter(std::ostream &out, Json::UInt64 total, int offset);
-    ~JsonPageWriter();
     JsonPageWriter(const JsonPageWriter &) = delete;
     JsonPageWriter &operator=(const JsonPageWriter &) = delete;
     // Writes entry (made safe in place) as the next element of "files".
@@ -70,8 +68,8 @@ public:
 
 private:
     std::ostream &out_;
-    std::unique_ptr<Json::StreamWriter> writer_;
     std::string tail_;
+    std::string text_;  // one entry's text, kept for its capacity
     bool first_ = true;
 };
 
