@@ -75,6 +75,11 @@ bool IsInvisible(UChar32 c) {
     }
 }
 
+// Whether the sequence of length bytes at text[pos] (0: a malformed byte) is printed as \xNN.
+bool NeedsHex(std::string_view text, size_t pos, size_t length) {
+    return length == 0 || IsInvisible(CodePoint(text.data() + pos, length));
+}
+
 int HexValue(char c) {
     if (c >= '0' && c <= '9') return c - '0';
     if (c >= 'a' && c <= 'f') return c - 'a' + 10;
@@ -117,18 +122,20 @@ std::string TerminalSafe(std::string_view text) {
     out.reserve(text.size());
     for (size_t pos = 0; pos < text.size();) {
         const size_t length = SequenceLength(text, pos);
-        if (length == 0) {
-            AppendHexBytes(out, text.substr(pos, 1));
-            ++pos;
+        if (NeedsHex(text, pos, length)) {
+            AppendHexBytes(out, text.substr(pos, length == 0 ? 1 : length));
+            pos += length == 0 ? 1 : length;
             continue;
         }
-        const std::string_view sequence = text.substr(pos, length);
-        if (sequence == "\\") {
-            out += "\\\\";
-        } else if (IsInvisible(CodePoint(sequence.data(), length))) {
-            AppendHexBytes(out, sequence);
+        if (text[pos] == '\\') {
+            // Doubled only where the next thing printed would make it start an escape, so
+            // CORP\dave stays as it is.
+            const size_t next = pos + 1;
+            const bool starts = next < text.size() && (text[next] == '\\' || text[next] == 'x' ||
+                                                      NeedsHex(text, next, SequenceLength(text, next)));
+            out += starts ? "\\\\" : "\\";
         } else {
-            out += sequence;
+            out.append(text, pos, length);
         }
         pos += length;
     }
@@ -138,18 +145,18 @@ std::string TerminalSafe(std::string_view text) {
 bool Unescape(std::string_view text, std::string *bytes) {
     bytes->clear();
     for (size_t pos = 0; pos < text.size(); ++pos) {
-        if (text[pos] != '\\') {
+        const char next = pos + 1 < text.size() ? text[pos + 1] : '\0';
+        if (text[pos] != '\\' || (next != '\\' && next != 'x')) {
             *bytes += text[pos];
             continue;
         }
-        if (pos + 1 < text.size() && text[pos + 1] == '\\') {
+        if (next == '\\') {
             *bytes += '\\';
             ++pos;
             continue;
         }
-        const bool hex = pos + 3 < text.size() && text[pos + 1] == 'x';
-        const int high = hex ? HexValue(text[pos + 2]) : -1;
-        const int low = hex ? HexValue(text[pos + 3]) : -1;
+        const int high = pos + 3 < text.size() ? HexValue(text[pos + 2]) : -1;
+        const int low = pos + 3 < text.size() ? HexValue(text[pos + 3]) : -1;
         if (high < 0 || low < 0 || (high == 0 && low == 0)) {
             return false;
         }
