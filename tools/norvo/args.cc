@@ -25,7 +25,7 @@ ParseOutcome Help(const CommandDef *command) {
 }
 
 constexpr char kNotEscaped[] =
-    " is not in the escaped form: each backslash must begin a doubled backslash or xNN, not x00";
+    " is not in the escaped form: an escape is a backslash, x and two hex digits other than 00";
 
 bool IsHelp(const std::string &arg) {
     return arg == "--help" || arg == "-h";
