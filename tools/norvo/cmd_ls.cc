@@ -134,7 +134,9 @@ public:
     std::vector<std::string> Cells(const DIRENTRY_INFO &entry) const {
         std::vector<std::string> cells;
         if (info_ & NVO_INFO_PERM) cells.push_back(GetPrivilegeStr(entry.mode));
-        if (info_ & NVO_INFO_OWNER) cells.push_back(TerminalSafe(entry.user.empty() ? std::to_string(entry.uid) : entry.user));
+        if (info_ & NVO_INFO_OWNER) {
+            cells.push_back(TerminalSafe(entry.user.empty() ? std::to_string(entry.uid) : entry.user));
+        }
         if (info_ & NVO_INFO_SIZE) cells.push_back(entry.isdir ? "-" : HumanSize(entry.size));
         if (info_ & NVO_INFO_TIME) cells.push_back(Date(entry.mtime));
         if (volume_) {

@@ -12,9 +12,16 @@ namespace {
 constexpr char kHex[] = "0123456789abcdef";
 
 void AppendUnit(std::string &out, unsigned unit) {
-    const char escape[] = {'\\', 'u', kHex[(unit >> 12) & 0xF], kHex[(unit >> 8) & 0xF], kHex[(unit >> 4) & 0xF],
-                           kHex[unit & 0xF]};
+    const char escape[] = {'\\',          'u',
+                           kHex[(unit >> 12) & 0xF], kHex[(unit >> 8) & 0xF],
+                           kHex[(unit >> 4) & 0xF],  kHex[unit & 0xF]};
     out.append(escape, sizeof escape);
+}
+
+// Printable ASCII other than the two characters JSON escapes (char may be signed or not).
+bool IsPlain(char c) {
+    const auto byte = static_cast<unsigned char>(c);
+    return byte >= 0x20 && byte < 0x80 && c != '"' && c != '\\';
 }
 
 void AppendQuoted(std::string &out, const char *text, const char *end) {
@@ -23,8 +30,7 @@ void AppendQuoted(std::string &out, const char *text, const char *end) {
         const auto byte = static_cast<unsigned char>(*text);
         const char *plain = text;
         // Runs of printable ASCII are the common case: copied at once.
-        while (text != end && static_cast<unsigned char>(*text) >= 0x20 && static_cast<unsigned char>(*text) < 0x80 &&
-               *text != '"' && *text != '\\') {
+        while (text != end && IsPlain(*text)) {
             ++text;
         }
         if (text != plain) {
@@ -47,7 +53,8 @@ void AppendQuoted(std::string &out, const char *text, const char *end) {
             {
                 // Valid UTF-8 by contract: the lead byte gives the length (cut at the end
                 // all the same, so a broken string cannot make the walk overrun).
-                const int length = static_cast<int>(std::min<ptrdiff_t>(byte >= 0xF0 ? 4 : byte >= 0xE0 ? 3 : 2, end - text));
+                const ptrdiff_t lead = byte >= 0xF0 ? 4 : byte >= 0xE0 ? 3 : 2;
+                const int length = static_cast<int>(std::min(lead, end - text));
                 unsigned c = byte & (0x7F >> length);
                 for (int i = 1; i < length; ++i) {
                     c = (c << 6) | (static_cast<unsigned char>(text[i]) & 0x3F);
