@@ -73,7 +73,7 @@ Appliance::Appliance() : impl_(new Impl) {
     char cwd[PATH_MAX];
     impl_->hostCwd = getcwd(cwd, sizeof cwd) != nullptr ? cwd : "/";
 
-    EnterPrivateRoot();
+    EnterPrivateRoot({NORVO_SOURCE_DIR, NORVO_BINARY_DIR});
     WriteWholeFile("/etc/nsswitch.conf", kNsswitch, 0, 0, 0644);
     impl_->accounts.Write();
     for (KeyValueFile *file : {&impl_->settings, &impl_->defaults, &impl_->privileges}) file->Write();
