@@ -8,6 +8,7 @@
 #include <pwd.h>
 #include <shadow.h>
 #include <signal.h>
+#include <sys/mount.h>
 #include <sys/stat.h>
 #include <sys/statvfs.h>
 #include <sys/wait.h>
@@ -15,15 +16,18 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <chrono>
 #include <fstream>
 #include <sstream>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include <gtest/gtest.h>
 
 #include "appliance.h"
 #include "appliance_file.h"
+#include "private_root.h"
 
 namespace norvo::testing {
 namespace {
@@ -79,6 +83,8 @@ TEST(ApplianceTest, LeavesTheHostUntouched) {
             appliance.WriteFile("/volume1/norvo-probe", "x").WriteFile("/tmp/norvo-probe", "x");
             appliance.WriteFile("/usr/norvo-probe", "x").WriteFile("/etc/norvo-probe", "x");
             appliance.MountDeadRemote("/volume1/dead");
+            for (const char *dir : {"/var/tmp", "/root", "/home", "/opt", "/srv"})  // may fail: read-only
+                close(open((std::string(dir) + "/norvo-probe").c_str(), O_WRONLY | O_CREAT | O_CLOEXEC, 0644));
             if (getpwnam("alice") == nullptr) failures |= 1;
             if (!Exists("/etc/quibinfo.conf") || !Exists("/volume1/norvo-probe")) failures |= 2;
         }
@@ -95,8 +101,70 @@ TEST(ApplianceTest, LeavesTheHostUntouched) {
     EXPECT_EQ(SandboxRelevantMounts(), mounts);
     for (const char *path : {"/etc/quibinfo.conf", "/etc.defaults", "/usr/quib", "/volume1/norvo-probe",
                              "/tmp/norvo-probe", "/usr/norvo-probe", "/etc/norvo-probe", "/volume1/dead",
-                             "/mnt/.norvo-sandbox"})
+                             "/mnt/.norvo-sandbox", "/var/tmp/norvo-probe", "/root/norvo-probe",
+                             "/home/norvo-probe", "/opt/norvo-probe", "/srv/norvo-probe"}) {
         EXPECT_FALSE(Exists(path)) << path;
+        unlink(path);
+    }
+}
+
+ino_t MountNamespace() {
+    struct stat st {};
+    stat("/proc/self/ns/mnt", &st);
+    return st.st_ino;
+}
+
+TEST(ApplianceTest, AppliancesInTurnEachReturnToTheHost) {
+    const ino_t host = MountNamespace();
+    for (int round = 0; round < 3; ++round) {
+        {
+            Appliance appliance;
+            appliance.Basic();
+            if (round == 1) {
+                appliance.MountDeadRemote("/volume1/photo/nas2");
+                // Still ending when the appliance goes, as a thread just joined may be.
+                std::thread([] { std::this_thread::sleep_for(std::chrono::milliseconds(50)); }).detach();
+            }
+        }
+        EXPECT_EQ(MountNamespace(), host) << round;
+    }
+}
+
+// A checkout in a directory no other user may enter (a clone in /root, or under a 0700 /tmp/ci):
+// appliance users still run its programs, and the rest of that directory stays out of sight.
+TEST(ApplianceTest, ProjectTreesAreReachableFromAnyCheckout) {
+    const pid_t pid = fork();
+    ASSERT_GE(pid, 0);
+    if (pid == 0) {
+        // A host of the test's own: /var/locked (0700) holds the checkout n and a private folder.
+        if (unshare(CLONE_NEWNS) != 0 || mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr) != 0 ||
+            mount("tmpfs", "/var", "tmpfs", 0, "mode=0755") != 0)
+            _exit(100);
+        mkdir("/var/locked", 0700);
+        mkdir("/var/locked/private", 0700);
+        mkdir("/var/locked/n", 0755);
+        std::ofstream("/var/locked/n/prog") << "#!/bin/sh\nexit 7\n";
+        chmod("/var/locked/n/prog", 0755);
+        const int tree = open("/var/locked/n", O_PATH | O_DIRECTORY | O_CLOEXEC);
+        internal::EnterPrivateRoot({"/var/locked/n"});
+        int failures = 0;
+        const pid_t user = fork();
+        if (user == 0) {
+            if (setgroups(0, nullptr) == 0 && setresgid(100, 100, 100) == 0 && setresuid(1026, 1026, 1026) == 0)
+                execl("/var/locked/n/prog", "prog", nullptr);
+            _exit(1);
+        }
+        int status = 0;
+        if (waitpid(user, &status, 0) != user || !WIFEXITED(status) || WEXITSTATUS(status) != 7) failures |= 1;
+        if (Exists("/var/locked/private")) failures |= 2;
+        std::ofstream("/var/locked/n/written") << "x";
+        if (faccessat(tree, "written", F_OK, 0) != 0) failures |= 4;  // the tree is the host's, writable
+        if (mkdir("/var/elsewhere", 0755) == 0 || errno != EROFS) failures |= 8;
+        _exit(failures);
+    }
+    int status = 0;
+    ASSERT_EQ(waitpid(pid, &status, 0), pid);
+    EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << status;
 }
 
 TEST(ApplianceTest, AccountsAreSeenThroughNss) {
