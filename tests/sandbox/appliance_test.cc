@@ -77,8 +77,8 @@ TEST(ApplianceTest, AppliancesInTurnLeaveTheHostUntouched) {
                 appliance.WriteFile("/volume1/norvo-probe", "x").WriteFile("/tmp/norvo-probe", "x");
                 appliance.WriteFile("/usr/norvo-probe", "x").WriteFile("/etc/norvo-probe", "x");
                 appliance.MountDeadRemote("/volume1/dead");
-                for (const char *dir : {"/var/tmp", "/root", "/home", "/opt", "/srv"})  // may fail: read-only
-                    close(open((std::string(dir) + "/norvo-probe").c_str(), O_WRONLY | O_CREAT | O_CLOEXEC, 0644));
+                for (const std::string dir : {"/var/tmp", "/root", "/home", "/opt", "/srv"})  // read-only
+                    close(open((dir + "/norvo-probe").c_str(), O_WRONLY | O_CREAT | O_CLOEXEC, 0644));
                 if (getpwnam("alice") == nullptr || !Exists("/volume1/norvo-probe")) failures |= 1;
                 std::thread([] { std::this_thread::sleep_for(std::chrono::milliseconds(50)); }).detach();
             }
@@ -122,12 +122,14 @@ TEST(ApplianceTest, ProjectTreesAreReachableFromAnyCheckout) {
         int failures = 0;
         const pid_t user = fork();
         if (user == 0) {
-            if (setgroups(0, nullptr) == 0 && setresgid(100, 100, 100) == 0 && setresuid(1026, 1026, 1026) == 0)
+            if (setgroups(0, nullptr) == 0 && setresgid(100, 100, 100) == 0 &&
+                setresuid(1026, 1026, 1026) == 0)
                 execl("/var/locked/n/prog", "prog", nullptr);
             _exit(1);
         }
         int status = 0;
-        if (waitpid(user, &status, 0) != user || !WIFEXITED(status) || WEXITSTATUS(status) != 7) failures |= 1;
+        if (waitpid(user, &status, 0) != user || !WIFEXITED(status) || WEXITSTATUS(status) != 7)
+            failures |= 1;
         if (Exists("/var/locked/private")) failures |= 2;
         std::ofstream("/var/locked/n/written") << "x";
         if (faccessat(tree, "written", F_OK, 0) != 0) failures |= 4;  // the tree is the host's, writable
@@ -149,7 +151,8 @@ TEST(ApplianceTest, AccountsAreSeenThroughNss) {
     appliance.AddUser(erin);
 
     for (const auto &[name, uid] : {std::pair<std::string, uid_t>{"alice", appliance.Uid("alice")},
-                                    {"CORP\\dave", appliance.Uid("CORP\\dave")}, {"erin@corp.example", 5000}}) {
+                                    {"CORP\\dave", appliance.Uid("CORP\\dave")},
+                                    {"erin@corp.example", 5000}}) {
         const passwd *entry = getpwnam(name.c_str());
         ASSERT_NE(entry, nullptr) << name;
         EXPECT_EQ(entry->pw_uid, uid) << name;

@@ -139,13 +139,14 @@ std::vector<ReachableTree> OpenReachableTrees(const std::vector<std::string> &pa
         trees.push_back(std::move(tree));
     }
     // A tree inside another one comes with it.
-    std::sort(trees.begin(), trees.end(), [](const auto &a, const auto &b) { return a.path < b.path; });
+    std::sort(trees.begin(), trees.end(),
+              [](const auto &a, const auto &b) { return a.path.size() < b.path.size(); });
     std::vector<ReachableTree> outermost;
     for (ReachableTree &tree : trees) {
-        if (!outermost.empty() && (tree.path == outermost.back().path ||
-                                   tree.path.rfind(outermost.back().path + "/", 0) == 0))
-            continue;
-        outermost.push_back(std::move(tree));
+        const auto inside = [&tree](const ReachableTree &outer) {
+            return tree.path == outer.path || tree.path.rfind(outer.path + "/", 0) == 0;
+        };
+        if (std::none_of(outermost.begin(), outermost.end(), inside)) outermost.push_back(std::move(tree));
     }
     return outermost;
 }
