@@ -1,7 +1,7 @@
 // A throwaway appliance for tests: a private mount namespace with tmpfs volumes, private
 // settings locations, private passwd/group/shadow, and a syslog socket that captures every
-// line the code under test logs. Nothing of the host changes; everything vanishes with the
-// process.
+// line the code under test logs. The host is read-only inside, but for the project's source and
+// build trees, which every appliance user can reach; everything else vanishes with the process.
 #pragma once
 
 #include <sys/types.h>
