@@ -144,11 +144,7 @@ TEST(ApplianceTest, ProjectTreesAreReachableFromAnyCheckout) {
 TEST(ApplianceTest, AccountsAreSeenThroughNss) {
     Appliance appliance;
     appliance.Basic().AddUser("CORP\\dave");
-    UserSpec erin;
-    erin.name = "erin@corp.example";
-    erin.uid = 5000;
-    erin.expireDay = 100;
-    appliance.AddUser(erin);
+    appliance.AddUser(UserSpec{.name = "erin@corp.example", .uid = 5000, .expireDay = 100});
 
     for (const auto &[name, uid] : {std::pair<std::string, uid_t>{"alice", appliance.Uid("alice")},
                                     {"CORP\\dave", appliance.Uid("CORP\\dave")},
@@ -164,8 +160,8 @@ TEST(ApplianceTest, AccountsAreSeenThroughNss) {
     const group *staff = getgrnam("staff");
     ASSERT_NE(staff, nullptr);
     EXPECT_EQ(staff->gr_gid, appliance.Gid("staff"));
-    std::vector<std::string> members(staff->gr_mem, staff->gr_mem + 2);
-    EXPECT_EQ(members, (std::vector<std::string>{"alice", "bob"}));
+    EXPECT_EQ(std::vector<std::string>(staff->gr_mem, staff->gr_mem + 2),
+              (std::vector<std::string>{"alice", "bob"}));
     ASSERT_NE(getgrnam("administrators"), nullptr);
     EXPECT_EQ(getgrnam("administrators")->gr_gid, 101u);
     EXPECT_STREQ(getgrnam("administrators")->gr_mem[0], "admin");
