@@ -14,7 +14,8 @@ norvo=$(cd "$build/tools" && pwd)/norvo
 sandbox=$(cd "$build/tools/sandbox" && pwd)/norvo-sandbox
 command -v hyperfine >/dev/null || { echo "bench-listing.sh: hyperfine is missing" >&2; exit 1; }
 
-# Inside the sandbox /tmp is private: the results go beside the build.
+# Inside the sandbox /tmp is private and the host read-only: the results go beside the build,
+# the one place the sandboxed command writes to the host.
 work=$(cd "$build" && pwd)/bench-listing
 rm -rf "$work" && mkdir -p "$work"
 # 1,000 entries: 950 files and 50 folders, several owners and modes.
