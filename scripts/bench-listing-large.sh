@@ -8,6 +8,7 @@
 set -euo pipefail
 root=$(cd "$(dirname "$0")/.." && pwd)
 cd "$root"
+bash scripts/deps.sh --bench
 build=${1:-build-bench}
 other=${2:-}
 if [ ! -x "$build/tools/norvo" ] || [ ! -x "$build/tools/sandbox/norvo-sandbox" ]; then
