@@ -1,5 +1,6 @@
-// Whole-database enumerations of users and groups, a user's groups, and the reading of the
-// platform's group list with its fixed log lines.
+// Whole-database enumerations of users and groups, a user's groups, the reading of the
+// platform's group list with its fixed log lines, and the name caches: one platform lookup per
+// known id, unknown ids asked again.
 #include <syslog.h>
 
 #include <fstream>
@@ -20,6 +21,7 @@
 namespace {
 
 using norvo::testing::Appliance;
+using norvo::testing::GroupSpec;
 using norvo::testing::LogLine;
 using norvo::testing::UserSpec;
 using Ids = std::list<unsigned int>;
@@ -143,6 +145,52 @@ TEST(GroupListReading, EveryElementMustBeADecimalId) {
         EXPECT_EQ(ids, row.ids);
         EXPECT_EQ(app.Logs(), (row.log.empty() ? std::vector<LogLine>{} : std::vector<LogLine>{{LOG_ERR, row.log}}));
     }
+}
+
+// Renames an entry in /etc/passwd or /etc/group behind the platform's back.
+void Rename(Appliance &app, const char *file, const std::string &from, const std::string &to) {
+    std::string text = ReadWhole(file);
+    const size_t at = text.find("\n" + from + ":");
+    ASSERT_NE(at, std::string::npos) << from;
+    text.replace(at + 1, from.size(), to);
+    app.WriteFile(file, text);
+}
+
+TEST_F(Accounts, NameCachesLookKnownIdsUpOnce) {
+    NorvoUserEnum &names = enum_.UserEnum();
+    const unsigned int alice = app_.Uid("alice");
+    const unsigned int staff = app_.Gid("staff");
+    EXPECT_EQ(names.GetUserNameByUID(alice), "alice");
+    EXPECT_EQ(names.GetGroupNameByGID(staff), "staff");
+    EXPECT_EQ(names.GetUserNameByUID(0), "root");
+
+    Rename(app_, "/etc/passwd", "alice", "alicia");
+    Rename(app_, "/etc/group", "staff", "crew");
+    EXPECT_EQ(names.GetUserNameByUID(alice), "alice");  // cached
+    EXPECT_EQ(names.GetGroupNameByGID(staff), "staff");
+    EXPECT_EQ(NorvoUserEnum().GetUserNameByUID(alice), "alicia");  // each object has its own
+    EXPECT_EQ(names.UpdateUserInfoMap(alice, false), 1);
+    EXPECT_EQ(names.UpdateGroupInfoMap(staff, true), 1);
+    EXPECT_EQ(names.GetUserNameByUID(alice), "alicia");
+    EXPECT_EQ(names.GetGroupNameByGID(staff), "crew");
+    EXPECT_TRUE(app_.ErrorLines().empty());
+}
+
+TEST_F(Accounts, NameCachesGiveUnknownIdsEmptyNamesAndAskAgain) {
+    NorvoUserEnum names;
+    EXPECT_EQ(names.GetUserNameByUID(4242), "");
+    EXPECT_EQ(names.GetGroupNameByGID(4343), "");
+    EXPECT_EQ(names.UpdateUserInfoMap(4242, true), 0);
+    EXPECT_EQ(names.UpdateGroupInfoMap(4343, false), 0);
+    EXPECT_EQ(names.GetUserNameByUID(4294967295u), "");
+
+    app_.AddUser(UserSpec{.name = "late", .uid = 4242}).AddGroup(GroupSpec{"lategroup", 4343, {}});
+    EXPECT_EQ(names.GetUserNameByUID(4242), "late");
+    EXPECT_EQ(names.GetGroupNameByGID(4343), "lategroup");
+
+    // Names are bytes: whatever the database holds comes back unchanged.
+    app_.WriteFile("/etc/passwd", ReadWhole("/etc/passwd") + "\xff\xfe:x:4444:100::/:/bin/sh\n");
+    EXPECT_EQ(names.GetUserNameByUID(4444), "\xff\xfe");
 }
 
 }  // namespace

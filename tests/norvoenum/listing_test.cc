@@ -1,7 +1,7 @@
 // Directory listings and file records over the sandbox's real file systems: what is never
 // listed, what the flags fill, the page against the steps taken one by one, the errors with
 // their log lines, real non-root readers (and a user's links that must not lead out of the
-// share), descriptors running out, and a network mount whose server is gone.
+// share), and a network mount whose server is gone. Then the listing of "/".
 #include <dirent.h>
 #include <errno.h>
 #include <fcntl.h>
@@ -9,15 +9,13 @@
 #include <linux/seccomp.h>
 #include <stddef.h>
 #include <sys/prctl.h>
-#include <sys/resource.h>
 #include <sys/syscall.h>
 #include <sys/stat.h>
+#include <sys/statfs.h>
 #include <syslog.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <cstring>
-#include <filesystem>
 #include <string>
 #include <vector>
 
@@ -45,10 +43,14 @@ struct Listed {
     std::list<DIRENTRY_INFO> out;
     std::string Names() const {
         std::string names;
-        for (const DIRENTRY_INFO &e : out) {
-            names += (names.empty() ? "" : " ") + e.name;
-        }
+        for (const DIRENTRY_INFO &e : out) names += (names.empty() ? "" : " ") + e.name;
         return names;
+    }
+    const DIRENTRY_INFO &Entry(const std::string &name) const {
+        for (const DIRENTRY_INFO &e : out) if (e.name == name) return e;
+        static const DIRENTRY_INFO none;
+        ADD_FAILURE() << "no entry " << name;
+        return none;
     }
 };
 
@@ -62,9 +64,8 @@ Listed List(const char *userPath, const char *realPath, const char *key = "name"
     return r;
 }
 
-Listed ListIn(const std::string &relative, const char *key = "name", int info = 0, bool ascending = true,
-            unsigned long offset = 0, unsigned long limit = 0) {
-    return List((kUserDir + relative).c_str(), (kDir + relative).c_str(), key, info, ascending, offset, limit);
+Listed ListIn(const std::string &relative, const char *key = "name", int info = 0) {
+    return List((kUserDir + relative).c_str(), (kDir + relative).c_str(), key, info);
 }
 
 LogLine Err(const std::string &text) {
@@ -80,18 +81,6 @@ protected:
             .WriteFile(kDir + "/b.txt", "ho")
             .MakeDir(kDir + "/sub");
     }
-    // Names in the directory reader's own order, hidden ones left out.
-    std::vector<std::string> ReaderOrder() {
-        std::vector<std::string> names;
-        DIR *dir = opendir(kDir.c_str());
-        while (const dirent *e = readdir(dir)) {
-            if (QUIBEAIsHiddenFile(e->d_name) == 0) {
-                names.push_back(e->d_name);
-            }
-        }
-        closedir(dir);
-        return names;
-    }
     Appliance app_;
 };
 
@@ -105,6 +94,8 @@ TEST_F(Listing, HiddenNamesLinksSocketsAndPipesAreNeverListed) {
         EXPECT_EQ(std::pair(r.rc, r.out.size()), std::pair(1, size_t{4})) << info;
         EXPECT_EQ(r.Names().substr(0, 10), "sub a.txt ") << info;
     }
+    const Listed empty = ListIn("/sub");
+    EXPECT_EQ(std::tuple(empty.rc, empty.total, empty.out.size()), std::tuple(1, 0ul, size_t{0}));
 
     const struct {
         const char *name;
@@ -161,40 +152,6 @@ TEST_F(Listing, FillsWhatTheFlagsAsk) {
     ASSERT_EQ(enumeration.FillFileInfo("/public/dir/sub", (kDir + "/sub").c_str(), "sub", DIR_ENTRY_TYPE_ALL,
                                        DT_UNKNOWN, NVO_INFO_TYPE | NVO_INFO_MOUNT_POINT_TYPE, folder), 0);
     EXPECT_EQ(std::tuple(folder.isdir, folder.type, folder.mount_point_type), std::tuple(true, "", ""));
-    EXPECT_TRUE(app_.ErrorLines().empty());
-}
-
-TEST_F(Listing, SortsReversesAndPages) {
-    std::vector<std::string> reader = ReaderOrder();
-    const auto at = [&reader](const char *name) { return std::find(reader.begin(), reader.end(), name); };
-    // "B.TXT" and "b.txt" tie on size, type and name: they keep the reader's order.
-    const std::string ties = at("B.TXT") < at("b.txt") ? "B.TXT b.txt" : "b.txt B.TXT";
-    const std::string tiesReversed = at("B.TXT") < at("b.txt") ? "b.txt B.TXT" : "B.TXT b.txt";
-    const Listed bySize = ListIn("", "size", 0);  // the key fills the size unasked
-    EXPECT_EQ(bySize.Names(), "sub " + ties + " a.txt");
-    EXPECT_EQ(bySize.out.back().size, 5u);
-    EXPECT_EQ(ListIn("", "name", 0, false).Names(), tiesReversed + " a.txt sub");  // folders last
-    std::string reversed;
-    for (auto it = reader.rbegin(); it != reader.rend(); ++it) {
-        reversed += (reversed.empty() ? "" : " ") + *it;
-    }
-    EXPECT_EQ(ListIn("", nullptr, 0, false).Names(), reversed);
-
-    const std::vector<std::string> byType = {"sub", "a.txt", ties.substr(0, 5), ties.substr(6)};
-    const struct {
-        unsigned long offset, limit;
-        size_t first, last;  // the page in byType
-    } pages[] = {{5, 0, 0, 4}, {1, 1, 1, 2}, {3, 5, 3, 4}, {4, 1, 4, 4}};
-    for (const auto &row : pages) {
-        const Listed r = ListIn("", "type", 0, true, row.offset, row.limit);
-        std::string want;
-        for (size_t i = row.first; i < row.last; ++i) {
-            want += (want.empty() ? "" : " ") + byType[i];
-        }
-        EXPECT_EQ(std::tuple(r.rc, r.total, r.Names()), std::tuple(1, 4ul, want)) << row.offset << "+" << row.limit;
-    }
-    const Listed empty = ListIn("/sub");
-    EXPECT_EQ(std::tuple(empty.rc, empty.total, empty.out.size()), std::tuple(1, 0ul, size_t{0}));
     EXPECT_TRUE(app_.ErrorLines().empty());
 }
 
@@ -261,7 +218,7 @@ TEST_F(Listing, BadArgumentsAndPathsGetTheirErrors) {
     EXPECT_EQ(app_.Logs(), std::vector<LogLine>{Err("norvoenum.cpp:306 Failed to stat " + notDir + ". Not a directory")});
 }
 
-TEST_F(Listing, AFailurePartWayKeepsTheRecordsSoFarAndClosesTheDirectory) {
+TEST_F(Listing, AFailurePartWayKeepsTheRecordsSoFar) {
     // A folder whose path leaves no room for a long name: that entry's stat fails.
     std::string deep = "/volume1/public";
     for (int i = 0; i < 19; ++i) {
@@ -272,18 +229,12 @@ TEST_F(Listing, AFailurePartWayKeepsTheRecordsSoFarAndClosesTheDirectory) {
     const std::string longName(255, 'n');
     ASSERT_EQ(chdir(deep.c_str()), 0);
     close(open(longName.c_str(), O_CREAT | O_WRONLY, 0644));
-    const auto openFds = [] { return std::distance(std::filesystem::directory_iterator("/proc/self/fd"), {}); };
-    const auto list = [&deep] { return List(("/public" + deep.substr(15)).c_str(), deep.c_str(), "name", NVO_INFO_SIZE); };
-    list();  // the first log line opens the log socket
-    app_.ClearLogs();
-    const auto fds = openFds();
-    const Listed r = list();
+    const Listed r = List(("/public" + deep.substr(15)).c_str(), deep.c_str(), "name", NVO_INFO_SIZE);
     EXPECT_EQ(std::tuple(r.rc, r.err, r.total), std::tuple(0, int{NVO_ERR_SYSTEM}, 0ul));
     EXPECT_LE(r.out.size(), 1u);  // "ok", if the reader gave it first
     for (const DIRENTRY_INFO &e : r.out) {  // the records so far carry their paths
         EXPECT_EQ(e.path, "/public" + deep.substr(15) + "/" + e.name);
     }
-    EXPECT_EQ(openFds(), fds);
     EXPECT_EQ(app_.Logs(), std::vector<LogLine>{Err("norvoenum.cpp:306 Failed to stat " + deep + "/" + longName +
                                                     ". File name too long")});
 }
@@ -457,44 +408,6 @@ TEST_F(Listing, RealReadersAndCarolsLinksThatNeverLeadOutOfTheShare) {
               std::vector<std::string>{"norvoenum.cpp:# Failed to stat " + hidden + ". Permission denied"});
 }
 
-// Descriptors run out at each step of a listing that takes one (N more allowed, N = 0, 1, ...):
-// every failure says why and leaves nothing open, until the listing succeeds.
-TEST_F(Listing, RunningOutOfDescriptorsLeaksNothing) {
-    const int steps = app_.RunAs("alice", [] {
-        syslog(LOG_INFO, "the log socket is open");
-        const auto openFds = [] {
-            std::vector<int> listed, open;
-            for (const auto &fd : std::filesystem::directory_iterator("/proc/self/fd")) {
-                listed.push_back(std::stoi(fd.path().filename().string()));
-            }
-            for (const int fd : listed) {
-                if (fcntl(fd, F_GETFD) != -1) open.push_back(fd);  // not the iterator's own
-            }
-            std::sort(open.begin(), open.end());
-            return open;
-        };
-        // No gaps below the highest descriptor: each new one then counts against the limit.
-        for (int fd = 0; fd < openFds().back(); ++fd) {
-            if (fcntl(fd, F_GETFD) == -1 && ::open("/dev/null", O_RDONLY) != fd) return -4;
-        }
-        const std::vector<int> before = openFds();
-        rlimit saved{};
-        getrlimit(RLIMIT_NOFILE, &saved);
-        for (int n = 0; n < 30; ++n) {
-            rlimit limit = saved;
-            limit.rlim_cur = static_cast<rlim_t>(before.back() + 1 + n);
-            setrlimit(RLIMIT_NOFILE, &limit);
-            const Listed r = ListIn("", "size", 0x7F, true, 0, 2);
-            setrlimit(RLIMIT_NOFILE, &saved);
-            if (openFds() != before) return -1;
-            if (r.rc == 1) return n;
-            if (r.err != NVO_ERR_ACCESS && r.err != NVO_ERR_SYSTEM) return -2;
-        }
-        return -3;
-    });
-    EXPECT_GE(steps, 2);  // the directory and the pass's own descriptor at least
-}
-
 TEST_F(Listing, ADeadRemoteMountIsListedButCannotBeEntered) {
     app_.MountDeadRemote(kDir + "/remote");
     const Listed r = ListIn("", "name", NVO_INFO_MOUNT_POINT_TYPE | NVO_INFO_SIZE);
@@ -529,6 +442,159 @@ TEST_F(Listing, ConditionsSeeTheBareNameOnly) {
     EXPECT_TRUE(spy.unfilled);
     EXPECT_EQ(std::pair(spy.names.find('/'), spy.names.find("sub ") != std::string::npos),
               std::pair(std::string::npos, true));
+}
+
+// The listing of "/": the home folder and the shares a user may see, with share privileges and
+// volume figures, for local, domain and directory accounts, ordered and paged; the failures
+// with their log lines.
+struct Query {
+    const char *user;
+    const char *key = nullptr;
+    int info = 0;
+    bool ascending = true;
+    unsigned long offset = 0, limit = 0;
+};
+
+Listed ListShares(const Query &q) {
+    Listed r;
+    NvoLibSetErr(0);
+    NvoEnum enumeration;
+    r.rc = enumeration.NvoLibShareEntryListEnum(q.user, "ctx", false, q.key, q.info, q.offset, q.limit, q.ascending,
+                                                r.out, &r.total);
+    r.err = NvoLibGetErr();
+    return r;
+}
+
+class ShareListing : public ::testing::Test {
+protected:
+    void SetUp() override {
+        app_.Basic().MakeDir("/volume1/homes/alice", "alice", 0700);
+        app_.AddUser(norvo::testing::UserSpec{.name = "carol", .home = "/srv/carol"});  // her home lies outside the homes root
+        app_.AddUser("CORP\\dave").AddUser("erin@corp.example").AddUser("CORP\\x@y");
+        app_.MakeDir("/volume1/homes/erin@corp.example").MakeDir("/volume1/homes/admin");
+        app_.AddShare({.name = "archive", .volume = "/volume2", .readOnly = "alice,CORP\\dave,erin@corp.example,CORP\\x@y"});
+        app_.AddShare({.name = "zeta", .readWrite = "alice", .hidden = true});
+    }
+    Appliance app_;
+};
+
+TEST_F(ShareListing, EachAccountSeesItsHomeAndItsShares) {
+    app_.SetDomain("CORP").SetHomeService(true, "/volume1/homes", false, true);  // no homes for domain accounts
+    const struct { const char *user; std::string names; } rows[] = {
+        {"alice", "home public photo secret archive"},  // the hidden share is left out
+        {"bob", "home public photo"},  // his home is not made yet: it is listed all the same, and stays unmade
+        {"carol", "public"},  // no home folder, shares only
+        {"admin", "home public"},  // administrators see what the lists give them
+        {"CORP\\dave", "public archive"},
+        {"CORP\\x@y", "public archive"},  // a domain account although it holds an "@"
+    };
+    for (const auto &row : rows) {
+        const Listed got = ListShares({row.user});
+        EXPECT_EQ(got.Names(), row.names) << row.user;
+        EXPECT_EQ(got.rc, row.names.empty() ? 0 : 1) << row.user;
+        EXPECT_EQ(got.total, row.names.empty() ? 99u : got.out.size()) << row.user;
+    }
+    // No directory service is configured: its account gets no share list.
+    const Listed erin = ListShares({"erin@corp.example"});
+    EXPECT_EQ(std::pair(erin.rc, erin.err), std::pair(0, int(NVO_ERR_SYSTEM)));
+    app_.SetDirectory("ldap.corp.example");
+    EXPECT_EQ(ListShares({"erin@corp.example"}).Names(), "home public archive");
+    // A new user's first listing, as the user: the home entry is a folder with the volume's
+    // figures, and opening it makes it.
+    const int info = NVO_INFO_PERM | NVO_INFO_VOLUME_STATUS | NVO_INFO_SIZE;
+    app_.ClearLogs();
+    EXPECT_EQ(app_.RunAs("bob", [&] {
+                  const Listed got = ListShares({"bob", "name", info});
+                  const DIRENTRY_INFO &home = got.Entry("home");
+                  return got.rc == 1 && home.isdir && home.share_privilege == 2 && home.totalspace > 0 ? 1 : 0;
+              }),
+              1);
+    EXPECT_NE(access("/volume1/homes/bob", F_OK), 0);
+    EXPECT_TRUE(app_.ErrorLines().empty());
+}
+
+TEST_F(ShareListing, FailuresAndTheirLogLines) {
+    app_.SetSetting("domain_joined", "no").WriteFile("/volume1/homes/f");
+    app_.AddUser(norvo::testing::UserSpec{.name = "frank", .home = "/volume1/homes/f/frank"});  // not a folder
+    const struct { const char *user; int err; std::vector<std::string> lines; } rows[] = {
+        {nullptr, NVO_ERR_NO_USER, {"norvoenum.cpp:402 Failed to get user ((null))"}},
+        {"CORP\\dave", NVO_ERR_SYSTEM, {"norvoenum.cpp:407 Failed to enum valid shares"}},
+        {"frank", NVO_ERR_SYSTEM, {"norvoenum.cpp:415 Failed to get real path (/volume1/homes/f/frank)"}},
+    };
+    for (const auto &row : rows) {
+        app_.ClearLogs();
+        const Listed got = ListShares({row.user});
+        EXPECT_EQ(std::pair(got.rc, got.err), std::pair(0, row.err)) << (row.user ? row.user : "null");
+        std::vector<std::string> enumLines;
+        for (const LogLine &line : app_.Logs()) {
+            EXPECT_EQ(line.priority, LOG_ERR) << line.text;
+            if (line.text.rfind("norvoenum.cpp", 0) == 0) enumLines.push_back(line.text);
+        }
+        EXPECT_EQ(enumLines, row.lines);
+    }
+}
+
+TEST_F(ShareListing, ShareFieldsAndVolumeFigures) {
+    app_.AddShare({.name = "remote", .readWrite = "alice"}).MountDeadRemote("/volume1/remote");
+    app_.RemountReadOnly("/volume2");
+    struct statfs64 v1, v2;
+    ASSERT_EQ(statfs64("/volume1", &v1), 0);
+    ASSERT_EQ(statfs64("/volume2", &v2), 0);
+    const int info = NVO_INFO_PERM | NVO_INFO_VOLUME_STATUS | NVO_INFO_MOUNT_POINT_TYPE;
+    const Listed got = ListShares({"alice", nullptr, info});
+    ASSERT_EQ(got.rc, 1);
+    EXPECT_EQ(got.Names(), "home public photo secret archive remote");
+    const struct { const char *name; int priv; bool acl; const struct statfs64 *volume; bool readonly; std::string type; } rows[] = {
+        {"home", 2, false, &v1, false, ""}, {"photo", 2, true, &v1, false, ""},
+        {"archive", 1, true, &v2, true, ""}, {"remote", 2, true, nullptr, false, "remotefail"},
+    };
+    for (const auto &row : rows) {
+        const DIRENTRY_INFO &e = got.Entry(row.name);
+        const uint64_t bsize = row.volume ? row.volume->f_bsize : 0;
+        EXPECT_EQ(std::tuple(e.isdir, e.share_privilege, e.acl_enabled, e.ftp_privilege, e.mount_point_type, e.readonly,
+                             e.freespace, e.totalspace),
+                  std::tuple(true, row.priv, row.acl, 0, row.type, row.readonly,
+                             row.volume ? row.volume->f_bavail * bsize : 0, row.volume ? row.volume->f_blocks * bsize : 0))
+            << row.name;
+    }
+    EXPECT_EQ(std::tuple(got.Entry("home").real_path, got.Entry("home").path, got.Entry("photo").path),
+              std::tuple("", "/home", "/photo"));  // the real path was not asked for
+    // Without the flags nothing share-level is filled.
+    const Listed bare = ListShares({"alice"});
+    const DIRENTRY_INFO &plain = bare.Entry("archive");
+    EXPECT_EQ(std::tuple(plain.share_privilege, plain.totalspace, plain.readonly), std::tuple(4, uint64_t{0}, false));
+}
+
+TEST_F(ShareListing, SyncedSharesNeedTheFlagAndTheCapability) {
+    app_.WriteFile("/usr/quib/etc/shares.conf", "[photo]\n\tpath = /volume1/photo\n\twrite list = alice\n\tsynced = yes\n"
+                                                "[public]\n\tpath = /volume1/public\n\twrite list = @users\n");
+    auto synced = [&](int info) {
+        std::string out;
+        for (const DIRENTRY_INFO &e : ListShares({"alice", nullptr, info}).out) out += e.synced_share ? "1" : "0";
+        return out;
+    };
+    EXPECT_EQ(synced(NVO_INFO_SYNC_SHARE), "000");  // home, photo, public: no capability
+    app_.SetDefaultSetting("support_s2s", "yes");
+    EXPECT_EQ(synced(NVO_INFO_SYNC_SHARE), "010");
+    EXPECT_EQ(synced(NVO_INFO_PERM), "000");
+}
+
+TEST_F(ShareListing, OrderAndPagesAsADirectoryListing) {
+    const struct { Query q; std::string names; unsigned long total; } rows[] = {
+        {{"alice", "name"}, "archive home photo public secret", 5},  // home among the folders by name
+        {{"alice", "name", 0, false}, "secret public photo home archive", 5},
+        {{"alice", nullptr, 0, false}, "archive secret photo public home", 5},  // reversed list order
+        {{"alice", "name", 0, true, 1, 2}, "home photo", 5},
+        {{"alice", "name", 0, true, 3, 0}, "archive home photo public secret", 5},  // limit 0: all, offset ignored
+        {{"carol", "size", 0, true, 0, 1}, "public", 1},
+    };
+    for (const auto &row : rows) {
+        const Listed got = ListShares(row.q);
+        EXPECT_EQ(got.Names(), row.names) << row.q.user << " " << (row.q.key ? row.q.key : "null");
+        EXPECT_EQ(got.total, row.total);
+    }
+    // Sorting by size fills the size, as in a directory listing.
+    EXPECT_NE(ListShares({"alice", "size"}).Entry("home").size, 0u);
 }
 
 }  // namespace

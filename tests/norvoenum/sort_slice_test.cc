@@ -18,15 +18,14 @@ int Sign(int v) {
     return (v > 0) - (v < 0);
 }
 
+// Beside ICU below: bytes that are not UTF-8, null pointers and long names.
 TEST(CaseCompare, FoldsCaseInCodePointOrder) {
     const struct {
         const char *a;
         const char *b;
         int sign;
     } table[] = {
-        {"abc", "ABC", 0},       {"a", "B", -1},           {"_", "a", -1},  // '_' sorts before letters
-        {"", "a", -1},           {"ab", "a", 1},           {"Stra\xc3\x9f" "e", "STRASSE", 0},
-        {"\xc3\xa9", "\xc3\x89", 0},  {"\xc3\xa4", "b", 1},  {"k", "\xe2\x84\xaa", 0},  // Kelvin sign
+        {"_", "a", -1},          {"Stra\xc3\x9f" "e", "STRASSE", 0},  // '_' sorts before letters
         {"x\xff", "X\xff", 0},   {"\xff", "\xfe", 1},      {"a\xff", "a\xef\xbf\xbd", -1},  // not U+FFFD
         {nullptr, "", -1},       {nullptr, nullptr, 0},    {"", nullptr, 1},
     };

@@ -1,7 +1,5 @@
-// Icons of listed entries, over real icon files and real mounts; and the mount-point test.
+// Icons of listed entries, over real icon files and real mounts.
 // (Which mounts are disk images is the platform's to tell; its test covers them.)
-#include <sys/mount.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <string>
@@ -11,7 +9,6 @@
 
 #include "appliance.h"
 #include "norvo/norvomisc.h"
-#include "quib_webutils.h"
 
 namespace {
 
@@ -78,28 +75,6 @@ TEST(Icons, FoldersByMountTypeAndTheShareRecycleBin) {
         EXPECT_EQ(Icon("entry", true, c.real, c.inShare), c.icon) << c.real << " " << c.inShare;
     }
     EXPECT_TRUE(app.ErrorLines().empty());
-}
-
-TEST(MountPoint, KernelMarkOrMountTable) {
-    Appliance app;
-    app.MakeDir("/volume1/dir/sub").MakeDir("/volume1/bound").MakeDir("/volume1/web/cgi");
-    app.MountDeadRemote("/volume1/dead");
-    ASSERT_EQ(mount("/volume1/dir", "/volume1/bound", nullptr, MS_BIND, nullptr), 0);  // same device
-    ASSERT_EQ(symlink("/volume1/bound", "/volume1/link"), 0);
-    ASSERT_EQ(chdir("/volume1/web/cgi"), 0);
-    struct Case {
-        std::string path;
-        bool mountPoint;
-    } cases[] = {
-        {"/", true}, {"/volume1", true}, {"/volume1/", true}, {"/volume1/dir", false}, {"/volume1/dir/sub", false},
-        {"/volume1/bound", true}, {"/volume1/link", false},  // a link is never one
-        {"/volume1/dead", true}, {"/volume1/dead/x", false}, {"/volume1/dir/../dead", true},
-        {"../..", true}, {"..", false}, {"/volume1/missing", false},
-        {"", false}, {std::string("/volume1\0/x", 11), false}, {"/" + std::string(4096, 'a'), false},
-    };
-    for (const Case &c : cases) {
-        EXPECT_EQ(WebUtils::IsMountPoint(c.path), c.mountPoint) << c.path.substr(0, 40);
-    }
 }
 
 }  // namespace

@@ -164,6 +164,7 @@ TEST(Matcher, FoldsExactlyAsIcu) {
     }
 }
 
+// The rules the reference above encodes, each with its example.
 TEST(Matcher, DescribedCases) {
     struct Case {
         const char *pattern;
@@ -171,25 +172,17 @@ TEST(Matcher, DescribedCases) {
         int esc;
         int result;
     } cases[] = {
-        {"*.JPG", "a.jpg", '\\', 1}, {"a?c", "abbc", '\\', 0}, {"a?c", "abc", '\\', 1}, {"100\\%", "100%", '\\', 1},
-        {"100\\%", "1000", '\\', 0}, {"\\*", "*", '\\', 1}, {"\\*", "a", '\\', 0}, {"*", "", '\\', 1},
-        {"", "", '\\', 1}, {"", "a", '\\', 0},
+        {"*.JPG", "a.jpg", '\\', 1}, {"100\\%", "100%", '\\', 1}, {"a?c", "abbc", '\\', 0},
         {"a\\", "a", '\\', 1},          // an escape with nothing after it ends the pattern
         {"*\\", "a", '\\', 0},          // ... but after a star the rest is never tried at the end
-        {"*\\", "", '\\', 0},
         {"*??", "a", '\\', 0},          // question marks after a star need their characters
-        {"*??", "ab", '\\', 1},
-        {"\\\\*", "\\abc", '\\', 1},    // an escaped escape character, then a star
         {"a*", "a", '*', 1},            // the star is recognised before the escape character
-        {"*report*", "Q3 REPORT final.pdf", '\\', 1},
         {"\xCF\x82", "\xCE\xA3", '\\', 1},              // final sigma and capital sigma fold alike
         {"k", "\xE2\x84\xAA", '\\', 1},                 // Kelvin sign folds to k
-        {"\xC3\xA9t\xC3\xA9", "\xC3\x89T\xC3\x89", '\\', 1},
         {"?", "\xF0\x9F\x98\x80", '\\', 1},             // one character, four bytes
         {"a?", "a\xC3", '\\', 1},                       // a cut-short sequence is one character
         {"\xC0\xAA", "anything", '\\', 1},              // an overlong '*' is a star
         {"a", "\xC1\x81", '\\', 1},                    // an overlong 'A' folds on either side
-        {"\xC1\x81", "a", '\\', 1},
     };
     for (const Case &c : cases) {
         EXPECT_EQ(NvoLibStrLikeCompare(c.pattern, c.subject, c.esc), c.result)

@@ -88,18 +88,6 @@ TEST(AclAccess, FileSystemsWithoutAclsLeaveItToTheKernel) {
                      "norvomisc.cpp:# Failed to get the ACL Privilege: file = /volume1/file/x, reason=[700]"}));
 }
 
-TEST(AclPrivilege, MaskOfTheCaller) {
-    Appliance app;
-    app.Basic();
-    app.WriteFile("/volume1/public/ro.txt", "x", "alice", 0644);
-    // The low four bits, and 16 for the delete bit.
-    const int mask = app.RunAs("bob", [] {
-        const unsigned m = GetACLPrivilege("/volume1/public/ro.txt");
-        return static_cast<int>((m & 0xf) | ((m & ACL_PERM_DELETE) ? 16 : 0));
-    });
-    EXPECT_EQ(mask, ACL_PERM_READ | 16);
-}
-
 TEST(DirList, EntersAndOpensOrSaysWhyNot) {
     Appliance app;
     app.Basic();

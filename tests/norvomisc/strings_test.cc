@@ -1,8 +1,5 @@
 // Replacement, case, extensions, sizes, UTF-8 form, hex, splitting and path lists.
 #include <stdlib.h>
-#include <sys/resource.h>
-#include <sys/wait.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <iterator>
@@ -96,34 +93,6 @@ TEST(Replace, EqualsAPlainScanOnGeneratedTexts) {
                   ReplaceReference(src, p))
             << src << " " << p[0] << ">" << p[1] << " " << p[2] << ">" << p[3];
     }
-}
-
-TEST(Replace, FailedAllocationIsLogged) {
-#if defined(__SANITIZE_ADDRESS__)
-    GTEST_SKIP() << "the sanitizer's allocator does not honour an address-space limit";
-#elif defined(__has_feature)
-#if __has_feature(address_sanitizer)
-    GTEST_SKIP() << "the sanitizer's allocator does not honour an address-space limit";
-#endif
-#endif
-    norvo::testing::Appliance app;
-    // 64 KiB of "a", each replaced by 64 KiB: 4 GiB, beyond a 1 GiB address space.
-    const std::string src(1 << 16, 'a');
-    const std::string to(1 << 16, 'b');
-    const pid_t child = fork();
-    ASSERT_GE(child, 0);
-    if (child == 0) {
-        const rlimit limit{1ul << 30, 1ul << 30};
-        char *out = nullptr;
-        _exit(setrlimit(RLIMIT_AS, &limit) == 0 && NvoLibStrReplace(src.c_str(), "a", to.c_str(), &out) == -1 &&
-                      out == nullptr
-                  ? 0
-                  : 1);
-    }
-    int status = 0;
-    ASSERT_EQ(waitpid(child, &status, 0), child);
-    EXPECT_EQ(status, 0);
-    EXPECT_EQ(app.ErrorLines(), (Lines{"norvomisc.cpp(#): failed to calloc, errno=Cannot allocate memory"}));
 }
 
 TEST(BytesAndNames, LowerExtensionsAndSizes) {

@@ -1,7 +1,6 @@
 // The file-index records each condition builds, the chains linking makes, and the factory's
 // results: records are read by walking their links, as the index would.
 #include <limits.h>
-#include <string.h>
 
 #include <functional>
 #include <memory>
@@ -48,6 +47,8 @@ std::string ChainOf(std::unique_ptr<FindComp> c) {
     return Chain(c->getFirstCond());
 }
 
+// What the factory table below cannot reach: null operators and names, the size tolerance
+// at its edges, and the escapes of name terms.
 TEST(Records, EachConstructorBuildsItsRecords) {
     const std::string longest = std::to_string(LLONG_MAX);
     const struct {
@@ -64,42 +65,18 @@ TEST(Records, EachConstructorBuildsItsRecords) {
         {[] { return new FindNameComp("abc\\"); }, "{0 ~ abc\\}"},        // ends in a backslash: not wrapped
         {[] { return new FindNameComp(""); }, "{0 = }"},
         {[] { return new FindNameComp(nullptr); }, "{0 = }"},
-        {[] { return new FindTypeComp(true); }, "{6 = 1}"},
-        {[] { return new FindTypeComp(false); }, "{6 = 0}"},
-        {[] { return new FindUserComp("alice", 1026); }, "{15 = 1026 |{17 ~ alice}}"},
         {[] { return new FindUserComp(nullptr, 0xFFFFFFFFu); }, "{15 = 4294967295 |{17 ~ }}"},
-        {[] { return new FindGroupComp("staff", 65537); }, "{16 = 65537 |{18 ~ staff}}"},
-        {[] { return new FindMTimeComp("before", 1000); }, "{12 < 1000}"},
-        {[] { return new FindMTimeComp("BeFoRe", 1000); }, "{12 < 1000}"},
-        {[] { return new FindCRTimeComp("after", 5); }, "{9 >= 5}"},
         {[] { return new FindATimeComp(nullptr, -1); }, "{11 >= 18446744073709551615}"},
-        {[] { return new FindSizeComp("equal", 100); }, "{7 < 105 &{7 >= 95}}"},
         {[] { return new FindSizeComp("equal", 10); }, "{7 < 11 &{7 >= 9}}"},
         {[] { return new FindSizeComp("equal", 0); }, "{7 < 1 &{7 >= 0}}"},
         {[] { return new FindSizeComp("equal", -100); }, "{7 < 18446744073709551517 &{7 >= 0}}"},
         {[] { return new FindSizeComp("equal", LLONG_MAX); },
          "{7 < " + longest + " &{7 >= " + std::to_string(LLONG_MAX - (LLONG_MAX >> 2) / 5) + "}}"},
-        {[] { return new FindSizeComp("EQUAL", 100); }, "{7 > 100}"},
-        {[] { return new FindSizeComp("less", 7); }, "{7 < 7}"},
         {[] { return new FindSizeComp(nullptr, 7); }, "{7 > 7}"},
     };
     for (const auto &c : cases) {
         EXPECT_EQ(ChainOf(std::unique_ptr<FindComp>(c.make())), c.chain);
     }
-}
-
-TEST(Records, SetSqlCondFillsAndCuts) {
-    __tag_FI_SQL_COND a, b, c;
-    memset(&c, 0x5A, sizeof(c));
-    setSqlCond(c, FI_COND_PATH, FI_OP_PATH_LIKE, std::string(5000, 'p'), &a, &b);
-    EXPECT_EQ(c.andNext, &a);
-    EXPECT_EQ(c.orNext, &b);
-    EXPECT_EQ(c.type, FI_COND_PATH);
-    EXPECT_EQ(c.op, FI_OP_PATH_LIKE);
-    EXPECT_EQ(std::string(c.value), std::string(4095, 'p'));
-    setSqlCond(c, FI_COND_SIZE, FI_OP_GT, 18446744073709551615ull, nullptr, nullptr);
-    EXPECT_STREQ(c.value, "18446744073709551615");
-    EXPECT_EQ(std::string(c.value, sizeof(c.value)).find_first_not_of('\0', 20), std::string::npos);  // zero-filled
 }
 
 // Alternatives head their chain, newest first; joining one twice, itself or in a circle (which

@@ -1,6 +1,6 @@
 // The norvo command, run as a program inside a throwaway appliance: its JSON answers, its
-// failure output, its usage errors, hostile arguments; and, linked in, its command table and
-// the escaped form of names.
+// failure output, its usage errors, hostile arguments, the pages of norvo ls; and, linked in,
+// its command table and the escaped form of names.
 #include <gtest/gtest.h>
 #include <json/json.h>
 #include <unicode/uchar.h>
@@ -37,12 +37,13 @@ protected:
         appliance_.Basic();
     }
 
-    // Runs norvo with --json, checks the exit status and that the answer is plain ASCII JSON,
-    // and returns it parsed.
+    // Runs norvo with --json, checks the exit status and that the answer is one line of plain
+    // ASCII JSON, and returns it parsed.
     static Json::Value RunJson(Strings args, int wantStatus = 0, const std::string &input = "") {
         args.insert(args.begin(), "--json");
         const CliResult result = RunNorvo(args, input);
         EXPECT_EQ(result.exitStatus, wantStatus) << result.err;
+        EXPECT_EQ(std::count(result.out.begin(), result.out.end(), '\n'), 1) << result.out;
         Json::Value root;
         std::string errors;
         std::istringstream in(result.out);
@@ -107,6 +108,18 @@ TEST_F(NorvoCliTest, PrivilegeOfTwoUsersOnOneShare) {
         << text.out;
 }
 
+// carol's link inside public is described as the link it is, with a link's rights, and never
+// followed; a path through it is refused, as a listing would refuse it.
+TEST_F(NorvoCliTest, PrivilegeDescribesALinkAndRefusesAPathThroughIt) {
+    appliance_.AddUser("carol").WriteFile("/volume1/photo/x.jpg");
+    ASSERT_EQ(appliance_.RunAs("carol", [] { return symlink("/volume1/photo", "/volume1/public/photo"); }), 0);
+    const Json::Value link = RunJson({"privilege", "--user", "carol", "/public/photo"})["data"];
+    EXPECT_EQ(link["link"].asString(), "/volume1/photo");
+    EXPECT_EQ(link["acl"]["value"].asUInt(), unsigned{ACL_PERM_READ_ATTR | ACL_PERM_READ_ACL | ACL_PERM_DELETE});
+    EXPECT_EQ(RunJson({"privilege", "--user", "carol", "/public/photo/x.jpg"}, 1)["error"]["code"].asInt(), 407);
+    EXPECT_TRUE(RunJson({"privilege", "--user", "carol", "/public"})["data"]["link"].isNull());
+}
+
 TEST_F(NorvoCliTest, OnlyRootAsksForAnotherUser) {
     // Run by bob: his own ACL mask needs no switch, alice's can't be had without root.
     const int own = appliance_.RunAs("bob", [] {
@@ -138,6 +151,38 @@ TEST_F(NorvoCliTest, SharesCheckPathAndFailures) {
     EXPECT_EQ(text.exitStatus, 1);
     EXPECT_EQ(text.out, "");
     EXPECT_EQ(text.err, "error 418 (error:error_reserved_name)\n");
+}
+
+// The records of the conditions joined as a CLI author would see them, and the verdict on real
+// files.
+TEST_F(NorvoCliTest, ConditionsShowTheJoinedRecordsAndJudgeFiles) {
+    appliance_.WriteFile("/volume1/public/a.txt", std::string(100, 'x'), "alice");
+    appliance_.WriteFile("/volume1/public/b.txt", std::string(100, 'x'), "bob");
+    const Json::Value data = RunJson({"conditions", "--name", "a,b", "--user", "alice", "--size", "equal:100",
+                                      "/volume1/public/a.txt", "/volume1/public/b.txt", "/volume1/public/none"})["data"];
+    Strings records;
+    for (const Json::Value &r : data["records"]) {
+        const auto link = [](const Json::Value &v) { return v.isNull() ? std::string("-") : std::to_string(v.asInt()); };
+        records.push_back(link(r["number"]) + " " + r["type_name"].asString() + " " + r["op_name"].asString() + " " +
+                          r["value"].asString() + " and " + link(r["and"]) + " or " + link(r["or"]));
+    }
+    const std::string alice = std::to_string(appliance_.Uid("alice"));
+    EXPECT_EQ(records, (Strings{
+                           "1 FI_COND_NAME FI_OP_LIKE *b* and 3 or 2",
+                           "2 FI_COND_NAME FI_OP_LIKE *a* and - or -",
+                           "3 FI_COND_UID FI_OP_EQ " + alice + " and - or 4",
+                           "4 FI_COND_USER_NAME FI_OP_LIKE alice and 5 or -",
+                           "5 FI_COND_SIZE FI_OP_LT 105 and 6 or -",
+                           "6 FI_COND_SIZE FI_OP_GE 95 and - or -",
+                       }));
+    EXPECT_EQ(data["first"].asInt(), 1);
+    EXPECT_TRUE(data["files"][0]["match"].asBool());
+    EXPECT_EQ(data["files"][1]["failed_condition"].asInt(), 2);  // bob's
+    EXPECT_EQ(data["files"][2]["error"].asString(), "No such file or directory");
+
+    EXPECT_EQ(RunJson({"conditions", "--group", "nosuchgroup"}, 1)["error"]["code"].asInt(), 404);
+    EXPECT_EQ(RunNorvo({"conditions", "--mtime", "1700000000"}).exitStatus, 2);  // OP: missing
+    EXPECT_TRUE(RunJson({"conditions", "--type", "folder", "/volume1"})["data"]["files"][0]["match"].asBool());
 }
 
 TEST_F(NorvoCliTest, LoginGivesASidThatDomainPrivilegesAccept) {
@@ -230,6 +275,122 @@ TEST_F(NorvoCliTest, HelpCoversEveryCommandOfTheTable) {
         }
         EXPECT_EQ(RunNorvo({"help", name}).out, help.out);
     }
+}
+
+// norvo ls: the page of a directory and of the share list as JSON and as text, the options
+// handed to the listing, two users, and names made to pass for others.
+class LsCliTest : public NorvoCliTest {
+protected:
+    void SetUp() override {
+        NorvoCliTest::SetUp();
+        appliance_.MakeDir("/volume1/homes/alice", "alice", 0755);
+        appliance_.MakeDir("/volume1/homes/bob", "bob", 0755);
+        appliance_.MakeDir("/volume1/photo/2024", "alice", 0755);
+        appliance_.WriteFile("/volume1/photo/big.jpg", std::string(300, 'b'), "alice");
+        appliance_.WriteFile("/volume1/photo/small.txt", std::string(100, 's'), "bob");
+        appliance_.WriteFile("/volume1/photo/Mid.JPG", std::string(200, 'm'), "alice");
+    }
+
+    static Json::Value Ls(Strings args, int wantStatus = 0) {
+        args.insert(args.begin(), "ls");
+        return RunJson(args, wantStatus);
+    }
+
+    static Strings Names(const Json::Value &root) {
+        Strings names;
+        for (const Json::Value &file : root["data"]["files"]) names.push_back(file["name"].asString());
+        return names;
+    }
+};
+
+TEST_F(LsCliTest, DirectoryPageIsDumpFileInfo) {
+    const Json::Value root = Ls({"--user", "alice", "--sort", "name", "/photo/"});
+    EXPECT_TRUE(root["success"].asBool());
+    EXPECT_EQ(root["data"]["total"].asUInt(), 4u);
+    const Json::Value &file = root["data"]["files"][2];
+    EXPECT_EQ(file["path"].asString(), "/photo/Mid.JPG");
+    EXPECT_EQ(file["additional"]["real_path"].asString(), "/volume1/photo/Mid.JPG");
+    EXPECT_EQ(file["additional"]["owner"]["user"].asString(), "alice");
+    EXPECT_FALSE(file["additional"].isMember("volume_status"));
+
+    const Json::Value some = Ls({"--user", "alice", "--info", "size,type", "/photo"});
+    EXPECT_EQ(some["data"]["files"][1]["additional"].getMemberNames(), (Strings{"size", "type"}));
+
+    const Json::Value shares = Ls({"--user", "alice", "/"});
+    EXPECT_EQ(Names(shares), (Strings{"home", "public", "photo", "secret"}));
+    EXPECT_GT(shares["data"]["files"][2]["additional"]["volume_status"]["totalspace"].asDouble(), 0.0);
+}
+
+TEST_F(LsCliTest, SortPageAndFiltersArePassedThrough) {
+    struct Case {
+        Strings args;
+        Strings names;
+    };
+    const std::vector<Case> cases = {
+        {{"--sort", "size", "/photo"}, {"2024", "small.txt", "Mid.JPG", "big.jpg"}},
+        {{"--sort", "size", "--desc", "/photo"}, {"big.jpg", "Mid.JPG", "small.txt", "2024"}},
+        {{"--sort=size", "--offset=1", "--limit=2", "/photo"}, {"small.txt", "Mid.JPG"}},
+        {{"--offset", "9", "--limit", "2", "/photo"}, {}},
+        {{"--type", "dir", "/photo"}, {"2024"}},
+        {{"--name", "sma*,20*", "--sort", "size", "/photo"}, {"2024", "small.txt"}},
+        {{"--sort", "name", "--offset", "1", "--limit", "2", "/"}, {"photo", "public"}},
+    };
+    for (const Case &c : cases) {
+        Strings args = c.args;
+        args.insert(args.begin(), {"--user", "alice"});
+        const Json::Value root = Ls(args);
+        EXPECT_EQ(Names(root), c.names) << args[3];
+        EXPECT_EQ(root["data"]["total"].asUInt(), args[3] == "dir" ? 1u : args[3] == "sma*,20*" ? 2u : 4u);
+    }
+}
+
+TEST_F(LsCliTest, TwoUsersSeeDifferentThings) {
+    appliance_.MakeDir("/volume1/public/mine", "alice", 0700);
+    appliance_.WriteFile("/volume1/public/mine/diary.txt", "x", "alice", 0600);
+    EXPECT_EQ(Names(Ls({"--user", "alice", "/public/mine"})), (Strings{"diary.txt"}));
+    // bob is refused by the folder's mode, judged as bob although norvo runs as root.
+    EXPECT_EQ(Ls({"--user", "bob", "/public/mine"}, 1)["error"]["code"].asInt(), 407);
+    // The share list leaves out what bob may not see; a no-access share refuses him.
+    EXPECT_EQ(Names(Ls({"--user", "bob", "/"})), (Strings{"home", "public", "photo"}));
+    EXPECT_EQ(Ls({"--user", "bob", "/secret"}, 1)["error"]["key"].asString(), "error:error_privilege_not_enough");
+    const CliResult text = RunNorvo({"ls", "--user", "bob", "/secret"});
+    EXPECT_EQ(text.exitStatus, 1);
+    EXPECT_EQ(text.out, "");
+    EXPECT_EQ(text.err, "error 407 (error:error_privilege_not_enough): bob may not list /secret\n");
+}
+
+// The attacks on printed names: a newline against the four characters "\x0A", a right-to-left
+// override, and two malformed names that U+FFFD alone would make one.
+TEST_F(LsCliTest, NamesCannotPassForOthers) {
+    appliance_.MakeDir("/volume1/photo/odd", "alice", 0755);
+    for (const char *name : {"a\nb", "a\\x0Ab", "evil\xE2\x80\xAEgpj.exe", "\x1B[2J\x07"}) {
+        appliance_.WriteFile(std::string("/volume1/photo/odd/") + name, "x", "alice");
+    }
+    appliance_.MakeDir("/volume1/photo/odd/d\xFF", "alice", 0755);
+    appliance_.MakeDir("/volume1/photo/odd/d\xFE", "alice", 0755);
+    appliance_.WriteFile("/volume1/photo/odd/d\xFF/inside.txt", "x", "alice");
+
+    const CliResult text = RunNorvo({"ls", "--user", "alice", "--info", "perm,owner,size", "--sort", "name", "/photo/odd"});
+    EXPECT_EQ(text.out, "total 6\n"
+                        "posix      owner     size  name\n"
+                        "rwxr-xr-x  alice        -  d\\xFE/\n"
+                        "rwxr-xr-x  alice        -  d\\xFF/\n"
+                        "rw-r--r--  alice  1 Bytes  \\x1B[2J\\x07\n"
+                        "rw-r--r--  alice  1 Bytes  a\\x0Ab\n"
+                        "rw-r--r--  alice  1 Bytes  a\\\\x0Ab\n"
+                        "rw-r--r--  alice  1 Bytes  evil\\xE2\\x80\\xAEgpj.exe\n");
+
+    const Json::Value root = Ls({"--user", "alice", "--type", "dir", "--sort", "name", "/photo/odd"});
+    const Json::Value &files = root["data"]["files"];
+    ASSERT_EQ(files.size(), 2u);
+    EXPECT_EQ(files[0]["name"], files[1]["name"]);  // both "d\uFFFD"
+    EXPECT_EQ(files[0]["name_escaped"].asString(), "d\\xFE");
+    EXPECT_EQ(files[1]["path_escaped"].asString(), "/photo/odd/d\\xFF");
+    EXPECT_EQ(files[1]["additional"]["real_path_escaped"].asString(), "/volume1/photo/odd/d\\xFF");
+    EXPECT_FALSE(Ls({"--user", "alice", "--name", "a?b", "/photo/odd"})["data"]["files"][0].isMember("name_escaped"));
+
+    const Json::Value inside = Ls({"--user", "alice", "--escaped", files[1]["path_escaped"].asString()});
+    EXPECT_EQ(Names(inside), (Strings{"inside.txt"}));
 }
 
 // Generated byte strings, rich in what must be escaped, against a reference that decodes with
