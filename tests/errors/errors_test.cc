@@ -8,14 +8,6 @@
 
 namespace {
 
-TEST(ErrorSlot, SetReturnsTheCodeAndGetReadsIt) {
-    EXPECT_EQ(NvoLibGetErr(), 0);
-    EXPECT_EQ(NvoLibSetErr(407), 407);
-    EXPECT_EQ(NvoLibGetErr(), 407);
-    NvoLibSetErr(0);
-    EXPECT_EQ(NvoLibGetErr(), 0);
-}
-
 // What every entry point answers instead of letting an exception out.
 TEST(ErrorSlot, TheGuardTurnsExceptionsIntoFailureAndACode) {
     EXPECT_EQ(norvo::Guarded(-1, [] { return 7; }), 7);
