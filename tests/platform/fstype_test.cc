@@ -52,10 +52,6 @@ TEST(FsType, NamesAndAliasesJoinTheirFamilies) {
             << c.type << " from " << (c.source ? c.source : "null");
     }
     EXPECT_EQ(OUTCOME(QUIBFSTypeFromName(nullptr, "x")), Failed(QUIB_ERR_BAD_PARAMETER));
-    for (int index = -1; index <= 12; ++index) {
-        EXPECT_EQ(QUIBFSIsRemoteFS(index), index == FSTYPE_REMOTE ? 1 : 0) << index;
-        EXPECT_EQ(QUIBFSIsImageFS(index), index == FSTYPE_ISO ? 1 : 0) << index;
-    }
 }
 
 TEST(MountTable, EachPathIsHeldByItsDeepestDataMount) {
