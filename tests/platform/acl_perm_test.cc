@@ -132,6 +132,11 @@ TEST_F(AclPerm, EachUserHoldsWhatTheKernelGrants) {
         EXPECT_EQ(MaskAs(appliance_, c.user, c.path), c.mask) << c.user << " " << (c.path ? c.path : "null");
     }
     EXPECT_EQ(MaskAs(appliance_, "root", "/") & kDel, 0);
+    // The generated trees hold no links: inside a pass too a link is judged itself.
+    QUIBDirPass *pass = QUIBDirPassBegin("/volume1/s");
+    EXPECT_EQ(MaskAs(appliance_, "root", "/volume1/s/tousb"), kNone | kDel);
+    EXPECT_EQ(MaskAs(appliance_, "root", "/volume1/s/missing"), -QUIB_ERR_NO_SUCH_FILE);
+    QUIBDirPassEnd(pass);
     EXPECT_EQ(OUTCOME(QUIBACLPermGet("/volume1/s/own", nullptr)), Failed(QUIB_ERR_BAD_PARAMETER));
     struct Support { const char *path; Outcome want; } support[] = {
         {"/volume1/usb/photo.jpg", {0}}, {"/volume1/usb", {0}}, {"/volume2", {1}}, {"/volume1/s/dangling", {1}},
