@@ -116,9 +116,10 @@ TEST_F(DirPass, PassesNestAndEndInAnyOrder) {
 TEST_F(DirPass, BadDirectoriesGetNoPass) {
     const int file = ::open("/volume1/p/f", O_RDONLY | O_CLOEXEC);
     const struct { int fd; const char *path; int slot, err; } cases[] = {
-        {AT_FDCWD, nullptr, QUIB_ERR_BAD_PARAMETER, EINVAL}, {AT_FDCWD, "/volume1/none", QUIB_ERR_NO_SUCH_FILE, ENOENT},
-        {AT_FDCWD, "/volume1/p/f", QUIB_ERR_NO_SUCH_PATH, ENOTDIR}, {file, "/volume1/p/f", QUIB_ERR_NO_SUCH_PATH, ENOTDIR},
-        {999, "/volume1/p", QUIB_ERR_FAILED, EBADF},
+        {AT_FDCWD, nullptr, QUIB_ERR_BAD_PARAMETER, EINVAL},
+        {AT_FDCWD, "/volume1/none", QUIB_ERR_NO_SUCH_FILE, ENOENT},
+        {AT_FDCWD, "/volume1/p/f", QUIB_ERR_NO_SUCH_PATH, ENOTDIR},
+        {file, "/volume1/p/f", QUIB_ERR_NO_SUCH_PATH, ENOTDIR}, {999, "/volume1/p", QUIB_ERR_FAILED, EBADF},
     };
     for (const auto &c : cases) {
         const auto begin = [&] {

@@ -118,7 +118,8 @@ TEST_F(Login, WrongPasswordsClosedAccountsAndHostileArgumentsAreRefused) {
     EXPECT_EQ(QUIBLoginCreate("alice", "secret", nullptr, sid, sizeof sid), 0) << "null address, exact room";
 
     const std::string overlong(129, 'A');
-    for (const char *bad : {static_cast<const char *>(nullptr), "", "../etc/passwd", "a'b", "\xff\xfe", overlong.c_str()}) {
+    for (const char *bad :
+         {static_cast<const char *>(nullptr), "", "../etc/passwd", "a'b", "\xff\xfe", overlong.c_str()}) {
         EXPECT_EQ(Get(bad), Failed(kBad)) << (bad ? bad : "null");
         EXPECT_EQ(Remove(bad), Failed(kBad)) << (bad ? bad : "null");
     }

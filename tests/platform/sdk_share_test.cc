@@ -112,7 +112,8 @@ TEST_F(SdkShare, RecordsAndAccessRights) {
 TEST_F(SdkShare, GeneratorsTakeOnlyTheirKindOfName) {
     const std::string bad = "<null 0xd00>";
     app_.SetDomain("CORP").SetDirectory("ldap.corp.example");
-    const struct { PSZLIST (*gen)(const char *, const char *, int, int); const char *user; int writable; std::string want; } rows[] = {
+    using Generator = PSZLIST (*)(const char *, const char *, int, int);
+    const struct { Generator gen; const char *user; int writable; std::string want; } rows[] = {
         {QuibCgiDomValidShareGen, "CORP\\dave", 0, "public,Docs"},  // hidden and no-access shares are out
         {QuibCgiLDAPValidShareGen, "erin@corp.example", 1, "public,closed"},  // read-write only
         {QuibCgiLDAPValidShareGen, "CORP\\x@y", 0, bad}, {QuibCgiDomValidShareGen, "alice", 0, bad},

@@ -138,8 +138,8 @@ TEST_F(SettingsFile, RejectsBadArguments) {
           OUTCOME(VLIBCFileGetKeyValue(kFile, "key", buf, 8, 2)), OUTCOME(VLIBCFileGetKeyValue(kFile, "key", nullptr, 8, 0)),
           OUTCOME(VLIBCFileSetKeyValue(kFile, nullptr, "v", 0)), OUTCOME(VLIBCFileSetKeyValue(kFile, "key", nullptr, 0)),
           OUTCOME(VLIBCFileSetKeyValue(kFile, "key", "v", 2)), OUTCOME(VLIBCFileRemoveKey(kFile, nullptr)),
-          OUTCOME(VLIBCFileCheckKeyValue(kFile, "key", nullptr, 0)), OUTCOME(VLIBCFileCheckKeyValue(kFile, "key", "v", 5)),
-          OUTCOME(VLIBCFileGetKeys(kFile, nullptr, nullptr))}) {
+          OUTCOME(VLIBCFileCheckKeyValue(kFile, "key", nullptr, 0)), OUTCOME(VLIBCFileGetKeys(kFile, nullptr, nullptr)),
+          OUTCOME(VLIBCFileCheckKeyValue(kFile, "key", "v", 5))}) {
         EXPECT_EQ(outcome, bad);
     }
     const Outcome tooLong{-1, QUIB_ERR_NAME_TOO_LONG};
@@ -261,8 +261,9 @@ TEST_F(SettingsFile, ConcurrentWritersNeitherTearNorLoseUpdates) {
         [](int index) {
             for (int i = 1; i <= 300; ++i) {
                 const std::string key = index < 2 ? "payload" : "writer" + std::to_string(index);
-                const std::string value = index < 2 ? std::string(1000 + (i * 7919) % 60000, static_cast<char>('a' + index * 13 + i % 13))
-                                                    : std::to_string(i);
+                const char letter = static_cast<char>('a' + index * 13 + i % 13);
+                const std::string value =
+                    index < 2 ? std::string(1000 + (i * 7919) % 60000, letter) : std::to_string(i);
                 if (VLIBCFileSetKeyValue(kFile, key.c_str(), value.c_str(), 0) != 0) {
                     return 1;
                 }

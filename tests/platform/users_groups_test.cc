@@ -62,7 +62,8 @@ TEST_F(UsersAndGroups, Records) {
         PQUIBUSER user = nullptr;
         ASSERT_EQ(QUIBUserGet(name, &user), 0) << name;
         EXPECT_EQ(std::tuple(user->nUID, user->nGID, user->authType, std::string(user->szHome)),
-                  std::tuple(app_.Uid(name), app_.Gid("users"), QUIBUserAuthTypeOf(name), "/volume1/homes/" + std::string(name)));
+                  std::tuple(app_.Uid(name), app_.Gid("users"), QUIBUserAuthTypeOf(name),
+                             "/volume1/homes/" + std::string(name)));
         QUIBUserFree(user);
     }
     uid_t uid = 0;

@@ -57,8 +57,9 @@ TEST_F(WebManTest, TheSidComesFromTheIdCookieOrElseTheSidParameter) {
     // what reaches the login records: attacks on the lookup, and which of two sids is live.
     struct Case { std::string cookie, query, sid; } cases[] = {
         {"lang=en; id=" + alice, "", alice}, {"id=" + alice.substr(1), "", ""}, {"id=" + alice + "x", "", ""},
-        {"id=" + alice + "' OR '1'='1", "", ""}, {"id=" + huge, "", ""}, {"", "api=x&_sid=" + bob + "&version=1", bob},
-        {"", "_sid=" + EncodeAll(bob), bob}, {"", "_sid=" + bob + "%00", ""}, {"", "_sid=" + bob.substr(0, 31) + "%2", ""},
+        {"id=" + alice + "' OR '1'='1", "", ""}, {"id=" + huge, "", ""},
+        {"", "api=x&_sid=" + bob + "&version=1", bob}, {"", "_sid=" + EncodeAll(bob), bob},
+        {"", "_sid=" + bob + "%00", ""}, {"", "_sid=" + bob.substr(0, 31) + "%2", ""},
         // A browser may still send a stale cookie while the page passes a live sid.
         {"id=" + stale, "_sid=" + bob, bob}, {"id=garbage'--", "_sid=" + bob, bob}, {"id=" + bob, "_sid=" + stale, bob},
     };
