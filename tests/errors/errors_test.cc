@@ -8,14 +8,6 @@
 
 namespace {
 
-TEST(ErrorSlot, SetReturnsTheCodeAndGetReadsIt) {
-    EXPECT_EQ(NvoLibGetErr(), 0);
-    EXPECT_EQ(NvoLibSetErr(407), 407);
-    EXPECT_EQ(NvoLibGetErr(), 407);
-    NvoLibSetErr(0);
-    EXPECT_EQ(NvoLibGetErr(), 0);
-}
-
 // What every entry point answers instead of letting an exception out.
 TEST(ErrorSlot, TheGuardTurnsExceptionsIntoFailureAndACode) {
     EXPECT_EQ(norvo::Guarded(-1, [] { return 7; }), 7);
@@ -26,10 +18,7 @@ TEST(ErrorSlot, TheGuardTurnsExceptionsIntoFailureAndACode) {
 }
 
 TEST(ErrnoMapping, EveryErrnoMapsAsTabled) {
-    const struct {
-        int err;
-        int code;
-    } table[] = {
+    const struct { int err, code; } table[] = {
         {EPERM, 407},  {EACCES, 407}, {ENOENT, 408},       {ENOTDIR, 408}, {EIO, 417},
         {EBUSY, 420},  {EEXIST, 414}, {ENOTEMPTY, 414},    {ENOSPC, 416},  {EROFS, 411},
         {EDQUOT, 415}, {ENAMETOOLONG, 412}, {0, 401},      {EINVAL, 401},  {EXDEV, 401},
@@ -45,10 +34,7 @@ TEST(ErrnoMapping, EveryErrnoMapsAsTabled) {
 }
 
 TEST(QuibMapping, EveryPlatformCodeMapsAsTabled) {
-    const struct {
-        int quib;
-        int code;
-    } table[] = {
+    const struct { int quib, code; } table[] = {
         {0x0300, 407}, {0x0600, 408}, {0x0700, 408}, {0x2400, 415}, {0x2900, 416}, {0x8400, 411},
         {0xA500, 419}, {0xC300, 412}, {0x0000, 401}, {0x0D00, 401}, {0x1400, 401}, {0xD800, 401},
         {-1, 401},
@@ -59,10 +45,7 @@ TEST(QuibMapping, EveryPlatformCodeMapsAsTabled) {
 }
 
 TEST(MessageKeys, EveryCodeHasItsKeyAndOnlyUnknownCodesTakeTheFallback) {
-    const struct {
-        int code;
-        const char *key;  // nullptr: the fallback is returned
-    } table[] = {
+    const struct { int code; const char *key; } table[] = {  // key nullptr: the fallback is returned
         {400, "error:error_error_system"}, {401, "error:error_error_system"}, {402, "error:error_error_system"},
         {403, "error:error_invalid_user_group"}, {404, "error:error_invalid_user_group"},
         {405, "error:error_invalid_user_group"}, {406, "error:error_testjoin"},

@@ -57,14 +57,11 @@ protected:
     Appliance app_;
 };
 
+// Each kind alone is the enumeration's (tests/norvoenum); here the order and a mask of two kinds.
 TEST_F(AccountDB, CursorsDeliverTheSelectedKindsInDatabaseOrder) {
-    const int descriptors = norvo::testing::OpenDescriptors();
     EXPECT_EQ(UserNames(AUTH_ALL), (Strings{"root", "nobody", "admin", "alice", "bob", "CORP\\dave", "erin@corp.example"}));
-    EXPECT_EQ(UserNames(AUTH_LOCAL), (Strings{"root", "nobody", "admin", "alice", "bob"}));
     EXPECT_EQ(UserNames(static_cast<AUTH_TYPE>(AUTH_DOMAIN | AUTH_LDAP)), (Strings{"CORP\\dave", "erin@corp.example"}));
     EXPECT_EQ(GroupNames(AUTH_ALL), (Strings{"root", "users", "administrators", "nogroup", "staff", "CORP\\domain users"}));
-    EXPECT_EQ(GroupNames(AUTH_DOMAIN), Strings{"CORP\\domain users"});
-    EXPECT_EQ(norvo::testing::OpenDescriptors(), descriptors);
 }
 
 TEST_F(AccountDB, BadArgumentsAndBrokenDatabases) {
@@ -105,7 +102,6 @@ std::pair<int, Strings> GroupList(const char *user, int flags = 0) {
 
 TEST_F(AccountDB, GroupListIsDecimalIdsPrimaryFirst) {
     const auto id = [this](const std::string &group) { return std::to_string(app_.Gid(group)); };
-    EXPECT_EQ(GroupList("CORP\\dave"), std::make_pair(0, Strings{id("users"), id("CORP\\domain users")}));
     UserSpec joiner{.name = "joiner"};
     for (int i = 0; i < 600; ++i) {
         joiner.groups.push_back("team" + std::to_string(i));
@@ -113,12 +109,12 @@ TEST_F(AccountDB, GroupListIsDecimalIdsPrimaryFirst) {
     app_.AddUser(joiner);
     const Strings many = GroupList("joiner").second;  // the one-slot list had to grow
     ASSERT_EQ(many.size(), 601u);
+    EXPECT_EQ(many.front(), id("users"));
     EXPECT_EQ(many.back(), id("team599"));
 
     EXPECT_EQ(GroupList("zed"), std::make_pair(static_cast<int>(QUIB_ERR_NO_SUCH_USER), Strings{}));
     EXPECT_EQ(GroupList("alice", 1), std::make_pair(static_cast<int>(QUIB_ERR_BAD_PARAMETER), Strings{}));
-    const std::string tooLong(300, 'a');
-    for (const char *bad : {static_cast<const char *>(nullptr), "", tooLong.c_str(), "\xff\xfe", "a\nb"}) {
+    for (const char *bad : {static_cast<const char *>(nullptr), "", "\xff\xfe", "a\nb"}) {
         EXPECT_EQ(GroupList(bad), std::make_pair(static_cast<int>(QUIB_ERR_BAD_PARAMETER), Strings{}));
     }
     PSZLIST none = nullptr;

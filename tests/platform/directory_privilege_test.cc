@@ -62,21 +62,18 @@ TEST_F(DirectoryPrivilege, TheListsDecideForALiveLoginOfThatAccountOnly) {
     const char *erin = sids_["erin@corp.example"].c_str(), *alice = sids_["alice"].c_str();
     const std::string longName = "CORP\\" + std::string(5000, 'd');
     constexpr int kDenied = QUIB_ERR_ACCESS_DENIED, kBad = QUIB_ERR_BAD_PARAMETER;
+    // The plain answers through the library are its share privilege test's.
     struct Case { Lookup lookup; const char *share, *user, *sid; std::pair<int, int> want; } cases[] = {
-        {kDom, "docs", "CORP\\dave", dave, {0, 2}}, {kDom, "docs", "corp\\Dave", dave, {0, 2}},  // names ignore case
-        {kDom, "DOCS", "CORP\\dave", dave, {0, 2}}, {kDom, "docs", "CORP\\eve", eve, {0, 1}},  // through @corpstaff
+        {kDom, "docs", "corp\\Dave", dave, {0, 2}},  // names ignore case
+        {kDom, "docs", "CORP\\eve", eve, {0, 1}},  // through @corpstaff
         {kDom, "both", "CORP\\dave", dave, {0, 0}},  // no access wins over read-write
-        {kDom, "closed", "CORP\\dave", dave, {0, 0}}, {kLdap, "docs", "erin@corp.example", erin, {0, 2}},
         {kLdap, "closed", "erin@corp.example", erin, {0, 0}},
         // Only a live login of that very account counts.
-        {kDom, "docs", "CORP\\dave", eve, {-1, kDenied}}, {kLdap, "docs", "erin@corp.example", dave, {-1, kDenied}},
+        {kLdap, "docs", "erin@corp.example", dave, {-1, kDenied}},
         {kDom, "docs", "CORP\\dave", "AAAAAAAAAAAAAAAAAAAAAAAAAAAAAAAA", {-1, kDenied}},
         // A domain lookup is for domain names, a directory lookup for directory names.
-        {kDom, "docs", "alice", alice, {-1, kBad}}, {kDom, "docs", "erin@corp.example", erin, {-1, kBad}},
-        {kLdap, "docs", "CORP\\eve", eve, {-1, kBad}}, {kLdap, "docs", "alice", alice, {-1, kBad}},
-        {kDom, "nosuch", "CORP\\dave", dave, {-1, QUIB_ERR_NO_SUCH_SHARE}},
-        {kDom, nullptr, "CORP\\dave", dave, {-1, kBad}},
-        {kDom, "docs", nullptr, dave, {-1, kBad}}, {kDom, "docs", "CORP\\dave", nullptr, {-1, kBad}},
+        {kDom, "docs", "alice", alice, {-1, kBad}}, {kLdap, "docs", "CORP\\eve", eve, {-1, kBad}},
+        {kDom, "nosuch", "CORP\\dave", dave, {-1, QUIB_ERR_NO_SUCH_SHARE}}, {kDom, "docs", nullptr, dave, {-1, kBad}},
         {kDom, "docs", "CORP\\\xff\xfe", dave, {-1, kBad}}, {kDom, "docs", longName.c_str(), dave, {-1, kBad}},
     };
     for (const Case &c : cases) {

@@ -37,10 +37,8 @@ TEST(FsType, NamesAndAliasesJoinTheirFamilies) {
         {"fuse", "fusefat", kFat},  // FUSE without subtype: the source names the driver
         {"fuse.exfat", "/dev/sdc1", kExfat}, {"fuseblk.exfat", "/dev/sdc1", kExfat}, {"udf", "/dev/sr0", kIso},
         {"squashfs", "/x.img", kIso}, {"fuse.fuseiso", "fuseiso", kIso}, {"smb3", "//srv/share", kRemote},
-        {"smbfs", "", kRemote}, {"nfs", "srv:/export", kRemote}, {"nfs4", "srv:/", kRemote}, {"ceph", "", kRemote},
-        {"9p", "", kRemote}, {"fuse.sshfs", "me@host:", kRemote}, {"fuse.sshfs", nullptr, kRemote},
-        {"fuse", "sshfs", kRemote}, {"fuse.rclone", "", kRemote}, {"fuse.s3fs", "", kRemote},
-        {"fuse.davfs", "", kRemote}, {"fuse.curlftpfs", "", kRemote}, {"fuse.norvo-deadremote", "deadremote", kRemote},
+        {"nfs4", "srv:/", kRemote}, {"fuse.sshfs", nullptr, kRemote}, {"fuse", "sshfs", kRemote},
+        {"fuse.norvo-deadremote", "deadremote", kRemote},
         {"fuseblk", "/tmp/exfat.img", kExfat}, {"fuseblk", "/tmp/ntfs.img", kUnknown},
         {"fuseblk", "/tmp/short.img", kUnknown}, {"fuseblk", "/tmp/missing.img", kUnknown},
         {"fuse", "/tmp/exfat.img", kUnknown},  // not a block mount
@@ -49,17 +47,11 @@ TEST(FsType, NamesAndAliasesJoinTheirFamilies) {
         {"fuse", "unknowndriver", kUnknown}, {"fuse.", "", kUnknown}, {"overlay", "overlay", kUnknown},
         {"proc", "proc", kUnknown}, {"", "", kUnknown}, {"\xff\xfe", "\xc3", kUnknown},
     };
-    const int before = OpenDescriptors();
     for (const Case &c : cases) {
         EXPECT_EQ(QUIBFSTypeFromName(c.type, c.source), c.index)
             << c.type << " from " << (c.source ? c.source : "null");
     }
-    EXPECT_EQ(OpenDescriptors(), before);
     EXPECT_EQ(OUTCOME(QUIBFSTypeFromName(nullptr, "x")), Failed(QUIB_ERR_BAD_PARAMETER));
-    for (int index = -1; index <= 12; ++index) {
-        EXPECT_EQ(QUIBFSIsRemoteFS(index), index == FSTYPE_REMOTE ? 1 : 0) << index;
-        EXPECT_EQ(QUIBFSIsImageFS(index), index == FSTYPE_ISO ? 1 : 0) << index;
-    }
 }
 
 TEST(MountTable, EachPathIsHeldByItsDeepestDataMount) {
@@ -76,7 +68,6 @@ TEST(MountTable, EachPathIsHeldByItsDeepestDataMount) {
     ASSERT_EQ(mkdir("/volume1/usb/sub", 0755), 0);  // FAT takes no chmod, so not MakeDir
     ASSERT_EQ(chdir("/volume1/usb"), 0);            // relative paths start here
     const std::string overlong = "/" + std::string(PATH_MAX, 'a');
-    const int before = OpenDescriptors();
 
     // The table is read lexically, without touching the path: missing paths are classed too.
     constexpr int kTmp = FSTYPE_TMPFS, kFat = FSTYPE_FAT, kRemote = FSTYPE_REMOTE, kNotMount = FSTYPE_NOT_MOUNT_POINT;
@@ -117,7 +108,6 @@ TEST(MountTable, EachPathIsHeldByItsDeepestDataMount) {
     }
     EXPECT_EQ(OUTCOME(QUIBGetFSType(nullptr, 0)), Failed(QUIB_ERR_BAD_PARAMETER, EINVAL));
     EXPECT_NE(QUIBGetFSType("/srv", 0), -1);
-    EXPECT_EQ(OpenDescriptors(), before);
     EXPECT_TRUE(appliance.RunAs("alice", [] {
         return OUTCOME(QUIBGetFSType("/volume1/closed/x", 0)) == Failed(QUIB_ERR_ACCESS_DENIED, EACCES);
     }));

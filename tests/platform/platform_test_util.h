@@ -1,7 +1,6 @@
 // Helpers shared by the platform tests.
 #pragma once
 
-#include <dirent.h>
 #include <errno.h>
 
 #include <ostream>
@@ -9,16 +8,6 @@
 #include "vlibc_err.h"
 
 namespace norvo::testing {
-
-// Open descriptors of this process, to prove every path releases what it opened.
-inline int OpenDescriptors() {
-    int count = 0;
-    if (DIR *dir = opendir("/proc/self/fd")) {
-        while (readdir(dir) != nullptr) ++count;
-        closedir(dir);
-    }
-    return count;
-}
 
 // What a call left behind: its result, the error slot and errno; kAny is not compared (the slot
 // is not cleared on success, nor promised to stay untouched then).

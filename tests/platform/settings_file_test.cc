@@ -7,10 +7,10 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <chrono>
 #include <filesystem>
 #include <fstream>
 #include <iterator>
+#include <regex>
 #include <string>
 #include <vector>
 
@@ -126,58 +126,34 @@ TEST_F(SettingsFile, ReaderResultsAndErrors) {
     EXPECT_EQ(access(kNone, F_OK), -1);  // remove never creates
 }
 
+// Which keys and values a writer refuses, and that it then leaves the file alone, the settings
+// fuzzer asserts (an accepted one must read back); here what it can't reach.
 TEST_F(SettingsFile, RejectsBadArguments) {
     Put("key=\"v\"\n");
-    std::string longKey(300, 'k');
     std::string longPath = "/tmp/" + std::string(PATH_MAX, 'p');
     char buf[16];
     const Outcome bad{-1, QUIB_ERR_BAD_PARAMETER};
-    const Outcome tooLong{-1, QUIB_ERR_NAME_TOO_LONG};
-    const struct { const char *file, *key; char *buf; int flags; Outcome outcome; } reads[] = {
-        {nullptr, "key", buf, 0, bad},  {longPath.c_str(), "key", buf, 0, tooLong}, {kFile, nullptr, buf, 0, bad},
-        {kFile, "", buf, 0, bad},       {kFile, "a=b", buf, 0, bad},   {kFile, "line\nbreak", buf, 0, bad},
-        {kFile, "\xff\xfe", buf, 0, bad}, {kFile, longKey.c_str(), buf, 0, bad}, {kFile, "key", buf, 2, bad},
-        {kFile, "key", nullptr, 0, bad},
-    };
-    for (const auto &row : reads) {
-        EXPECT_EQ(OUTCOME(VLIBCFileGetKeyValue(row.file, row.key, row.buf, 8, row.flags)), row.outcome)
-            << (row.key ? row.key : "(null key)") << " flags " << row.flags;
-    }
-    const struct { const char *file, *key, *value; int format; Outcome outcome; } writes[] = {
-        {nullptr, "k", "v", 0, bad},       {longPath.c_str(), "k", "v", 0, tooLong}, {kFile, nullptr, "v", 0, bad},
-        {kFile, "", "v", 0, bad},          {kFile, "two words", "v", 0, bad},      {kFile, "a=b", "v", 0, bad},
-        {kFile, "#key", "v", 0, bad},      {kFile, "\"key", "v", 0, bad},          {kFile, "\xff", "v", 0, bad},
-        {kFile, longKey.c_str(), "v", 0, bad}, {kFile, "key", nullptr, 0, bad},    {kFile, "key", "line\nbreak", 0, bad},
-        {kFile, "key", "cr\rhere", 0, bad}, {kFile, "key", "\xc3(", 0, bad},       {kFile, "key", " padded", 1, bad},
-        {kFile, "key", "padded ", 1, bad}, {kFile, "key", "\"quoted", 1, bad},      {kFile, "key", "v", 2, bad},
-    };
-    for (const auto &row : writes) {
-        EXPECT_EQ(OUTCOME(VLIBCFileSetKeyValue(row.file, row.key, row.value, row.format)), row.outcome)
-            << (row.key ? row.key : "(null)") << " = " << (row.value ? row.value : "(null)");
-    }
     for (const Outcome &outcome :
-         {OUTCOME(VLIBCFileRemoveKey(kFile, nullptr)), OUTCOME(VLIBCFileCheckKeyValue(kFile, "key", nullptr, 0)),
-          OUTCOME(VLIBCFileCheckKeyValue(kFile, "key", "v", 5)), OUTCOME(VLIBCFileGetKeys(kFile, nullptr, nullptr))}) {
+         {OUTCOME(VLIBCFileGetKeyValue(nullptr, "key", buf, 8, 0)), OUTCOME(VLIBCFileGetKeyValue(kFile, "a=b", buf, 8, 0)),
+          OUTCOME(VLIBCFileGetKeyValue(kFile, "key", buf, 8, 2)), OUTCOME(VLIBCFileGetKeyValue(kFile, "key", nullptr, 8, 0)),
+          OUTCOME(VLIBCFileSetKeyValue(kFile, nullptr, "v", 0)), OUTCOME(VLIBCFileSetKeyValue(kFile, "key", nullptr, 0)),
+          OUTCOME(VLIBCFileSetKeyValue(kFile, "key", "v", 2)), OUTCOME(VLIBCFileRemoveKey(kFile, nullptr)),
+          OUTCOME(VLIBCFileCheckKeyValue(kFile, "key", nullptr, 0)), OUTCOME(VLIBCFileGetKeys(kFile, nullptr, nullptr)),
+          OUTCOME(VLIBCFileCheckKeyValue(kFile, "key", "v", 5))}) {
         EXPECT_EQ(outcome, bad);
     }
+    const Outcome tooLong{-1, QUIB_ERR_NAME_TOO_LONG};
+    EXPECT_EQ(OUTCOME(VLIBCFileGetKeyValue(longPath.c_str(), "key", buf, 8, 0)), tooLong);
+    EXPECT_EQ(OUTCOME(VLIBCFileSetKeyValue(longPath.c_str(), "k", "v", 0)), tooLong);
     EXPECT_EQ(ReadText(kFile), "key=\"v\"\n");  // nothing was written
 }
 
-TEST_F(SettingsFile, RewriteKeepsEverythingElse) {
-    const std::string head = "# Appliance settings\r\n\r\n  # indented comment\r\n";
-    Put(head + "first = unquoted\r\nmalformed line\r\nkey=\"old\"\r\nkey=\"duplicate\"\r\nlast=\"no newline\"");
-    ASSERT_EQ(VLIBCFileSetKeyValue(kFile, "key", "new \"one\"", 0), 0);
-    EXPECT_EQ(ReadText(kFile),
-              head + "first = unquoted\r\nmalformed line\r\nkey=\"new \\\"one\\\"\"\r\nlast=\"no newline\"");
-    ASSERT_EQ(VLIBCFileSetKeyValue(kFile, "added", "1", 0), 0);
-    EXPECT_EQ(ReadText(kFile), head + "first = unquoted\r\nmalformed line\r\nkey=\"new \\\"one\\\"\"\r\n"
-                                      "last=\"no newline\"\r\nadded=\"1\"\r\n");
-    ASSERT_EQ(VLIBCFileRemoveKey(kFile, "first"), 0);
-    ASSERT_EQ(VLIBCFileRemoveKey(kFile, "last"), 0);
-    EXPECT_EQ(ReadText(kFile), head + "malformed line\r\nkey=\"new \\\"one\\\"\"\r\nadded=\"1\"\r\n");
-
-    // Remove takes every occurrence; removing an absent key or setting the value a key
-    // already has does not rewrite the file.
+// That no other line moves or changes the settings fuzzer asserts; here the duplicates of a key,
+// which a set and a remove both take, and the rewrites that are left out.
+TEST_F(SettingsFile, RewriteTakesDuplicatesAndSkipsNoChange) {
+    Put("# note\r\nkey=\"old\"\r\nkey=\"duplicate\"\r\nlast=\"no newline\"");
+    ASSERT_EQ(VLIBCFileSetKeyValue(kFile, "key", "new", 0), 0);
+    EXPECT_EQ(ReadText(kFile), "# note\r\nkey=\"new\"\r\nlast=\"no newline\"");
     Put("a=\"1\"\n# note\na=\"2\"\nb=\"3\"\n");
     ASSERT_EQ(VLIBCFileRemoveKey(kFile, "a"), 0);
     EXPECT_EQ(ReadText(kFile), "# note\nb=\"3\"\n");
@@ -242,9 +218,7 @@ TEST_F(SettingsFile, WriterFailuresAreTranslatedAndLeaveNoTrace) {
 }
 
 // Runs body(index) in count children, calling between() until every child has exited; true
-// when each returned 0. Children still running after 30 s (the whole normally takes well under
-// a second) are stopped with SIGSEGV first, so that a sanitized build prints where each was
-// stuck, then killed; that counts as failure.
+// when each returned 0. (A writer that hangs is ctest's timeout to catch.)
 template <typename Body, typename Between>
 bool InChildren(int count, Body body, Between between) {
     std::vector<pid_t> pids;
@@ -255,22 +229,11 @@ bool InChildren(int count, Body body, Between between) {
             _exit(body(i));
         }
     }
-    const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(30);
     bool ok = true;
     while (!pids.empty()) {
-        if (std::chrono::steady_clock::now() > deadline) {
-            ADD_FAILURE() << pids.size() << " writer(s) still running after 30 s";
-            for (const pid_t pid : pids) kill(pid, SIGSEGV);
-            sleep(2);
-            for (const pid_t pid : pids) {
-                kill(pid, SIGKILL);
-                waitpid(pid, nullptr, 0);
-            }
-            return false;
-        }
         between();
         int status = 0;
-        pid_t done = waitpid(pids.back(), &status, WNOHANG);
+        const pid_t done = waitpid(pids.back(), &status, WNOHANG);
         if (done != 0) {
             ok = ok && done == pids.back() && WIFEXITED(status) && WEXITSTATUS(status) == 0;
             pids.pop_back();
@@ -279,26 +242,29 @@ bool InChildren(int count, Body body, Between between) {
     return ok;
 }
 
-// True when text is before + one byte repeated + after.
-bool WholeAround(const std::string &text, const std::string &before, const std::string &after) {
-    size_t size = text.size() - std::min(text.size(), before.size() + after.size());
-    std::string middle = text.substr(std::min(text.size(), before.size()), size);
-    return size > 0 && text.rfind(before, 0) == 0 && text.compare(before.size() + size, after.size(), after) == 0 &&
-           middle.find_first_not_of(middle[0]) == std::string::npos;
-}
-
-TEST_F(SettingsFile, ReadersNeverSeeATornFile) {
+// Two writers put large values of one repeated letter, where a mixture of two writes would
+// show; two others count their own key up, where a lost update would show.
+TEST_F(SettingsFile, ConcurrentWritersNeitherTearNorLoseUpdates) {
     const std::string top = "# header comment\nhead=\"H\"\n\n# middle comment\npayload=\"";
     Put(top + "x\"\ntail=\"T\"\n");
+    const std::regex counters("(writer[23]=\"[0-9]+\"\n)*");
+    const auto whole = [&](const std::string &text) {
+        const size_t end = text.find('"', top.size());
+        return text.rfind(top, 0) == 0 && end != std::string::npos && end > top.size() &&
+               text.find_first_not_of(text[top.size()], top.size()) == end &&
+               text.compare(end, 11, "\"\ntail=\"T\"\n") == 0 && std::regex_match(text.substr(end + 11), counters);
+    };
     int reads = 0;
     int torn = 0;
     bool ok = InChildren(
-        2,
+        4,
         [](int index) {
-            for (int i = 0; i < 300; ++i) {
-                // Large values of one repeated letter: a mixture of two writes would show.
-                std::string value(1000 + (i * 7919) % 60000, static_cast<char>('a' + index * 13 + i % 13));
-                if (VLIBCFileSetKeyValue(kFile, "payload", value.c_str(), 0) != 0) {
+            for (int i = 1; i <= 300; ++i) {
+                const std::string key = index < 2 ? "payload" : "writer" + std::to_string(index);
+                const char letter = static_cast<char>('a' + index * 13 + i % 13);
+                const std::string value =
+                    index < 2 ? std::string(1000 + (i * 7919) % 60000, letter) : std::to_string(i);
+                if (VLIBCFileSetKeyValue(kFile, key.c_str(), value.c_str(), 0) != 0) {
                     return 1;
                 }
             }
@@ -306,33 +272,11 @@ TEST_F(SettingsFile, ReadersNeverSeeATornFile) {
         },
         [&] {
             ++reads;
-            bool whole = WholeAround(KeysOf(kFile), "3: head=H payload=", " tail=T") &&
-                         WholeAround(ReadText(kFile), top, "\"\ntail=\"T\"\n");
-            torn += whole ? 0 : 1;
+            torn += whole(ReadText(kFile)) ? 0 : 1;
         });
     EXPECT_TRUE(ok);
     EXPECT_EQ(torn, 0) << "of " << reads << " reads";
-}
-
-TEST_F(SettingsFile, ConcurrentWritersLoseNoUpdate) {
-    Put("# shared by four writers\n");
-    bool ok = InChildren(
-        4,
-        [](int index) {
-            std::string key = "writer" + std::to_string(index);
-            for (int i = 1; i <= 500; ++i) {
-                if (VLIBCFileSetKeyValue(kFile, key.c_str(), std::to_string(i).c_str(), 0) != 0) {
-                    return 1;
-                }
-            }
-            return 0;
-        },
-        [] { usleep(1000); });
-    ASSERT_TRUE(ok);
-    for (const char *key : {"writer0", "writer1", "writer2", "writer3"}) {
-        EXPECT_EQ(Get(kFile, key), "500") << key;
-    }
-    EXPECT_EQ(ReadText(kFile).rfind("# shared by four writers\n", 0), 0u);
+    EXPECT_EQ(Get(kFile, "writer2") + " " + Get(kFile, "writer3"), "300 300");
     EXPECT_EQ(DirEntries(kDir), (Strings{"test.conf"}));
 }
 

@@ -5,6 +5,7 @@
 
 #include <fstream>
 #include <string>
+#include <tuple>
 #include <vector>
 
 #include <gtest/gtest.h>
@@ -54,34 +55,24 @@ protected:
     norvo::testing::Appliance app_;
 };
 
+// Names by id are the enumeration's (tests/norvoenum); here the lookups by name, and a group
+// too big for the first NSS buffer.
 TEST_F(UsersAndGroups, Records) {
     for (const char *name : {"alice", "CORP\\dave", "erin@corp.example"}) {
         PQUIBUSER user = nullptr;
-        ASSERT_EQ(QUIBUserGetByUID(app_.Uid(name), &user, 1), 0) << name;
-        EXPECT_STREQ(user->szName, name);
-        EXPECT_EQ(user->nGID, app_.Gid("users")) << name;
-        EXPECT_EQ(user->authType, QUIBUserAuthTypeOf(name)) << name;
-        QUIBUserFree(user);
         ASSERT_EQ(QUIBUserGet(name, &user), 0) << name;
-        EXPECT_EQ(user->nUID, app_.Uid(name)) << name;
-        EXPECT_EQ(std::string(user->szHome), std::string("/volume1/homes/") + name);
+        EXPECT_EQ(std::tuple(user->nUID, user->nGID, user->authType, std::string(user->szHome)),
+                  std::tuple(app_.Uid(name), app_.Gid("users"), QUIBUserAuthTypeOf(name),
+                             "/volume1/homes/" + std::string(name)));
         QUIBUserFree(user);
     }
     uid_t uid = 0;
     gid_t gid = 0;
-    ASSERT_EQ(QUIBUserGetUGID("bob", &uid, nullptr), 0);
-    EXPECT_EQ(uid, app_.Uid("bob"));
-    ASSERT_EQ(QUIBUserGetUGID("bob", nullptr, &gid), 0);
-    EXPECT_EQ(gid, app_.Gid("users"));
-    ASSERT_EQ(QUIBGroupGetGID("staff", &gid), 0);
-    EXPECT_EQ(gid, app_.Gid("staff"));
-
-    const std::string staff = "staff " + std::to_string(app_.Gid("staff")) + ": alice bob";
-    EXPECT_EQ(GroupLine("staff"), staff);
+    ASSERT_EQ(QUIBUserGetUGID("bob", &uid, &gid), 0);
+    EXPECT_EQ(std::pair(uid, gid), std::pair(app_.Uid("bob"), app_.Gid("users")));
     PQUIBGROUP group = nullptr;
     EXPECT_EQ(QUIBGroupGetByGID(app_.Gid("staff"), &group, 0), 0);
-    EXPECT_EQ(GroupLine(group), staff);
-    EXPECT_EQ(GroupLine("users"), "users " + std::to_string(app_.Gid("users")) + ":");
+    EXPECT_EQ(GroupLine(group), "staff " + std::to_string(app_.Gid("staff")) + ": alice bob");
     Strings big;
     std::string members;
     for (int i = 0; i < 2000; ++i) {
@@ -98,19 +89,15 @@ TEST_F(UsersAndGroups, UnknownIsNotFoundAndBadInputIsRejected) {
     uid_t uid;
     gid_t gid;
     const Outcome noUser{-1, QUIB_ERR_NO_SUCH_USER}, noGroup{-1, QUIB_ERR_NO_SUCH_GROUP};
-    EXPECT_EQ(OUTCOME(QUIBUserGet("zed", &user)), noUser);
     EXPECT_EQ(OUTCOME(QUIBUserGet("ALICE", &user)), noUser);  // local names are exact
     EXPECT_EQ(OUTCOME(QUIBUserGetByUID(424242, &user, 0)), noUser);
-    EXPECT_EQ(OUTCOME(QUIBUserGetUGID("zed", &uid, &gid)), noUser);
     EXPECT_EQ(OUTCOME(QUIBUserIsExpired("zed")), noUser);
-    EXPECT_EQ(OUTCOME(QUIBGroupIsAdminGroupMem("zed")), noUser);
     EXPECT_EQ(OUTCOME(QUIBGroupGet("nogroup-here", &group)), noGroup);
     EXPECT_EQ(OUTCOME(QUIBGroupGetByGID(424242, &group, 0)), noGroup);
-    EXPECT_EQ(OUTCOME(QUIBGroupGetGID("nogroup-here", &gid)), noGroup);
 
     const Outcome bad{-1, QUIB_ERR_BAD_PARAMETER};
     std::string longName(300, 'a');
-    for (const char *name : {static_cast<const char *>(nullptr), "", longName.c_str(), "\xff\xfe", "a\nb", "tab\tname"}) {
+    for (const char *name : {static_cast<const char *>(nullptr), longName.c_str(), "\xff\xfe", "a\nb"}) {
         for (const Outcome &outcome :
              {OUTCOME(QUIBUserGet(name, &user)), OUTCOME(QUIBGroupGet(name, &group)),
               OUTCOME(QUIBUserGetUGID(name, &uid, &gid)), OUTCOME(QUIBGroupGetGID(name, &gid)),
@@ -189,18 +176,14 @@ TEST_F(UsersAndGroups, MembershipAndAdministrators) {
 
 TEST_F(UsersAndGroups, UserLists) {
     const struct { const char *user, *list; int expected; } rows[] = {
-        {"alice", "alice", 1},         {"alice", "bob alice", 1},      {"alice", " ,bob,,\talice, ", 1},
-        {"ALICE", "alice", 1},         {"alice", "alic", 0},           {"alice", "alice2", 0},
-        {"alice", "", 0},              {"alice", ",,,", 0},            {"alice", "@staff", 1},
-        {"alice", "@users", 1},        {"admin", "@staff", 0},         {"admin", "@administrators", 1},
-        {"alice", "@nogroup-here", 0}, {"alice", "@", 0},              {"alice", "\"alice\"", 1},
-        {"alice", "\"bob alice\"", 0},
-        {"zed", "@staff", 0},  // unknown users belong to no group
-        {"zed", "zed", 1},     // names compare without asking NSS
-        {"CORP\\dave", "corp\\DAVE", 1}, {"CORP\\dave", "dave", 0},
-        {"CORP\\dave", "\"@CORP\\domain users\"", 1}, {"CORP\\dave", "@\"CORP\\domain users\"", 1},
+        // Holders, groups and case as the application privileges show them; here the separators,
+        // whole names, the primary group, and quoting.
+        {"alice", " ,bob,,\talice, ", 1}, {"alice", "alic", 0},          {"alice", "alice2", 0},
+        {"alice", ",,,", 0},              {"alice", "@users", 1},        {"alice", "@", 0},
+        {"alice", "\"alice\"", 1},        {"alice", "\"bob alice\"", 0},
+        {"zed", "zed", 1},  // names compare without asking NSS
+        {"CORP\\dave", "dave", 0},        {"CORP\\dave", "@\"CORP\\domain users\"", 1},
         {"CORP\\dave", "@CORP\\domain users", 0},  // unquoted: two entries, neither matches
-        {"alice", "\"@CORP\\domain users\",alice", 1},
     };
     for (const auto &row : rows) {
         EXPECT_EQ(BlSDKUserIsInList(row.user, row.list), row.expected) << row.user << " in [" << row.list << "]";

@@ -53,22 +53,13 @@ TEST_F(WebManTest, TheSidComesFromTheIdCookieOrElseTheSidParameter) {
     const std::string alice = LogIn("alice"), bob = LogIn("bob"), stale = LogIn("admin");
     ASSERT_EQ(QUIBLoginRemove(stale.c_str()), 0);
     const std::string huge(100000, 'A');
+    // How the cookie and the query are read the request fuzzer checks against the rules; here
+    // what reaches the login records: attacks on the lookup, and which of two sids is live.
     struct Case { std::string cookie, query, sid; } cases[] = {
-        {"id=" + alice, "", alice}, {"lang=en; id=" + alice, "", alice}, {"id=" + alice + "; lang=en", "", alice},
-        {"lang=en;id=" + alice + ";x=1", "", alice}, {"  id = " + alice + "  ; other", "", alice},
-        {"id=\"" + alice + "\"", "", alice}, {"noequals; id=" + alice, "", alice},
-        {"id=" + alice + "; id=" + bob, "", alice},  // the first "id" counts, as RFC 6265 orders them
-        {"xid=" + alice, "", ""}, {"id2=" + alice, "", ""}, {"ID=" + alice, "", ""}, {"_sid=" + alice, "", ""},
-        {"i d=" + alice, "", ""}, {"id", "", ""}, {"id=", "", ""}, {"=" + alice, "", ""}, {"id=\"" + alice, "", ""},
-        {"id=" + alice + "x", "", ""}, {"id=" + alice.substr(1), "", ""}, {";;;;", "", ""}, {"", "", ""},
-        {"id=" + huge, "", ""}, {"id=" + alice + "' OR '1'='1", "", ""}, {"id=\x01" + alice, "", ""},
-        {"", "_sid=" + bob, bob}, {"", "api=x&_sid=" + bob + "&version=1", bob}, {"", "%5Fsid=" + bob, bob},
-        {"", "%5fsid=" + bob, bob}, {"", "_sid=" + EncodeAll(bob), bob}, {"", "&&_sid=" + bob + "&&", bob},
-        {"", "_sid=%zz&_sid=" + bob, bob},  // a broken escape skips that parameter only
-        {"", "_sid=" + bob + "%00", ""},    // so does an escaped NUL, which would cut the sid short
-        {"", "sid=" + bob, ""}, {"", "_sid", ""}, {"", "_sid=", ""}, {"", "x_sid=" + bob, ""},
-        {"", "_sid=" + bob + "+", ""}, {"", "_sid=%" + bob, ""}, {"", "_sid=" + bob.substr(0, 31) + "%2", ""},
-        {"", "_sid+=" + bob, ""}, {"", "_sid=" + huge, ""},
+        {"lang=en; id=" + alice, "", alice}, {"id=" + alice.substr(1), "", ""}, {"id=" + alice + "x", "", ""},
+        {"id=" + alice + "' OR '1'='1", "", ""}, {"id=" + huge, "", ""},
+        {"", "api=x&_sid=" + bob + "&version=1", bob}, {"", "_sid=" + EncodeAll(bob), bob},
+        {"", "_sid=" + bob + "%00", ""}, {"", "_sid=" + bob.substr(0, 31) + "%2", ""},
         // A browser may still send a stale cookie while the page passes a live sid.
         {"id=" + stale, "_sid=" + bob, bob}, {"id=garbage'--", "_sid=" + bob, bob}, {"id=" + bob, "_sid=" + stale, bob},
     };
@@ -90,9 +81,8 @@ TEST_F(WebManTest, TheMaskSelectsKindsOfAccount) {
     const std::string alice = "id=" + LogIn("alice"), admin = "id=" + LogIn("admin");
     const std::string dave = "id=" + LogIn("CORP\\dave"), erin = "id=" + LogIn("erin@corp.example");
     struct Case { const std::string &cookie; int mask; bool allowed; } cases[] = {
-        {alice, 0x1, true}, {alice, 0x2, false}, {alice, 0x8, false}, {alice, 0x0, false}, {admin, 0x8, true},
-        {admin, 0x1, true}, {admin, 0x6, false}, {dave, 0x2, true}, {dave, 0x1, false}, {dave, 0x8, false},
-        {erin, 0x4, true}, {erin, 0x3, false}, {erin, 15, true}, {dave, 15, true},
+        {alice, 0x1, true}, {alice, 0xE, false}, {admin, 0x8, true}, {admin, 0x1, true}, {admin, 0x6, false},
+        {dave, 0x2, true}, {dave, 0xD, false}, {erin, 0x4, true}, {erin, 0xB, false}, {erin, 15, true},
     };
     for (const Case &c : cases) {
         EXPECT_EQ(!Authorize(c.cookie, "", c.mask).empty(), c.allowed) << c.cookie << " mask " << c.mask;
