@@ -1,7 +1,8 @@
 // File-system type indexes: the name table and its aliases, the mount table (including a lost
-// network share, where everything but the table fails), and statfs-based lookups.
+// network share, where everything but the table fails), statfs-based lookups, and mount points.
 #include <errno.h>
 #include <limits.h>
+#include <sys/mount.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -12,6 +13,7 @@
 #include "appliance.h"
 #include "platform_test_util.h"
 #include "quib_fs.h"
+#include "quib_webutils.h"
 
 namespace {
 
@@ -111,6 +113,28 @@ TEST(MountTable, EachPathIsHeldByItsDeepestDataMount) {
     EXPECT_TRUE(appliance.RunAs("alice", [] {
         return OUTCOME(QUIBGetFSType("/volume1/closed/x", 0)) == Failed(QUIB_ERR_ACCESS_DENIED, EACCES);
     }));
+}
+
+TEST(MountPoint, KernelMarkOrMountTable) {
+    Appliance app;
+    app.MakeDir("/volume1/dir/sub").MakeDir("/volume1/bound").MakeDir("/volume1/web/cgi");
+    app.MountDeadRemote("/volume1/dead");
+    ASSERT_EQ(mount("/volume1/dir", "/volume1/bound", nullptr, MS_BIND, nullptr), 0);  // same device
+    ASSERT_EQ(symlink("/volume1/bound", "/volume1/link"), 0);
+    ASSERT_EQ(chdir("/volume1/web/cgi"), 0);
+    struct Case {
+        std::string path;
+        bool mountPoint;
+    } cases[] = {
+        {"/", true}, {"/volume1", true}, {"/volume1/", true}, {"/volume1/dir", false}, {"/volume1/dir/sub", false},
+        {"/volume1/bound", true}, {"/volume1/link", false},  // a link is never one
+        {"/volume1/dead", true}, {"/volume1/dead/x", false}, {"/volume1/dir/../dead", true},
+        {"../..", true}, {"..", false}, {"/volume1/missing", false},
+        {"", false}, {std::string("/volume1\0/x", 11), false}, {"/" + std::string(4096, 'a'), false},
+    };
+    for (const Case &c : cases) {
+        EXPECT_EQ(WebUtils::IsMountPoint(c.path), c.mountPoint) << c.path.substr(0, 40);
+    }
 }
 
 }  // namespace
