@@ -31,8 +31,11 @@ std::string UnquoteSingle(std::string_view rest) {
                                                                         : close - 1));
 }
 
+// A line is read up to its first NUL, as a C reader of the file would read it, so every caller
+// (those handing keys and values on as C strings included) sees the same key and value.
 void ParseEntry(SettingsLine *line) {
-    std::string_view body = TrimSpace(line->text);
+    std::string_view body = line->text;
+    body = TrimSpace(body.substr(0, body.find('\0')));
     if (body.empty() || body.front() == '#') {
         return;
     }
