@@ -7,6 +7,7 @@
 #include <stddef.h>
 #include <stdint.h>
 #include <stdlib.h>
+#include <string.h>
 #include <strings.h>
 
 #include <string>
@@ -85,6 +86,35 @@ void CheckResolved(const std::string &path, const std::string &user, const std::
           (folder.size() == volume.size() || folder[volume.size()] == '/'));
 }
 
+// The first or last non-empty component of the path's first 4094 bytes (the copy the token
+// code works on); "" when there is none.
+std::string ComponentOf(const std::string &path, bool first) {
+    const std::string copy = path.substr(0, 4094);
+    std::string found;
+    size_t start = 0;
+    while (start < copy.size()) {
+        size_t end = copy.find('/', start);
+        if (end == std::string::npos) {
+            end = copy.size();
+        }
+        if (end > start) {
+            found = copy.substr(start, end - start);
+            if (first) {
+                break;
+            }
+        }
+        start = end + 1;
+    }
+    return found;
+}
+
+void CheckToken(const std::string &path, int first) {
+    char *token = NvoLibGetTokOfPath(path.c_str(), first);
+    const std::string want = path.find('/') == std::string::npos ? "" : ComponentOf(path, first != 0);
+    Check(want.empty() ? token == nullptr : token != nullptr && want == token);
+    free(token);
+}
+
 }  // namespace
 
 extern "C" int LLVMFuzzerInitialize(int *, char ***) {
@@ -108,6 +138,17 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     const std::string path = newline == std::string::npos ? input : input.substr(newline + 1);
     if (path.size() >= 4096) {
         return 0;  // longer than the path buffers the callers hold
+    }
+
+    CheckToken(path, 1);
+    CheckToken(path, 0);
+
+    // The plain form: the share's folder and the rest of the path, cut to the buffer.
+    char out[4096];
+    if (NvoLibTransFullPath(path.c_str(), out, sizeof(out)) == 0 && strlen(out) < sizeof(out) - 1) {
+        const std::string share = ComponentOf(path, true);
+        const std::string folder = FolderOf(share, user);
+        CheckResolved(path, user, out, share, folder.substr(0, folder.find('/', 1)), folder);
     }
 
     std::string full, share, volume, sharePath;
