@@ -303,7 +303,7 @@ void CheckChain(const std::vector<FindComp *> &made, size_t records) {
         if (c == nullptr || !seen.insert(c).second) {
             continue;
         }
-        Check(seen.size() <= records);
+        Check(seen.size() <= records && memchr(c->value, '\0', sizeof(c->value)) != nullptr);
         todo.push_back(c->andNext);
         todo.push_back(c->orNext);
     }
