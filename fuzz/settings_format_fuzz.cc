@@ -149,6 +149,12 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
 
     WriteText(text);
     const auto before = Entries();
+    // Every reader sees the same value for each key the file lists.
+    for (const auto &[k, v] : before) {
+        std::string got(v.size() + 1, 'x');
+        Check(VLIBCFileGetKeyValue(kFile, k.c_str(), got.data(), got.size(), 0) == static_cast<int>(v.size() + 1));
+        Check(got.compare(0, v.size(), v) == 0 && VLIBCFileCheckKeyValue(kFile, k.c_str(), v.c_str(), 0) == 1);
+    }
     const bool writable = np::IsWritableKey(key) && np::IsWritableValue(value, format);
     const int set = VLIBCFileSetKeyValue(kFile, key.c_str(), value.c_str(), format);
     if (!writable) {
