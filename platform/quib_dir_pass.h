@@ -30,6 +30,13 @@ QUIB_BEGIN_C
 // without a pass: every answer is the same, only dearer.
 QUIB_API QUIBDirPass *QUIBDirPassBegin(const char *dirPath);
 
+// The same over a directory the caller has open already (dirFd; any open mode, O_PATH too),
+// known by dirPath: the pass keeps its own duplicate, so the directory the entries are read in
+// is the one the caller opened, whatever dirPath names by now. Null on failure as above, also
+// EBADF (0x8100) for a descriptor that is not open and ENOTDIR (0x0700) for one that is no
+// directory.
+QUIB_API QUIBDirPass *QUIBDirPassBeginAt(int dirFd, const char *dirPath);
+
 // Ends the pass and frees it; call it on the thread that began the pass. Null is ignored. The
 // thread's current pass becomes the one that was current before it.
 QUIB_API void QUIBDirPassEnd(QUIBDirPass *pass);

@@ -44,5 +44,11 @@ QUIB_API int VLIBCErrFromErrno(int err);
 
 QUIB_END_C
 
-// Platform code sets the slot through this, so the place is always the real one.
-#define QUIB_SET_ERR(code) VLIBCErrSetEx((code), __FILE__, __LINE__)
+// Platform code sets the slot through this, so the place is always the real one: the source
+// file's name, as the library's own places are, never the path it was built from.
+#ifdef __FILE_NAME__
+#define QUIB_SOURCE_NAME __FILE_NAME__
+#else
+#define QUIB_SOURCE_NAME __FILE__
+#endif
+#define QUIB_SET_ERR(code) VLIBCErrSetEx((code), QUIB_SOURCE_NAME, __LINE__)

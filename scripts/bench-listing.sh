@@ -6,6 +6,7 @@
 set -euo pipefail
 root=$(cd "$(dirname "$0")/.." && pwd)
 cd "$root"
+bash scripts/deps.sh --bench
 build=${1:-build-bench}
 if [ ! -x "$build/tools/norvo" ] || [ ! -x "$build/tools/sandbox/norvo-sandbox" ]; then
   bash scripts/build.sh "$build" -DCMAKE_BUILD_TYPE=Release -DNORVO_BUILD_BENCH=ON -DNORVO_BUILD_TESTS=OFF
@@ -14,7 +15,8 @@ norvo=$(cd "$build/tools" && pwd)/norvo
 sandbox=$(cd "$build/tools/sandbox" && pwd)/norvo-sandbox
 command -v hyperfine >/dev/null || { echo "bench-listing.sh: hyperfine is missing" >&2; exit 1; }
 
-# Inside the sandbox /tmp is private: the results go beside the build.
+# Inside the sandbox /tmp is private and the host read-only: the results go beside the build,
+# the one place the sandboxed command writes to the host.
 work=$(cd "$build" && pwd)/bench-listing
 rm -rf "$work" && mkdir -p "$work"
 # 1,000 entries: 950 files and 50 folders, several owners and modes.

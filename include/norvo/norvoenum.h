@@ -188,9 +188,13 @@ public:
     // Lists one directory for a user: entries not hidden and passing every condition (asked
     // with the bare name), filled as info asks (widened by the sort key), sorted by sortKey,
     // reversed unless ascending, counted into *total, then cut to the page [offset, +limit)
-    // unless limit is 0. The conditions stay the caller's. 1 on success; 0 with the error slot
-    // set (400, 402, 407 (also for the user path "/"), 408, 410). Records appended before a
-    // failure stay in out. Changes the working directory to "/".
+    // unless limit is 0. Records out held before take part in the order, the count and the page.
+    // The conditions stay the caller's. realPath must be what NvoFullPathGet made of userPath:
+    // the directory is opened beneath the share's (or home's) folder, and a symbolic link on the
+    // way there fails with 407, as does a user path with a "." or ".." component with 400. Links
+    // inside the directory are seen as links (never followed) and, like devices, not listed.
+    // 1 on success; 0 with the error slot set (400, 401, 402, 407 (also for the user path "/"),
+    // 408, 410). Records appended before a failure stay in out.
     int NvoLibDirEntryListEnum(const char *userPath, const char *realPath, const char *sortKey, int info,
                                unsigned long offset, unsigned long limit, bool ascending, _tag_dir_entry_type_ type,
                                std::vector<FileSearch::FindComp *> conditions, std::list<DIRENTRY_INFO> &out,

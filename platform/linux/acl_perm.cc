@@ -31,13 +31,24 @@ namespace {
 
 enum class Access { kGranted, kDenied, kFailed };
 
-// Denials come as EACCES, EPERM (immutable files) or EROFS; anything else is a real failure.
-Access Check(const char *path, int how, int flags) {
-    if (faccessat(AT_FDCWD, path, how, AT_EACCESS | flags) == 0) {
+// Denials come as EACCES, EPERM (immutable files) or EROFS; anything else is a real failure,
+// whose errno goes to *failure (when given) before another call can overwrite it.
+Access Check(int dir, const char *path, int how, int flags, int *failure = nullptr) {
+    if (faccessat(dir, path, how, AT_EACCESS | flags) == 0) {
         return Access::kGranted;
     }
-    return errno == EACCES || errno == EPERM || errno == EROFS || errno == ETXTBSY ? Access::kDenied
-                                                                                   : Access::kFailed;
+    const int err = errno;
+    if (err == EACCES || err == EPERM || err == EROFS || err == ETXTBSY) {
+        return Access::kDenied;
+    }
+    if (failure != nullptr) {
+        *failure = err;
+    }
+    return Access::kFailed;
+}
+
+Access Check(const char *path, int how, int flags) {
+    return Check(AT_FDCWD, path, how, flags);
 }
 
 bool HasEffectiveCapability(int capability) {
@@ -100,13 +111,18 @@ bool MayDelete(const char *path, const struct statx &entry) {
 
 
 // The kernel's answer: faccessat for each bit (the reference for the evaluation below). The
-// probe has already established ACL support.
-int KernelMask(const char *path, const struct statx &info, const acl::MountFacts &mount, unsigned int *mask) {
-    const Access read = Check(path, R_OK, AT_SYMLINK_NOFOLLOW);
-    const Access write = Check(path, W_OK, AT_SYMLINK_NOFOLLOW);
-    const Access exec = Check(path, X_OK, AT_SYMLINK_NOFOLLOW);
-    if (read == Access::kFailed || write == Access::kFailed || exec == Access::kFailed) {
-        return NORVO_FAIL_ERRNO(errno);
+// probe has already established ACL support. Inside a pass the entry is named in the pass's
+// directory.
+int KernelMask(const char *path, const struct statx &info, const acl::MountFacts &mount, unsigned int *mask,
+               QUIBDirPass *pass, const char *name) {
+    const int dir = pass != nullptr ? pass->dir.Get() : AT_FDCWD;
+    const char *entry = pass != nullptr ? name : path;
+    int failure = 0;  // the errno of the first check that failed
+    const Access read = Check(dir, entry, R_OK, AT_SYMLINK_NOFOLLOW, &failure);
+    const Access write = read == Access::kFailed ? read : Check(dir, entry, W_OK, AT_SYMLINK_NOFOLLOW, &failure);
+    const Access exec = write == Access::kFailed ? write : Check(dir, entry, X_OK, AT_SYMLINK_NOFOLLOW, &failure);
+    if (exec == Access::kFailed) {
+        return NORVO_FAIL_ERRNO(failure);
     }
     const bool appendOnly = HasAttribute(info, STATX_ATTR_APPEND);
     unsigned int result = ACL_PERM_READ_ATTR | ACL_PERM_READ_ACL;
@@ -119,7 +135,7 @@ int KernelMask(const char *path, const struct statx &info, const acl::MountFacts
         // One request for both: an ACL grants only what a single matching group entry
         // holds, so write and search may each pass alone and fail together.
         if (S_ISDIR(info.stx_mode) && exec == Access::kGranted && !appendOnly &&
-            Check(path, W_OK | X_OK, AT_SYMLINK_NOFOLLOW) == Access::kGranted) {
+            Check(dir, entry, W_OK | X_OK, AT_SYMLINK_NOFOLLOW) == Access::kGranted) {
             result |= ACL_PERM_DELETE_CHILD;
         }
     }
@@ -303,6 +319,27 @@ int EvaluatedMask(const char *path, const struct statx &info, const acl::MountFa
     return 0;
 }
 
+// A link is no file to read, write or run, and its own mode (0777) grants nothing: it has
+// attributes to look at and a name that may go.
+int LinkMask(const char *path, const struct statx &info, unsigned int *mask, QUIBDirPass *pass, const char *name) {
+    acl::Identity own;
+    const acl::Identity *who = &own;
+    if (pass != nullptr) {
+        who = PassIdentity(pass);
+        if (who == nullptr) {
+            return NORVO_FAIL_ERRNO(errno);
+        }
+    } else if (!acl::ReadIdentity(&own)) {
+        return NORVO_FAIL_ERRNO(errno);
+    }
+    unsigned int result = ACL_PERM_READ_ATTR | ACL_PERM_READ_ACL;
+    if (pass != nullptr ? PassMayDelete(pass, name, info, *who) : FastMayDelete(path, info, *who)) {
+        result |= ACL_PERM_DELETE;
+    }
+    *mask = result;
+    return 0;
+}
+
 // Whether the file system of info supports POSIX ACLs: 1, 0, or -1 with errno. target is a
 // path on it that can carry an ACL (the directory holding a link).
 int AclSupportOf(const struct statx &info, const char *target, acl::MountFacts *mount, bool follow = false) {
@@ -389,8 +426,11 @@ int QUIBACLPermGet(const char *path, unsigned int *mask) {
                 return NORVO_FAIL_ERRNO(errno);
             }
         }
+        if (link) {
+            return LinkMask(path, info, mask, pass, name);
+        }
         if (!generic || read == AclRead::kMalformed) {
-            return KernelMask(path, info, mount, mask);
+            return KernelMask(path, info, mount, mask, pass, name);
         }
         return EvaluatedMask(path, info, mount, read == AclRead::kFound ? &entries : nullptr, mask, pass, name);
     });

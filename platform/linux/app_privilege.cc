@@ -5,11 +5,15 @@
 #include <errno.h>
 #include <string.h>
 
+#include <algorithm>
+#include <memory>
 #include <string>
 #include <vector>
 
+#include "app_privilege.h"
+
 #include "api_guard.h"
-#include "locked_file.h"
+#include "parsed_file.h"
 #include "name_list.h"
 #include "nss.h"
 #include "quib_paths.h"
@@ -67,22 +71,57 @@ int HasPrivilege(const char *userName, const char *priv) {
     if (matcher.Matches(adminEntry) == 1) {
         return 1;
     }
-    std::string text;
-    if (int readErr = ReadWholeFile(QUIB_APP_PRIVILEGE_CONF, &text); readErr != 0) {
+    static ParsedFile<std::vector<SettingsLine>> file(QUIB_APP_PRIVILEGE_CONF, ParseSettings);
+    std::shared_ptr<const std::vector<SettingsLine>> lines;
+    if (int readErr = file.Get(&lines); readErr != 0) {
         if (readErr != ENOENT) {
             QUIB_SET_ERR(QUIB_ERR_OPEN_FAILED);
         }
         return 0;
     }
-    std::vector<SettingsLine> lines = ParseSettings(text);
-    const SettingsLine *entry = FindSettingsEntry(lines, priv, false);
-    if (entry == nullptr) {
-        return 0;
-    }
-    return Decide(entry->value, &matcher) == 1 ? 1 : 0;
+    return PrivilegeVerdict(*lines, priv, &matcher) == 1 ? 1 : 0;
 }
 
 }  // namespace
+
+bool IsIntactPrivilegeLine(const SettingsLine &line) {
+    if (!IsCleanConfigText(line.text)) {
+        return false;
+    }
+    std::string_view body = TrimSpace(line.text);
+    std::string_view rest = TrimSpace(body.substr(body.find('=') + 1));
+    std::string_view after;
+    if (!rest.empty() && rest.front() == '"') {
+        size_t i = 1;
+        for (; i < rest.size() && rest[i] != '"'; ++i) {
+            if (rest[i] == '\\' && i + 1 < rest.size() && (rest[i + 1] == '"' || rest[i + 1] == '\\')) {
+                ++i;
+            }
+        }
+        if (i >= rest.size()) {
+            return false;
+        }
+        after = TrimSpace(rest.substr(i + 1));
+    } else if (!rest.empty() && rest.front() == '\'') {
+        const size_t close = rest.find('\'', 1);
+        if (close == std::string_view::npos) {
+            return false;
+        }
+        after = TrimSpace(rest.substr(close + 1));
+    }
+    if (!after.empty() && after.front() != '#') {
+        return false;
+    }
+    return std::count(line.value.begin(), line.value.end(), '"') % 2 == 0;
+}
+
+int PrivilegeVerdict(const std::vector<SettingsLine> &lines, std::string_view priv, ListMatcher *matcher) {
+    const SettingsLine *entry = FindSettingsEntry(lines, priv, false);
+    if (entry == nullptr || !IsIntactPrivilegeLine(*entry)) {
+        return 0;
+    }
+    return Decide(entry->value, matcher);
+}
 }  // namespace norvo::platform
 
 namespace np = norvo::platform;

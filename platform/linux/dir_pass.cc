@@ -40,6 +40,16 @@ std::atomic<bool> g_noGetxattrat{false};
 
 }  // namespace
 
+// Makes dir the thread's current pass over dirPath. Throws std::bad_alloc.
+static QUIBDirPass *Begin(FileDescriptor dir, const char *dirPath) {
+    auto pass = std::make_unique<QUIBDirPass>();
+    pass->dirPath = dirPath;
+    pass->dir = std::move(dir);
+    pass->outer = t_current;
+    t_current = pass.get();
+    return pass.release();
+}
+
 QUIBDirPass *PassOf(const char *path, const char **name) {
     QUIBDirPass *pass = t_current;
     if (pass == nullptr || path == nullptr) {
@@ -128,12 +138,31 @@ QUIBDirPass *QUIBDirPassBegin(const char *dirPath) {
             NORVO_FAIL_ERRNO(errno);
             return nullptr;
         }
-        auto pass = std::make_unique<QUIBDirPass>();
-        pass->dirPath = dirPath;
-        pass->dir = std::move(dir);
-        pass->outer = t_current;
-        t_current = pass.get();
-        return pass.release();
+        return Begin(std::move(dir), dirPath);
+    });
+}
+
+QUIBDirPass *QUIBDirPassBeginAt(int dirFd, const char *dirPath) {
+    if (const int err = CheckPathArgument(dirPath)) {
+        NORVO_FAIL_ERRNO(err);
+        return nullptr;
+    }
+    return Guarded<QUIBDirPass *>(nullptr, [&]() -> QUIBDirPass * {
+        struct stat st;
+        if (dirFd < 0 || fstat(dirFd, &st) != 0) {
+            NORVO_FAIL_ERRNO(EBADF);
+            return nullptr;
+        }
+        if (!S_ISDIR(st.st_mode)) {
+            NORVO_FAIL_ERRNO(ENOTDIR);
+            return nullptr;
+        }
+        FileDescriptor dir(fcntl(dirFd, F_DUPFD_CLOEXEC, 0));
+        if (!dir.IsOpen()) {
+            NORVO_FAIL_ERRNO(errno);
+            return nullptr;
+        }
+        return Begin(std::move(dir), dirPath);
     });
 }
 

@@ -3,6 +3,8 @@
 #include <string>
 #include <string_view>
 
+#include "vlibc_err.h"
+
 namespace norvo::platform {
 
 // 0 when path may be handed to the kernel; otherwise the errno that describes it: EINVAL for
@@ -26,7 +28,7 @@ int FailWithErrno(int err, const char *file, int line);
 }  // namespace norvo::platform
 
 // Fails the current call with err, recording the caller's place.
-#define NORVO_FAIL_ERRNO(err) ::norvo::platform::FailWithErrno((err), __FILE__, __LINE__)
+#define NORVO_FAIL_ERRNO(err) ::norvo::platform::FailWithErrno((err), QUIB_SOURCE_NAME, __LINE__)
 
 namespace norvo::platform {
 

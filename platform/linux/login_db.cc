@@ -1,12 +1,8 @@
 // SQLite plumbing of the login records.
 #include "login_db.h"
 
-#include <errno.h>
-#include <fcntl.h>
-#include <sys/stat.h>
-#include <unistd.h>
-
 #include "locked_file.h"
+#include "private_dir.h"
 #include "quib_paths.h"
 #include "vlibc_err.h"
 
@@ -107,32 +103,17 @@ int PurgeExpired(sqlite3 *db, time_t now) {
     return RunToEnd(purge.get());
 }
 
-// The file is made here rather than by SQLite so that it is born 0600 whatever the umask,
-// and so that a file at this well-known /tmp name that belongs to someone else, or a link, is
-// never used.
-int PrepareFile(bool create) {
-    const int flags = O_RDWR | O_NOFOLLOW | O_CLOEXEC | (create ? O_CREAT : 0);
-    FileDescriptor fd(open(QUIB_LOGIN_DB, flags, 0600));
-    if (!fd.IsOpen()) {
-        return errno == ENOENT && !create ? QUIB_ERR_NO_SUCH_FILE : VLIBCErrFromErrno(errno);
-    }
-    struct stat info;
-    if (fstat(fd.Get(), &info) != 0) {
-        return VLIBCErrFromErrno(errno);
-    }
-    if (!S_ISREG(info.st_mode) || info.st_uid != geteuid()) {
-        return QUIB_ERR_ACCESS_DENIED;
-    }
-    if ((info.st_mode & 07777) != 0600 && fchmod(fd.Get(), 0600) != 0) {
-        return VLIBCErrFromErrno(errno);
-    }
-    return QUIB_ERR_NONE;
-}
-
 }  // namespace
 
 int OpenLoginDb(bool create, LoginDb *db) {
-    if (const int code = PrepareFile(create)) {
+    // The database is made here rather than by SQLite so that it is born 0600 whatever the
+    // umask; see private_dir.h for why its directory is checked every time.
+    FileDescriptor dir;
+    int code = OpenPrivateDir(QUIB_LOGIN_DIR, create, &dir);
+    if (code == QUIB_ERR_NONE) {
+        code = CheckPrivateDatabase(dir.Get(), QUIB_LOGIN_DB_NAME, create);
+    }
+    if (code != QUIB_ERR_NONE) {
         return code;
     }
     sqlite3 *raw = nullptr;

@@ -28,9 +28,10 @@ struct LoginRecord {
     time_t expires = 0;
 };
 
-// Opens the database, creating it (mode 0600, owned by the caller) when create is set.
-// 0 and *db; QUIB_ERR_NO_SUCH_FILE when it does not exist and create is not set; another
-// platform code on failure (a database owned by someone else is refused: 0x0300).
+// Opens the database, creating it and its directory (root's, 0600 and 0700) when create is set.
+// 0 and *db; QUIB_ERR_NO_SUCH_FILE when it does not exist and create is not set;
+// QUIB_ERR_ACCESS_DENIED when the caller is not root or the directory, the database or a
+// journal beside it is not root's own (see private_dir.h); another platform code on failure.
 [[nodiscard]] int OpenLoginDb(bool create, LoginDb *db);
 
 // Drops expired records and adds record. 0 or a platform code.

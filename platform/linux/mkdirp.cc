@@ -36,9 +36,10 @@ int MakeOne(int parent, const std::string &name, bool last, uid_t uid, gid_t gid
             err = errno;
         }
         if (err != 0) {
-            if (dir.IsOpen()) {
-                unlinkat(parent, name.c_str(), AT_REMOVEDIR);
-            }
+            // Also when it could not be opened: left behind, the 0700 directory of the wrong
+            // owner would stand in for the real one from then on. rmdir only takes an empty
+            // directory, so whatever else was swapped in stays untouched.
+            unlinkat(parent, name.c_str(), AT_REMOVEDIR);
             return err;
         }
         *out = std::move(dir);

@@ -1,6 +1,8 @@
 // VLIBCFile*: the appliance's key="value" settings files. Writers hold an exclusive flock and
 // replace the file by rename, so a reader needs no lock: it sees the old text or the new, never
 // a mixture.
+#include <ctype.h>
+#include <dirent.h>
 #include <errno.h>
 #include <fcntl.h>
 #include <limits.h>
@@ -10,9 +12,11 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <functional>
-#include <set>
+#include <algorithm>
 #include <chrono>
+#include <functional>
+#include <memory>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -154,13 +158,51 @@ int LockTarget(const std::string &target, bool create, LockedTarget *out) {
     return EAGAIN;
 }
 
+// The directory and name of target, and the name pattern of its temporaries: "." + name +
+// "." + the six letters or digits mkostemp puts for XXXXXX.
+struct TargetPlace {
+    std::string dir;
+    std::string base;
+    explicit TargetPlace(const std::string &target) {
+        const size_t slash = target.rfind('/');
+        dir = slash == std::string::npos ? "." : (slash == 0 ? "/" : target.substr(0, slash));
+        base = slash == std::string::npos ? target : target.substr(slash + 1);
+    }
+    std::string TempPattern() const { return (dir == "/" ? "" : dir) + "/." + base + ".XXXXXX"; }
+    bool IsTempName(std::string_view name) const {
+        const std::string prefix = "." + base + ".";
+        if (name.size() != prefix.size() + 6 || name.substr(0, prefix.size()) != prefix) {
+            return false;
+        }
+        return std::all_of(name.begin() + prefix.size(), name.end(),
+                           [](char c) { return isascii(c) && isalnum(c); });
+    }
+};
+
+// Removes the temporaries of writers that died before their rename (kill -9). Called with
+// the exclusive lock on the current file, when no live writer of target can have one: a
+// writer makes its temporary only while it holds the lock on the then-current file, and its
+// rename, which makes another file current, consumes the temporary. So every regular file of
+// the pattern is a leftover. Best effort: a leftover that can't be removed harms nobody.
+void RemoveLeftoverTemps(const TargetPlace &place) {
+    std::unique_ptr<DIR, int (*)(DIR *)> dir(opendir(place.dir.c_str()), closedir);
+    if (!dir) {
+        return;
+    }
+    while (const struct dirent *entry = readdir(dir.get())) {
+        struct stat st;
+        if (place.IsTempName(entry->d_name) &&
+            fstatat(dirfd(dir.get()), entry->d_name, &st, AT_SYMLINK_NOFOLLOW) == 0 && S_ISREG(st.st_mode)) {
+            (void)unlinkat(dirfd(dir.get()), entry->d_name, 0);
+        }
+    }
+}
+
 // Writes text to a temporary beside target with the old file's owner and mode (0644 for a
 // new file), then renames it over target. 0 or the errno; the temporary never remains.
 int ReplaceFile(const std::string &target, const LockedTarget &locked, const std::string &text) {
-    size_t slash = target.rfind('/');
-    std::string dir = slash == std::string::npos ? "." : (slash == 0 ? "/" : target.substr(0, slash));
-    std::string base = slash == std::string::npos ? target : target.substr(slash + 1);
-    std::string temp = (dir == "/" ? "" : dir) + "/." + base + ".XXXXXX";
+    const TargetPlace place(target);
+    std::string temp = place.TempPattern();
     FileDescriptor fd(mkostemp(temp.data(), O_CLOEXEC));
     if (!fd.IsOpen()) {
         return errno;
@@ -192,7 +234,7 @@ int ReplaceFile(const std::string &target, const LockedTarget &locked, const std
     }
     removeTemp.Dismiss();
     // Best effort: the rename is already visible; this only hardens it against power loss.
-    FileDescriptor dirFd(open(dir.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    FileDescriptor dirFd(open(place.dir.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
     if (dirFd.IsOpen()) {
         (void)fsync(dirFd.Get());
     }
@@ -217,6 +259,7 @@ int Rewrite(const char *file, bool create, const std::function<bool(Lines *)> &e
         SetWriteError(err, !create);
         return -1;
     }
+    RemoveLeftoverTemps(TargetPlace(target));
     std::string text;
     int err = ReadAll(locked.fd.Get(), &text);
     if (err == 0) {

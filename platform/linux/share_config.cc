@@ -3,6 +3,8 @@
 #include <map>
 
 #include "name_list.h"
+#include "parsed_file.h"
+#include "quib_paths.h"
 #include "quib_share.h"
 #include "text_util.h"
 
@@ -95,10 +97,37 @@ bool SetFlag(std::string_view value, unsigned bit, bool whenTrue, unsigned *flag
     return true;
 }
 
-// Applies one key; false when the value of a known key is invalid.
+bool HasOddQuotes(std::string_view text) {
+    size_t quotes = 0;
+    for (char c : text) {
+        quotes += c == '"' ? 1 : 0;
+    }
+    return quotes % 2 != 0;
+}
+
+// Keys are plain ASCII words; anything else is damage, and an unknown key is ignored, so a
+// damaged "invalid users" must not simply vanish.
+bool IsPlainKey(std::string_view key) {
+    for (char c : key) {
+        if (c < ' ' || c > '~' || c == '"') {  // a char above 0x7F is negative: refused too
+            return false;
+        }
+    }
+    return !key.empty();
+}
+
+// Applies one key; false when the value of a known key is invalid. An unbalanced quote
+// anywhere, or any quote in a path, makes the value invalid: in a list it would swallow the
+// entries after it.
 bool ApplyKey(const std::string &key, std::string_view value, Section *section) {
     ShareEntry &share = section->share;
+    if (!IsPlainKey(key) || HasOddQuotes(value)) {
+        return false;
+    }
     if (key == "path") {
+        if (value.find('"') != std::string_view::npos) {
+            return false;
+        }
         std::string path = NormalizePath(value);
         if (path.empty() || path == "/") {
             return false;
@@ -172,6 +201,11 @@ Section OpenSection(std::string_view line) {
 }  // namespace
 
 std::vector<ShareEntry> ParseShareConfig(std::string_view text) {
+    // An editor's byte-order mark must not turn the first section header into a stray line.
+    constexpr std::string_view kByteOrderMark = "\xEF\xBB\xBF";
+    if (text.substr(0, kByteOrderMark.size()) == kByteOrderMark) {
+        text.remove_prefix(kByteOrderMark.size());
+    }
     std::vector<Section> sections;
     for (const std::string &raw : LogicalLines(text)) {
         std::string_view line = TrimSpace(raw);
@@ -180,6 +214,7 @@ std::vector<ShareEntry> ParseShareConfig(std::string_view text) {
         }
         if (line.front() == '[') {
             sections.push_back(OpenSection(line));
+            sections.back().broken |= !IsCleanConfigText(raw);
             continue;
         }
         if (sections.empty()) {
@@ -190,7 +225,8 @@ std::vector<ShareEntry> ParseShareConfig(std::string_view text) {
             continue;
         }
         size_t eq = line.find('=');
-        if (eq == std::string_view::npos) {
+        // raw, not line: trimming would hide a vertical tab or form feed that replaced a byte.
+        if (eq == std::string_view::npos || !IsCleanConfigText(raw)) {
             section.broken = true;
             continue;
         }
@@ -214,6 +250,25 @@ std::vector<ShareEntry> ParseShareConfig(std::string_view text) {
         shares.push_back(std::move(section.share));
     }
     return shares;
+}
+
+const ShareEntry *ShareTable::Find(std::string_view name) const {
+    const auto found = byLowerName.find(ToLowerAscii(name));
+    return found == byLowerName.end() ? nullptr : &shares[found->second];
+}
+
+ShareTable MakeShareTable(std::string_view text) {
+    ShareTable table;
+    table.shares = ParseShareConfig(text);
+    for (size_t i = 0; i < table.shares.size(); ++i) {
+        table.byLowerName.emplace(ToLowerAscii(table.shares[i].name), i);  // names are unique
+    }
+    return table;
+}
+
+int CurrentShares(std::shared_ptr<const ShareTable> *table) {
+    static ParsedFile<ShareTable> file(QUIB_SHARE_CONF, MakeShareTable);
+    return file.Get(table);
 }
 
 }  // namespace norvo::platform

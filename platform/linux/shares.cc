@@ -7,16 +7,14 @@
 #include <vector>
 
 #include "api_guard.h"
-#include "locked_file.h"
 #include "name_list.h"
-#include "quib_paths.h"
 #include "quib_share.h"
 #include "share_config.h"
 #include "text_util.h"
 
 // The cursor: a snapshot of the configuration taken at open.
 struct _tag_QUIBSHARE_DB_ {
-    std::vector<norvo::platform::ShareEntry> shares;
+    std::shared_ptr<const norvo::platform::ShareTable> table;
     size_t next = 0;
 };
 
@@ -32,13 +30,11 @@ using ShareRecord = std::unique_ptr<QUIBSHARE, ShareRecordFree>;
 constexpr size_t kMaxSharePathArg = 4096;
 
 // The configured shares; false with 0x0900 when the configuration can't be read.
-bool LoadShares(std::vector<ShareEntry> *shares) {
-    std::string text;
-    if (ReadWholeFile(QUIB_SHARE_CONF, &text) != 0) {
+bool LoadShares(std::shared_ptr<const ShareTable> *table) {
+    if (CurrentShares(table) != 0) {
         QUIB_SET_ERR(QUIB_ERR_OPEN_FAILED);
         return false;
     }
-    *shares = ParseShareConfig(text);
     return true;
 }
 
@@ -66,21 +62,12 @@ ShareRecord MakeRecord(const ShareEntry &entry) {
     return record;
 }
 
-const ShareEntry *FindByName(const std::vector<ShareEntry> &shares, std::string_view name) {
-    for (const ShareEntry &share : shares) {
-        if (EqualsIgnoreCase(share.name, name)) {
-            return &share;
-        }
-    }
-    return nullptr;
-}
-
 // The share holding path: the deepest share path that is path or a parent of it, else the
 // share named by the first component ("/photo/a.jpg" -> "photo").
-const ShareEntry *FindByPath(const std::vector<ShareEntry> &shares, std::string_view path) {
+const ShareEntry *FindByPath(const ShareTable &table, std::string_view path) {
     std::string normal = NormalizePath(path);
     const ShareEntry *best = nullptr;
-    for (const ShareEntry &share : shares) {
+    for (const ShareEntry &share : table.shares) {
         if (PathIsWithin(share.path, normal) && (best == nullptr || share.path.size() > best->path.size())) {
             best = &share;
         }
@@ -90,7 +77,7 @@ const ShareEntry *FindByPath(const std::vector<ShareEntry> &shares, std::string_
     }
     std::string_view first = std::string_view(normal).substr(1);
     first = first.substr(0, first.find('/'));
-    return first.empty() ? nullptr : FindByName(shares, first);
+    return first.empty() ? nullptr : table.Find(first);
 }
 
 }  // namespace
@@ -115,11 +102,11 @@ int QUIBShareGet(const char *name, PQUIBSHARE *pshare) {
         return -1;
     }
     return np::Guarded(-1, [&] {
-        std::vector<np::ShareEntry> shares;
-        if (!np::LoadShares(&shares)) {
+        std::shared_ptr<const np::ShareTable> table;
+        if (!np::LoadShares(&table)) {
             return -1;
         }
-        const np::ShareEntry *entry = isPath ? np::FindByPath(shares, name) : np::FindByName(shares, name);
+        const np::ShareEntry *entry = isPath ? np::FindByPath(*table, name) : table->Find(name);
         if (entry == nullptr) {
             QUIB_SET_ERR(QUIB_ERR_NO_SUCH_SHARE);
             return -1;
@@ -149,7 +136,7 @@ void QUIBShareFree(PQUIBSHARE share) {
 PQUIBSHARE_DB QUIBShareDBOpen(void) {
     return np::Guarded<PQUIBSHARE_DB>(nullptr, [] {
         auto db = std::make_unique<QUIBSHARE_DB>();
-        if (!np::LoadShares(&db->shares)) {
+        if (!np::LoadShares(&db->table)) {
             return static_cast<PQUIBSHARE_DB>(nullptr);
         }
         return db.release();
@@ -161,11 +148,11 @@ int QUIBShareDBCursorGet(PQUIBSHARE_DB db, PQUIBSHARE *pshare) {
         QUIB_SET_ERR(QUIB_ERR_BAD_PARAMETER);
         return -1;
     }
-    if (db->next >= db->shares.size()) {
+    if (db->next >= db->table->shares.size()) {
         return 1;
     }
     return np::Guarded(-1, [&] {
-        np::ShareRecord record = np::MakeRecord(db->shares[db->next]);
+        np::ShareRecord record = np::MakeRecord(db->table->shares[db->next]);
         if (!record) {
             return -1;  // *pshare stays the caller's
         }

@@ -93,6 +93,16 @@ bool IsValidUtf8(std::string_view text) {
     return true;
 }
 
+bool IsCleanConfigText(std::string_view text) {
+    for (char c : text) {
+        const auto u = static_cast<unsigned char>(c);
+        if ((u < 0x20 && c != '\t') || u == 0x7F) {
+            return false;
+        }
+    }
+    return IsValidUtf8(text);
+}
+
 bool IsAcceptableName(const char *name) {
     if (name == nullptr || name[0] == '\0') {
         return false;

@@ -21,6 +21,10 @@ inline constexpr size_t kMaxNameLength = 256;
 // U+10FFFF).
 [[nodiscard]] bool IsValidUtf8(std::string_view text);
 
+// true when text can be a line of a configuration file we trust: valid UTF-8 without control
+// characters other than tab (a NUL, CR or ESC in a value is damage, not content).
+[[nodiscard]] bool IsCleanConfigText(std::string_view text);
+
 // A name a caller may pass: not null, not empty, at most kMaxNameLength bytes, valid UTF-8,
 // no control characters.
 [[nodiscard]] bool IsAcceptableName(const char *name);

@@ -1,9 +1,7 @@
 #include <errno.h>
 
-#include <string>
-
+#include "common/share_encryption.h"
 #include "norvo/errors.h"
-#include "norvo/norvomisc.h"
 #include "quib_fs.h"
 #include "vlibc_err.h"
 
@@ -15,11 +13,9 @@ int LongPathError(const char *path) {
     if (path == nullptr) {
         return NVO_ERR_LONG_PATH;
     }
-    bool encrypted = false;
-    if (NvoLibCheckEncryptShare(std::string(path), &encrypted) == 1 && encrypted) {
-        return NVO_ERR_ENCRYPTION_LONG_PATH;
-    }
-    return NVO_ERR_LONG_PATH;
+    // Asked without touching the slot: a translation only answers, its caller stores.
+    return norvo::ShareEncryption(path) == norvo::Encryption::kEncrypted ? NVO_ERR_ENCRYPTION_LONG_PATH
+                                                                          : NVO_ERR_LONG_PATH;
 }
 
 }  // namespace

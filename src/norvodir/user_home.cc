@@ -3,7 +3,9 @@
 #include <string>
 
 #include "common/owners.h"
+#include "common/path_names.h"
 #include "common/text.h"
+#include "errors/guard.h"
 #include "norvo/norvodir.h"
 #include "quib_fs.h"
 
@@ -33,23 +35,32 @@ bool DirectoryHomeTail(const char *user, std::string &tail) {
 }  // namespace
 
 int IsDirUserHome(const std::string &name, const char *user) {
-    if (name == "home" || name == "/home") {
-        return 1;
-    }
-    if (name.compare(0, 6, "/homes") == 0 && user != nullptr) {
-        std::string prefix;
-        if (norvo::IsDomainUser(user) || norvo::IsDirectoryUser(user)) {
-            if (!DirectoryHomeTail(user, prefix)) {
-                return 0;
-            }
-        } else {
-            prefix = std::string("/homes/") + user;
+    return norvo::Guarded<int>(0, [&]() -> int {
+        if (name == "home" || name == "/home") {
+            return 1;
         }
-        if (strncasecmp(name.c_str(), prefix.c_str(), prefix.size()) != 0) {
+        // A path that climbs with "." or ".." names no home, whatever it starts with.
+        if (name[0] == '/' && !norvo::IsWellFormedUserPath(name.c_str())) {
             return 0;
         }
-        const char next = name.size() > prefix.size() ? name[prefix.size()] : '\0';
-        return next == '/' || next == '\0' ? 1 : 0;
-    }
-    return name.size() > 5 && name.compare(0, 6, "/home/") == 0 ? 1 : 0;
+        if (name.compare(0, 6, "/homes") == 0 && user != nullptr) {
+            if (!norvo::IsPathComponent(user, strlen(user))) {
+                return 0;
+            }
+            std::string prefix;
+            if (norvo::IsDomainUser(user) || norvo::IsDirectoryUser(user)) {
+                if (!DirectoryHomeTail(user, prefix)) {
+                    return 0;
+                }
+            } else {
+                prefix = std::string("/homes/") + user;
+            }
+            if (strncasecmp(name.c_str(), prefix.c_str(), prefix.size()) != 0) {
+                return 0;
+            }
+            const char next = name.size() > prefix.size() ? name[prefix.size()] : '\0';
+            return next == '/' || next == '\0' ? 1 : 0;
+        }
+        return norvo::IsOwnHomeName(name.c_str()) ? 1 : 0;
+    });
 }

@@ -5,8 +5,8 @@
 #include "common/log.h"
 #include "common/modules.h"
 #include "common/owners.h"
+#include "errors/guard.h"
 #include "norvo/norvoenum.h"
-#include "norvoenum/guarded.h"
 
 using norvo::kNorvoEnum;
 

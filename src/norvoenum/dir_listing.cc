@@ -1,42 +1,48 @@
-// The listing of one directory for a user: access test, read, filter, fill, sort, page.
+// The listing of one directory for a user: open it beneath its share's folder, read, filter,
+// keep each entry's facts, then order and page them, and build only the page's records.
 #include <dirent.h>
 #include <errno.h>
+#include <fcntl.h>
 #include <string.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <list>
 #include <numeric>
-#include <optional>
 #include <string>
 #include <vector>
 
+#include "common/beneath.h"
 #include "common/log.h"
 #include "common/modules.h"
 #include "common/owners.h"
+#include "common/remote_mount.h"
 #include "common/text.h"
 #include "norvo/errors.h"
 #include "norvo/norvoenum.h"
 #include "norvo/norvosearch.h"
+#include "norvoenum/entry_facts.h"
 #include "norvoenum/entry_order.h"
 #include "norvoenum/info_flags.h"
 #include "norvoenum/kept_entries.h"
-#include "norvoenum/listing_scope.h"
-#include "norvoenum/remote_mount.h"
+#include "quib_dir_pass.h"
 #include "quib_fs.h"
-#include "quib_stat.h"
 
+using norvo::EntryFacts;
+using norvo::EntryVerdict;
 using norvo::kNorvoEnum;
 
 namespace {
 
-// The library error of a failed chdir into the directory (the access test). The log line keeps
-// its fixed number, 152, for the unexpected errors.
+// The library error of a directory that can't be entered. The log line keeps its fixed
+// number, 152, for the unexpected errors.
 int EnterError(const char *realPath, int err) {
     if (norvo::IsUnreachableErrno(err) && norvo::OnRemoteMount(realPath)) {
         return NVO_ERR_REMOTE_FS;
     }
-    if (err == EACCES || err == EPERM) {
+    // A link on the way, or a way out of the share: the file manager goes nowhere through them.
+    if (err == EACCES || err == EPERM || err == ELOOP || err == EXDEV) {
         return NVO_ERR_PRIVILEGE;
     }
     if (err == ENOENT) {
@@ -58,54 +64,89 @@ bool PassesAll(const std::vector<FileSearch::FindComp *> &conditions, const char
     return true;
 }
 
-// The paths FillFileInfo sets when no listing defers them: the directory's paths, '/', the name
-// (the directory entry's name, which holds no NUL).
-void SetPaths(std::list<DIRENTRY_INFO> &out, const char *userPath, const char *realPath, int fillInfo) {
-    std::string userChild(userPath);
-    userChild += '/';
-    const size_t userBase = userChild.size();
-    std::string realChild(realPath);
-    realChild += '/';
-    const size_t realBase = realChild.size();
-    for (DIRENTRY_INFO &entry : out) {
-        userChild.resize(userBase);
-        userChild += entry.name;
-        entry.path = userChild;
-        if (fillInfo & NVO_INFO_REAL_PATH) {
-            realChild.resize(realBase);
-            realChild += entry.name;
-            entry.real_path = realChild;
+enum class Opened { kReadable, kUnreadable, kFailed };
+
+// Opens the directory for reading beneath top, and makes the access test that entering it
+// would: the right to search it. kUnreadable: it may be entered but not read (intended: such a
+// folder lists as empty). kFailed: the error slot is set.
+Opened OpenListed(const std::string &top, const char *realPath, norvo::OwnedFd *dir) {
+    *dir = norvo::OpenBeneath(top, realPath, O_RDONLY | O_DIRECTORY);
+    norvo::OwnedFd searchable;
+    int err = errno;
+    if (!dir->IsOpen()) {
+        if (err != EACCES && err != EPERM) {
+            NvoLibSetErr(EnterError(realPath, err));
+            return Opened::kFailed;
+        }
+        // Not readable: is it reachable at all?
+        searchable = norvo::OpenBeneath(top, realPath, O_PATH | O_DIRECTORY);
+        if (!searchable.IsOpen()) {
+            NvoLibSetErr(EnterError(realPath, errno));
+            return Opened::kFailed;
         }
     }
+    // "." is looked up in the folder, which needs the right to search it.
+    struct stat st;
+    if (fstatat(dir->IsOpen() ? dir->Get() : searchable.Get(), ".", &st, 0) != 0) {
+        NvoLibSetErr(EnterError(realPath, errno));
+        return Opened::kFailed;
+    }
+    return dir->IsOpen() ? Opened::kReadable : Opened::kUnreadable;
 }
 
-// A fresh record in place of the last one, keeping its strings' buffers for the next fill.
-DIRENTRY_INFO &FreshRecord(DIRENTRY_INFO &record) {
-    std::string name = std::move(record.name);
-    std::string type = std::move(record.type);
-    std::string user = std::move(record.user);
-    std::string group = std::move(record.group);
-    record = DIRENTRY_INFO{};
-    name.clear();
-    type.clear();
-    user.clear();
-    group.clear();
-    record.name = std::move(name);
-    record.type = std::move(type);
-    record.user = std::move(user);
-    record.group = std::move(group);
-    return record;
-}
+// The position space of a listing: first the records the caller's list held, then the kept
+// entries. The caller's records take part in the order and the page like the new ones.
+class Positions {
+public:
+    Positions(std::list<DIRENTRY_INFO> &out, const norvo::KeptEntries &kept, norvo::SortRule rule)
+        : out_(out), kept_(kept), rule_(rule) {
+        for (auto it = out.begin(); it != out.end(); ++it) {
+            earlier_.push_back(it);
+        }
+    }
 
-// What a failed listing leaves in out: the records kept so far, in the reader's order, with
-// their paths, as they would be had each gone into the list when it was filled.
-void RestoreInReaderOrder(const norvo::KeptEntries &kept, const char *userPath, const char *realPath, int fillInfo,
-                          std::list<DIRENTRY_INFO> &out) {
+    size_t Count() const { return earlier_.size() + kept_.Size(); }
+
+    norvo::SortFacts FactsAt(size_t i) const {
+        return i < earlier_.size() ? norvo::SortFactsOf(rule_, *earlier_[i]) : kept_.FactsAt(i - earlier_.size());
+    }
+
+    // Makes out the records at order[first, last): earlier records are moved, kept entries
+    // built; every other earlier record goes. Throws (std::bad_alloc) only before out changes.
+    void Page(const std::vector<size_t> &order, size_t first, size_t last, const std::string &userDir,
+              const std::string &realDir, NorvoUserEnum &names) {
+        std::list<DIRENTRY_INFO> built;
+        for (size_t i = first; i < last; ++i) {
+            if (order[i] >= earlier_.size()) {
+                kept_.Build(order[i] - earlier_.size(), userDir, realDir, names, built.emplace_back());
+            }
+        }
+        std::list<DIRENTRY_INFO> page;
+        for (size_t i = first; i < last; ++i) {
+            if (order[i] < earlier_.size()) {
+                page.splice(page.end(), out_, earlier_[order[i]]);
+            } else {
+                page.splice(page.end(), built, built.begin());
+            }
+        }
+        out_.swap(page);
+    }
+
+private:
+    std::list<DIRENTRY_INFO> &out_;
+    const norvo::KeptEntries &kept_;
+    norvo::SortRule rule_;
+    std::vector<std::list<DIRENTRY_INFO>::iterator> earlier_;
+};
+
+// What a failed listing leaves in out: the earlier records, then the entries kept so far in
+// the reader's order, as they would be had each gone into the list when it was filled.
+void KeepInReaderOrder(const norvo::KeptEntries &kept, const std::string &userDir, const std::string &realDir,
+                       NorvoUserEnum &names, std::list<DIRENTRY_INFO> &out) {
     std::list<DIRENTRY_INFO> records;
     for (size_t i = 0; i < kept.Size(); ++i) {
-        kept.Restore(i, records.emplace_back());
+        kept.Build(i, userDir, realDir, names, records.emplace_back());
     }
-    SetPaths(records, userPath, realPath, fillInfo);
     out.splice(out.end(), records);
 }
 
@@ -125,63 +166,44 @@ int NvoEnum::NvoLibDirEntryListEnum(const char *userPath, const char *realPath, 
         NvoLibSetErr(NVO_ERR_PRIVILEGE);
         return 0;
     }
-    *total = 0;
     const int fillInfo = norvo::WidenInfoBySortKey(sortKey, info);
     const norvo::SortRule rule = norvo::SortRuleOf(sortKey != nullptr ? sortKey : "");
-    // Into an empty list, the kept records wait compactly (kept) and only the page becomes
-    // records, with their paths; records the caller passed in are sorted with the new ones, so
-    // then every record is built in the list itself.
-    const bool compact = out.empty();
-    std::optional<norvo::KeptEntries> kept;
+    const std::string userDir = userPath;
+    const std::string realDir = realPath;
+    norvo::KeptEntries kept(rule, fillInfo);
     try {
-        if (chdir(realPath) != 0) {
-            NvoLibSetErr(EnterError(realPath, errno));
+        // The real path is the share's (or home's) folder with the rest of the user path; what
+        // does not read so, or climbs with "..", is not a resolved user path.
+        std::string top;
+        if (norvo::HasDotComponent(userDir) || !norvo::TopOf(userDir, realDir, &top)) {
+            NvoLibSetErr(NVO_ERR_GENERAL);
             return 0;
         }
-        if (chdir("/") != 0) {
-            const int err = errno;
-            if (err == EACCES || err == EPERM) {
-                NvoLibSetErr(NVO_ERR_PRIVILEGE);
-                return 0;
-            }
-            NVO_LOG_AT(kNorvoEnum, 161, "%s:%d Failed to access %s, errno=%m", realPath);
-            NvoLibSetErr(NVO_ERR_ACCESS);
+        *total = 0;
+        norvo::OwnedFd opened;
+        switch (OpenListed(top, realPath, &opened)) {
+        case Opened::kFailed:
+            return 0;
+        case Opened::kUnreadable:
+            return 1;
+        case Opened::kReadable:
+            break;
+        }
+        // Entries are stat'ed and judged in the directory opened, never by walking the path
+        // again (which a link swapped in meanwhile could redirect).
+        const norvo::DirPass pass(QUIBDirPassBeginAt(opened.Get(), realPath));
+        if (!pass) {
+            NvoLibSetErr(NVO_ERR_SYSTEM);
             return 0;
         }
-        norvo::DirHandle dir(opendir(realPath));
+        norvo::DirHandle dir(fdopendir(opened.Get()));
         if (!dir) {
-            const int err = errno;
-            if (norvo::IsUnreachableErrno(err) && norvo::OnRemoteMount(realPath)) {
-                NvoLibSetErr(NVO_ERR_REMOTE_FS);
-                return 0;
-            }
-            if (err == ENOENT || err == ENOTDIR) {
-                NvoLibSetErr(NVO_ERR_NO_PATH);
-                return 0;
-            }
-            // Intended: a folder that can be entered but not read lists as empty, successfully.
-            if (err == EACCES || err == EPERM) {
-                return 1;
-            }
-            NvoLibSetErr(NVO_ERR_ACCESS);
+            NvoLibSetErr(NVO_ERR_SYSTEM);
             return 0;
         }
-        // The child paths reuse one buffer each: only the name part changes per entry.
-        std::string realChild(realPath);
-        realChild += '/';
+        opened.Release();  // the directory stream owns it now
+        std::string realChild = realDir + '/';
         const size_t realBase = realChild.size();
-        std::string userChild(userPath);
-        userChild += '/';
-        const size_t userBase = userChild.size();
-        std::optional<norvo::ListingScope> scope;
-        DIRENTRY_INFO scratch;  // the record being filled, when kept compactly
-        if (compact) {
-            kept.emplace(rule);
-            scope.emplace();
-        }
-        // Lets the entries' stat, ACL mask and ACL support share one statx each. Without it (it
-        // can't be opened) the answers are the same, only dearer.
-        norvo::DirPass pass(QUIBDirPassBegin(realPath));
         while (const struct dirent *found = readdir(dir.get())) {
             const char *name = found->d_name;
             if (QUIBEAIsHiddenFile(name) == 1 || !PassesAll(conditions, name)) {
@@ -189,72 +211,41 @@ int NvoEnum::NvoLibDirEntryListEnum(const char *userPath, const char *realPath, 
             }
             realChild.resize(realBase);
             realChild += name;
-            userChild.resize(userBase);
-            userChild += name;
-            DIRENTRY_INFO &entry = compact ? FreshRecord(scratch) : out.emplace_back();
-            const int result = FillFileInfo(userChild.c_str(), realChild.c_str(), name, type, found->d_type,
-                                            fillInfo, entry);
-            const bool keep = result == 0 || (result > 0 && entry.mount_point_type == "remotefail");
-            if (compact && keep) {
-                kept->Add(entry);
-            } else if (!compact && !keep) {
-                out.pop_back();
-            }
-            if (result < 0) {
-                pass.reset();
-                scope.reset();
-                if (compact) {
-                    RestoreInReaderOrder(*kept, userPath, realPath, fillInfo, out);
-                }
+            EntryFacts facts;
+            const EntryVerdict verdict =
+                norvo::ReadEntryFacts(*this, realChild.c_str(), type, found->d_type, fillInfo, &facts);
+            if (verdict == EntryVerdict::kFail) {
+                KeepInReaderOrder(kept, userDir, realDir, userEnum_, out);
                 return 0;
+            }
+            if (verdict != EntryVerdict::kSkip) {
+                kept.Add(name, facts);
             }
         }
         dir.reset();
-        pass.reset();
-        scope.reset();
-        if (!compact) {
-            if (sortKey != nullptr) {
-                EntryListSort(out, sortKey);
-            }
-            // Descending order reverses the whole list, ties and the folders-first rule included.
-            if (!ascending) {
-                out.reverse();
-            }
-            *total = out.size();
-            if (limit != 0) {
-                NvoLibDirEntrySlice(out, offset, limit);
-            }
-            return 1;
-        }
-        // The same steps on the kept records' positions.
+        Positions positions(out, kept, rule);
         std::vector<size_t> order;
         if (sortKey != nullptr) {
-            order = norvo::SortedPositions(kept->Size(), rule, [&](size_t i) { return kept->FactsAt(i); });
+            order = norvo::SortedPositions(positions.Count(), rule, [&](size_t i) { return positions.FactsAt(i); });
         } else {
-            order.resize(kept->Size());
+            order.resize(positions.Count());
             std::iota(order.begin(), order.end(), size_t{0});
         }
+        // Descending order reverses the whole list, ties and the folders-first rule included.
         if (!ascending) {
             std::reverse(order.begin(), order.end());
         }
         size_t first = 0;
         size_t last = 0;
         norvo::PageRange(order.size(), offset, limit, &first, &last);
-        std::list<DIRENTRY_INFO> page;
-        for (size_t i = first; i < last; ++i) {
-            kept->Restore(order[i], page.emplace_back());
-        }
-        SetPaths(page, userPath, realPath, fillInfo);
-        out.splice(out.end(), page);
+        positions.Page(order, first, last, userDir, realDir, userEnum_);
         *total = order.size();
         return 1;
     } catch (...) {
         // Only memory can run out here.
-        if (kept.has_value()) {
-            try {
-                RestoreInReaderOrder(*kept, userPath, realPath, fillInfo, out);
-            } catch (...) {
-            }
+        try {
+            KeepInReaderOrder(kept, userDir, realDir, userEnum_, out);
+        } catch (...) {
         }
         NvoLibSetErr(NVO_ERR_SYSTEM);
         return 0;

@@ -1,5 +1,5 @@
-// One listed entry's record: kept or skipped by its type, then filled with as much file
-// information as the info flags ask for, from one stat of the entry.
+// One listed entry: kept or skipped by its type, then its facts read from one stat of the entry,
+// as far as the info flags ask.
 #include <ctype.h>
 #include <dirent.h>
 #include <errno.h>
@@ -7,21 +7,19 @@
 
 #include "common/log.h"
 #include "common/modules.h"
+#include "common/remote_mount.h"
 #include "norvo/errors.h"
 #include "norvo/norvoenum.h"
 #include "norvo/norvomisc.h"
-#include "norvoenum/listing_scope.h"
-#include "norvoenum/remote_mount.h"
+#include "norvoenum/entry_facts.h"
 #include "quib_fs.h"
 #include "quib_stat.h"
 
+using norvo::EntryFacts;
+using norvo::EntryVerdict;
 using norvo::kNorvoEnum;
 
 namespace {
-
-constexpr int kKeep = 0;
-constexpr int kSkip = 1;
-constexpr int kFail = -1;
 
 // The type filter: false when the entry is of a kind the caller did not ask for.
 bool Wanted(_tag_dir_entry_type_ type, bool isDir) {
@@ -41,29 +39,29 @@ void LogStatFailure(const char *realPath, int err) {
 }
 
 // The outcome of a failed stat of the entry, by errno.
-int StatFailure(const char *realPath, int err, DIRENTRY_INFO &entry) {
+EntryVerdict StatFailure(const char *realPath, int err, EntryFacts *facts) {
     if (err == EPERM || err == EACCES) {
         NvoLibSetErr(NVO_ERR_PRIVILEGE);
         LogStatFailure(realPath, err);
-        return kFail;
+        return EntryVerdict::kFail;
     }
     if (norvo::IsUnreachableErrno(err)) {
-        // Skipped, yet the listing keeps it: the user sees the lost mount as a folder.
+        // The user sees the lost mount as a folder.
         if (norvo::OnRemoteMount(realPath)) {
-            entry.isdir = true;
-            entry.mount_point_type = "remotefail";
-            return kSkip;
+            facts->isdir = true;
+            facts->mountPointType = "remotefail";
+            return EntryVerdict::kUnreachable;
         }
         if (err == ENOENT) {
-            return kSkip;  // gone between the directory read and the stat
+            return EntryVerdict::kSkip;  // gone between the directory read and the stat
         }
         // Intended: an I/O error off network mounts ends the listing without a library error.
         LogStatFailure(realPath, err);
-        return kFail;
+        return EntryVerdict::kFail;
     }
     NvoLibSetErr(NVO_ERR_SYSTEM);
     LogStatFailure(realPath, err);
-    return kFail;
+    return EntryVerdict::kFail;
 }
 
 // "iso" for a disk image and "remote" for a network file system mounted exactly on the folder.
@@ -77,29 +75,62 @@ const char *MountPointType(int fsType) {
     return "";
 }
 
-void SetType(const char *name, std::string &type) {
-    const char *ext = ReturnFileExt(name, 0);
-    if (ext == nullptr) {
-        type.clear();
-        return;
-    }
-    type.assign(ext);
-    for (char &c : type) {
-        c = static_cast<char>(tolower(static_cast<unsigned char>(c)));
-    }
-}
-
-thread_local bool t_pathsDeferred = false;
-
 }  // namespace
 
 namespace norvo {
 
-ListingScope::ListingScope() : outer_(t_pathsDeferred) { t_pathsDeferred = true; }
+void LowerExtension(const char *name, std::string *type) {
+    const char *ext = ReturnFileExt(name, 0);
+    if (ext == nullptr) {
+        type->clear();
+        return;
+    }
+    type->assign(ext);
+    for (char &c : *type) {
+        c = static_cast<char>(tolower(static_cast<unsigned char>(c)));
+    }
+}
 
-ListingScope::~ListingScope() { t_pathsDeferred = outer_; }
-
-bool ListingScope::PathsDeferred() { return t_pathsDeferred; }
+EntryVerdict ReadEntryFacts(NorvoMountStatus &mounts, const char *realPath, _tag_dir_entry_type_ type,
+                            unsigned char dtype, int info, EntryFacts *facts) {
+    facts->isdir = (dtype & DT_DIR) != 0;
+    if (dtype != DT_UNKNOWN) {
+        // Links, devices, pipes and sockets are never listed.
+        if ((dtype != DT_DIR && dtype != DT_REG) || !Wanted(type, dtype == DT_DIR)) {
+            return EntryVerdict::kSkip;
+        }
+        if (info < NVO_INFO_SIZE) {
+            return EntryVerdict::kKeep;  // the reader told everything that was asked
+        }
+    }
+    _tag_QUIBSTAT_ st{};
+    const int statFlags = QUIB_STAT_BASIC | ((info & NVO_INFO_TIME) ? QUIB_STAT_CRTIME : 0);
+    if (VLIBCFileLStat(realPath, statFlags, &st) != 0) {
+        return StatFailure(realPath, errno, facts);
+    }
+    const mode_t kind = st.st_mode & S_IFMT;
+    if ((kind != S_IFDIR && kind != S_IFREG) || !Wanted(type, kind == S_IFDIR)) {
+        return EntryVerdict::kSkip;
+    }
+    facts->isdir = kind == S_IFDIR;
+    if ((info & NVO_INFO_MOUNT_POINT_TYPE) && facts->isdir) {
+        facts->mountPointType = MountPointType(mounts.getFSTYPE(realPath));
+    }
+    facts->size = static_cast<uint64_t>(st.st_size);
+    facts->uid = st.st_uid;
+    facts->gid = st.st_gid;
+    facts->mtime = st.st_mtim.tv_sec;
+    facts->ctime = st.st_ctim.tv_sec;
+    facts->crtime = st.st_crtim.tv_sec;
+    facts->atime = st.st_atim.tv_sec;
+    facts->mode = st.st_mode;
+    if (info & NVO_INFO_PERM) {
+        facts->aclPrivilege = GetACLPrivilege(realPath);
+        // Intended: a failed probe (-1) counts as ACL mode too.
+        facts->isAclMode = QUIBACLIsSupport(realPath, -1, 2) != 0;
+    }
+    return EntryVerdict::kKeep;
+}
 
 }  // namespace norvo
 
@@ -107,67 +138,58 @@ int NvoEnum::FillFileInfo(const char *userPath, const char *realPath, const char
                           unsigned char dtype, int info, DIRENTRY_INFO &entry) {
     if (userPath == nullptr || realPath == nullptr || name == nullptr) {
         NvoLibSetErr(NVO_ERR_GENERAL);
-        return kFail;
+        return -1;
     }
     try {
         entry.name = name;
-        entry.isdir = (dtype & DT_DIR) != 0;
-        if (!t_pathsDeferred) {
-            entry.path = userPath;
-            if (info & NVO_INFO_REAL_PATH) {
-                entry.real_path = realPath;
-            }
+        entry.path = userPath;
+        if (info & NVO_INFO_REAL_PATH) {
+            entry.real_path = realPath;
         }
-        if (dtype != DT_UNKNOWN) {
-            // Links, devices, pipes and sockets are never listed.
-            if ((dtype != DT_DIR && dtype != DT_REG) || !Wanted(type, dtype == DT_DIR)) {
-                return kSkip;
-            }
-            if (info < NVO_INFO_SIZE) {
-                return kKeep;  // the reader told everything that was asked
-            }
+        EntryFacts facts;
+        const EntryVerdict verdict = norvo::ReadEntryFacts(*this, realPath, type, dtype, info, &facts);
+        entry.isdir = facts.isdir;
+        switch (verdict) {
+        case EntryVerdict::kKeep:
+            break;
+        case EntryVerdict::kUnreachable:
+            entry.mount_point_type = facts.mountPointType;
+            return 1;  // skipped, yet a listing keeps it
+        case EntryVerdict::kSkip:
+            return 1;
+        case EntryVerdict::kFail:
+            return -1;
         }
-        _tag_QUIBSTAT_ st{};
-        const int statFlags = QUIB_STAT_BASIC | ((info & NVO_INFO_TIME) ? QUIB_STAT_CRTIME : 0);
-        if (VLIBCFileLStat(realPath, statFlags, &st) != 0) {
-            return StatFailure(realPath, errno, entry);
-        }
-        const mode_t kind = st.st_mode & S_IFMT;
-        if ((kind != S_IFDIR && kind != S_IFREG) || !Wanted(type, kind == S_IFDIR)) {
-            return kSkip;
-        }
-        entry.isdir = kind == S_IFDIR;
         if (info & NVO_INFO_MOUNT_POINT_TYPE) {
-            entry.mount_point_type = entry.isdir ? MountPointType(getFSTYPE(realPath)) : "";
+            entry.mount_point_type = facts.mountPointType;
         }
         if ((info & NVO_INFO_TYPE) && !entry.isdir) {
-            SetType(name, entry.type);
+            norvo::LowerExtension(name, &entry.type);
         }
         if (info & NVO_INFO_SIZE) {
-            entry.size = static_cast<uint64_t>(st.st_size);
+            entry.size = facts.size;
         }
         if (info & NVO_INFO_OWNER) {
-            entry.uid = st.st_uid;
-            entry.gid = st.st_gid;
-            entry.user = userEnum_.GetUserNameByUID(st.st_uid);
-            entry.group = userEnum_.GetGroupNameByGID(st.st_gid);
+            entry.uid = facts.uid;
+            entry.gid = facts.gid;
+            entry.user = userEnum_.GetUserNameByUID(facts.uid);
+            entry.group = userEnum_.GetGroupNameByGID(facts.gid);
         }
         if (info & NVO_INFO_TIME) {
-            entry.mtime = st.st_mtim.tv_sec;
-            entry.ctime = st.st_ctim.tv_sec;
-            entry.crtime = st.st_crtim.tv_sec;
-            entry.atime = st.st_atim.tv_sec;
+            entry.mtime = facts.mtime;
+            entry.ctime = facts.ctime;
+            entry.crtime = facts.crtime;
+            entry.atime = facts.atime;
         }
         if (info & NVO_INFO_PERM) {
-            entry.mode = st.st_mode;
-            entry.acl_privilege = GetACLPrivilege(realPath);
-            // Intended: a failed probe (-1) counts as ACL mode too.
-            entry.is_acl_mode = QUIBACLIsSupport(realPath, -1, 2) != 0;
+            entry.mode = facts.mode;
+            entry.acl_privilege = facts.aclPrivilege;
+            entry.is_acl_mode = facts.isAclMode;
         }
-        return kKeep;
+        return 0;
     } catch (...) {
         // Only memory can run out here.
         NvoLibSetErr(NVO_ERR_SYSTEM);
-        return kFail;
+        return -1;
     }
 }

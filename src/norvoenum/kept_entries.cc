@@ -1,28 +1,35 @@
 #include "norvoenum/kept_entries.h"
 
-#include <limits>
-#include <new>
+#include <string.h>
 
 namespace norvo {
+namespace {
 
-uint32_t KeptEntries::Intern(const std::string &text, uint32_t *hint) {
-    if (*hint < words_.size() && words_[*hint] == text) {
-        return *hint;
+// The rule's field, as SortFactsOf reads it from a record filled with the same facts.
+int64_t SortValueOf(SortRule rule, const EntryFacts &facts) {
+    switch (rule) {
+    case SortRule::kSize:
+        return facts.isdir ? 0 : static_cast<int64_t>(facts.size);
+    case SortRule::kMtime:
+        return facts.mtime;
+    case SortRule::kCrtime:
+        return facts.crtime;
+    case SortRule::kCtime:
+        return facts.ctime;
+    case SortRule::kAtime:
+        return facts.atime;
+    case SortRule::kUser:
+        return facts.uid;
+    case SortRule::kGroup:
+        return facts.gid;
+    case SortRule::kPosix:
+        return facts.mode & 0x1FFu;
+    default:
+        return 0;
     }
-    const auto found = wordIndex_.find(text);
-    if (found != wordIndex_.end()) {
-        *hint = found->second;
-        return found->second;
-    }
-    if (words_.size() >= std::numeric_limits<uint32_t>::max()) {
-        throw std::bad_alloc();
-    }
-    const auto index = static_cast<uint32_t>(words_.size());
-    words_.push_back(text);
-    wordIndex_.emplace(text, index);
-    *hint = index;
-    return index;
 }
+
+}  // namespace
 
 size_t KeptEntries::Append(const std::string &text) {
     const size_t at = text_.size();
@@ -31,29 +38,21 @@ size_t KeptEntries::Append(const std::string &text) {
     return at;
 }
 
-void KeptEntries::Add(const DIRENTRY_INFO &entry) {
-    Kept kept{};
+void KeptEntries::Add(const char *name, const EntryFacts &facts) {
     const size_t textBefore = text_.size();
     try {
-        kept.nameAt = Append(entry.name);
-        kept.nameSize = entry.name.size();
-        kept.typeAt = Append(entry.type);
-        kept.typeSize = entry.type.size();
-        kept.user = Intern(entry.user, &userHint_);
-        kept.group = Intern(entry.group, &groupHint_);
-        kept.mountPointType = Intern(entry.mount_point_type, &mountHint_);
-        kept.size = entry.size;
-        kept.sortValue = SortFactsOf(rule_, entry).value;
-        kept.mode = entry.mode;
-        kept.aclPrivilege = entry.acl_privilege;
-        kept.mtime = entry.mtime;
-        kept.ctime = entry.ctime;
-        kept.crtime = entry.crtime;
-        kept.atime = entry.atime;
-        kept.uid = entry.uid;
-        kept.gid = entry.gid;
-        kept.isdir = entry.isdir;
-        kept.isAclMode = entry.is_acl_mode;
+        Kept kept{};
+        scratch_.assign(name);
+        kept.nameSize = scratch_.size();
+        kept.nameAt = Append(scratch_);
+        scratch_.clear();
+        if ((info_ & NVO_INFO_TYPE) != 0 && !facts.isdir) {
+            LowerExtension(name, &scratch_);
+        }
+        kept.typeSize = scratch_.size();
+        kept.typeAt = Append(scratch_);
+        kept.sortValue = SortValueOf(rule_, facts);
+        kept.facts = facts;
         kept_.push_back(kept);
     } catch (...) {
         text_.resize(textBefore);  // all or nothing
@@ -63,27 +62,46 @@ void KeptEntries::Add(const DIRENTRY_INFO &entry) {
 
 SortFacts KeptEntries::FactsAt(size_t i) const {
     const Kept &kept = kept_[i];
-    return SortFacts{text_.data() + kept.nameAt, text_.data() + kept.typeAt, kept.sortValue, kept.isdir};
+    return SortFacts{text_.data() + kept.nameAt, text_.data() + kept.typeAt, kept.sortValue, kept.facts.isdir};
 }
 
-void KeptEntries::Restore(size_t i, DIRENTRY_INFO &entry) const {
+void KeptEntries::Build(size_t i, const std::string &userDir, const std::string &realDir, NorvoUserEnum &names,
+                        DIRENTRY_INFO &entry) const {
     const Kept &kept = kept_[i];
+    const EntryFacts &facts = kept.facts;
     entry.name.assign(text_, kept.nameAt, kept.nameSize);
+    entry.path.reserve(userDir.size() + 1 + kept.nameSize);
+    entry.path.append(userDir).append(1, '/').append(entry.name);
+    if (info_ & NVO_INFO_REAL_PATH) {
+        entry.real_path.reserve(realDir.size() + 1 + kept.nameSize);
+        entry.real_path.append(realDir).append(1, '/').append(entry.name);
+    }
+    entry.isdir = facts.isdir;
     entry.type.assign(text_, kept.typeAt, kept.typeSize);
-    entry.user = words_[kept.user];
-    entry.group = words_[kept.group];
-    entry.mount_point_type = words_[kept.mountPointType];
-    entry.size = kept.size;
-    entry.mode = kept.mode;
-    entry.acl_privilege = kept.aclPrivilege;
-    entry.mtime = kept.mtime;
-    entry.ctime = kept.ctime;
-    entry.crtime = kept.crtime;
-    entry.atime = kept.atime;
-    entry.uid = kept.uid;
-    entry.gid = kept.gid;
-    entry.isdir = kept.isdir;
-    entry.is_acl_mode = kept.isAclMode;
+    // An unreachable mount shows as such whatever was asked; otherwise the flags decide.
+    if ((info_ & NVO_INFO_MOUNT_POINT_TYPE) != 0 || strcmp(facts.mountPointType, "remotefail") == 0) {
+        entry.mount_point_type = facts.mountPointType;
+    }
+    if (info_ & NVO_INFO_SIZE) {
+        entry.size = facts.size;
+    }
+    if (info_ & NVO_INFO_OWNER) {
+        entry.uid = facts.uid;
+        entry.gid = facts.gid;
+        entry.user = names.GetUserNameByUID(facts.uid);
+        entry.group = names.GetGroupNameByGID(facts.gid);
+    }
+    if (info_ & NVO_INFO_TIME) {
+        entry.mtime = facts.mtime;
+        entry.ctime = facts.ctime;
+        entry.crtime = facts.crtime;
+        entry.atime = facts.atime;
+    }
+    if (info_ & NVO_INFO_PERM) {
+        entry.mode = facts.mode;
+        entry.acl_privilege = facts.aclPrivilege;
+        entry.is_acl_mode = facts.isAclMode;
+    }
 }
 
 }  // namespace norvo

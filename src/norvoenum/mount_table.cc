@@ -11,8 +11,8 @@
 
 #include "common/log.h"
 #include "common/modules.h"
+#include "errors/guard.h"
 #include "norvo/norvoenum.h"
-#include "norvoenum/guarded.h"
 #include "quib_fs.h"
 
 using norvo::kNorvoEnum;

@@ -2,8 +2,8 @@
 #include <string>
 
 #include "common/owners.h"
+#include "errors/guard.h"
 #include "norvo/norvoenum.h"
-#include "norvoenum/guarded.h"
 
 namespace {
 

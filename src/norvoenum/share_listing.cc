@@ -1,6 +1,10 @@
 // The top of the user-visible tree ("/"): the user's home folder, then the shares the user may
 // see, with share privileges and volume figures, sorted and paged as a directory listing.
+#include <errno.h>
+#include <stdio.h>
+#include <string.h>
 #include <sys/statfs.h>
+#include <unistd.h>
 
 #include <list>
 #include <string>
@@ -9,11 +13,11 @@
 #include "common/modules.h"
 #include "common/owners.h"
 #include "common/text.h"
+#include "errors/guard.h"
 #include "info_flags.h"
 #include "norvo/errors.h"
 #include "norvo/norvodir.h"
 #include "norvo/norvoenum.h"
-#include "norvoenum/guarded.h"
 #include "quib_s2s.h"
 #include "quib_sdk_share.h"
 #include "quib_share_list.h"
@@ -63,17 +67,26 @@ int FillKeepingSlot(NvoEnum &listing, const char *userPath, const char *realPath
     return filled;
 }
 
-// Appends the home entry when user has a home folder. false (logged) when its real path can't
-// be resolved; the slot then holds NvoLibRealFullPathGet's code.
+// Appends the home entry when user has a home folder. A home not made yet is listed all the
+// same: it is made (as the home service makes it) when the user first opens it, and a listing,
+// which runs as the user and only reads, neither can nor should make it. false (logged) when
+// the home's real path can't be resolved; the slot then holds NvoLibRealFullPathGet's code.
 bool AddHome(NvoEnum &listing, const char *user, int info, std::list<DIRENTRY_INFO> &out) {
     char home[4096] = {0};
     if (QUIBServiceHomePathGet(user, home, sizeof home) != 0) {
         return true;  // no home folder: shares only
     }
     char real[4096] = {0};
-    if (!NvoLibRealFullPathGet(home, real, 4095)) {  // which leaves its own code in the slot
+    std::string volumeProbe;  // where the volume figures are read
+    if (access(home, F_OK) != 0 && errno == ENOENT) {
+        snprintf(real, sizeof real, "%s", home);
+        const char *slash = strrchr(home, '/');
+        volumeProbe.assign(home, slash != nullptr && slash != home ? static_cast<size_t>(slash - home) : 1);
+    } else if (!NvoLibRealFullPathGet(home, real, 4095)) {  // which leaves its own code in the slot
         NVO_LOG_AT(kNorvoEnum, 415, "%s:%d Failed to get real path (%s)", home);
         return false;
+    } else {
+        volumeProbe = real;
     }
     DIRENTRY_INFO entry;
     FillKeepingSlot(listing, "/home", real, "home", 4, info, entry);
@@ -83,7 +96,7 @@ bool AddHome(NvoEnum &listing, const char *user, int info, std::list<DIRENTRY_IN
         entry.acl_enabled = false;
         entry.synced_share = false;
     }
-    FillVolumeStatus(listing, real, info, entry);
+    FillVolumeStatus(listing, volumeProbe.c_str(), info, entry);
     out.push_back(std::move(entry));  // whatever FillFileInfo said: the home is always shown
     return true;
 }

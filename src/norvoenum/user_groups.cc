@@ -3,9 +3,9 @@
 #include <string>
 
 #include "common/owners.h"
+#include "errors/guard.h"
 #include "norvo/norvoenum.h"
 #include "norvoenum/group_ids.h"
-#include "norvoenum/guarded.h"
 
 namespace {
 

@@ -7,6 +7,7 @@
 #include <vector>
 
 #include "common/owners.h"
+#include "errors/guard.h"
 #include "norvo/norvomisc.h"
 #include "quib_fs.h"
 #include "quib_webutils.h"
@@ -65,9 +66,11 @@ std::string FolderIcon(const std::string &realPath, const std::string &sharePath
 
 void GetImgFileExt(const char *name, bool isDir, std::string &out, const std::string &realPath,
                    const std::string &sharePath) {
-    out = "misc.png";
-    if (name == nullptr) {
-        return;
-    }
-    out = isDir ? FolderIcon(realPath, sharePath) : FileIcon(name);
+    norvo::GuardedVoid([&] {
+        out = "misc.png";
+        if (name == nullptr) {
+            return;
+        }
+        out = isDir ? FolderIcon(realPath, sharePath) : FileIcon(name);
+    });
 }

@@ -93,9 +93,10 @@ inline Element Read(const uint8_t *pattern, UChar32 esc) {
 }
 
 // Whether the subject character at s folds to literal (itself folded); *next is set past it.
-// ASCII goes by the table. Above ASCII only U+017F and U+212A fold into it (case folding is
-// stable across Unicode versions; a test checks the linked ICU), so most comparisons of names
-// with an ASCII pattern need no call.
+// Both sides are decoded and folded by the same rule, so an overlong sequence that decodes to an
+// ASCII letter folds as that letter does in the pattern. Above ASCII only U+017F and U+212A fold
+// into ASCII (case folding is stable across Unicode versions; a test checks the linked ICU), so
+// most comparisons of names with an ASCII pattern need no call.
 inline bool FoldsTo(const uint8_t *s, UChar32 literal, const uint8_t **next) {
     if (*s < 0x80) {
         *next = s + 1;
@@ -106,7 +107,7 @@ inline bool FoldsTo(const uint8_t *s, UChar32 literal, const uint8_t **next) {
     if (c == literal) {
         return true;  // folding is idempotent
     }
-    if (literal < 0x80 && c != 0x17F && c != 0x212A) {
+    if (literal < 0x80 && c >= 0x80 && c != 0x17F && c != 0x212A) {
         return false;
     }
     return Fold(c) == literal;

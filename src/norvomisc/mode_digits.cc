@@ -1,5 +1,6 @@
 #include <string>
 
+#include "errors/guard.h"
 #include "norvo/norvomisc.h"
 
 namespace {
@@ -24,12 +25,14 @@ int GetPrivilege(unsigned int mode) {
 }
 
 std::string GetPrivilegeStr(unsigned int mode) {
-    static const char kLetters[] = "rwxrwxrwx";
-    std::string out(9, '-');
-    for (unsigned i = 0; i < 9; ++i) {
-        if (mode & (0400u >> i)) {
-            out[i] = kLetters[i];
+    return norvo::Guarded<std::string>(std::string(), [&]() -> std::string {
+        static const char kLetters[] = "rwxrwxrwx";
+        std::string out(9, '-');
+        for (unsigned i = 0; i < 9; ++i) {
+            if (mode & (0400u >> i)) {
+                out[i] = kLetters[i];
+            }
         }
-    }
-    return out;
+        return out;
+    });
 }

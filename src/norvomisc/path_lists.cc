@@ -7,6 +7,7 @@
 
 #include "common/log.h"
 #include "common/modules.h"
+#include "errors/guard.h"
 #include "norvo/errors.h"
 #include "norvo/norvomisc.h"
 
@@ -22,51 +23,55 @@ std::string ElementText(const Json::Value &element) {
 }  // namespace
 
 int ParseJsonPathToString(const Json::Value &value, std::string &out) {
-    if (!value.isArray()) {
-        NvoLibSetErr(NVO_ERR_SYSTEM);
-        NVO_LOG(kNorvoMisc, "%s:%d Wrong JSON format");
-        return 0;
-    }
-    out.clear();
-    for (const Json::Value &element : value) {
-        const std::string text = ElementText(element);
-        const size_t slash = text.find('/');
-        if (!out.empty()) {
-            out += ", ";
+    return norvo::Guarded<int>(0, [&]() -> int {
+        if (!value.isArray()) {
+            NvoLibSetErr(NVO_ERR_SYSTEM);
+            NVO_LOG(kNorvoMisc, "%s:%d Wrong JSON format");
+            return 0;
         }
-        out.append(text, slash == std::string::npos ? 0 : slash, std::string::npos);
-    }
-    return 1;
+        out.clear();
+        for (const Json::Value &element : value) {
+            const std::string text = ElementText(element);
+            const size_t slash = text.find('/');
+            if (!out.empty()) {
+                out += ", ";
+            }
+            out.append(text, slash == std::string::npos ? 0 : slash, std::string::npos);
+        }
+        return 1;
+    });
 }
 
 // Paths without any common leading directory leave their common prefix as it is ("ab" and
 // "ac" give "a"): intended.
 std::string FindCommonParent(std::vector<std::string> paths) {
-    size_t longest = 0;
-    for (std::string &path : paths) {
-        if (!path.empty() && path.back() != '/') {
-            path += '/';
+    return norvo::Guarded<std::string>(std::string(), [&]() -> std::string {
+        size_t longest = 0;
+        for (std::string &path : paths) {
+            if (!path.empty() && path.back() != '/') {
+                path += '/';
+            }
+            longest = std::max(longest, path.size());
         }
-        longest = std::max(longest, path.size());
-    }
-    if (longest == 0) {
-        return std::string();
-    }
-    // A path that has ended compares as its terminating NUL, so it differs from the longest.
-    const auto at = [](const std::string &path, size_t i) { return i < path.size() ? path[i] : '\0'; };
-    size_t common = 0;
-    for (; common < longest; ++common) {
-        const char c = at(paths.front(), common);
-        if (!std::all_of(paths.begin(), paths.end(), [&](const std::string &path) { return at(path, common) == c; })) {
-            break;
+        if (longest == 0) {
+            return std::string();
         }
-    }
-    std::string parent = paths.front().substr(0, common);
-    if (!parent.empty() && parent.back() != '/') {
-        const size_t slash = parent.rfind('/');
-        if (slash != std::string::npos) {
-            parent.erase(slash + 1);
+        // A path that has ended compares as its terminating NUL, so it differs from the longest.
+        const auto at = [](const std::string &path, size_t i) { return i < path.size() ? path[i] : '\0'; };
+        size_t common = 0;
+        for (; common < longest; ++common) {
+            const char c = at(paths.front(), common);
+            if (!std::all_of(paths.begin(), paths.end(), [&](const std::string &path) { return at(path, common) == c; })) {
+                break;
+            }
         }
-    }
-    return parent;
+        std::string parent = paths.front().substr(0, common);
+        if (!parent.empty() && parent.back() != '/') {
+            const size_t slash = parent.rfind('/');
+            if (slash != std::string::npos) {
+                parent.erase(slash + 1);
+            }
+        }
+        return parent;
+    });
 }

@@ -5,6 +5,7 @@
 #include <string_view>
 #include <vector>
 
+#include "errors/guard.h"
 #include "norvo/norvomisc.h"
 
 namespace {
@@ -38,33 +39,39 @@ bool IsEmptyDelimiter(const char *delim) {
 }  // namespace
 
 void StringExplode(std::vector<std::string> &out, const std::string &text, const char *delim) {
-    if (IsEmptyDelimiter(delim)) {
-        return;
-    }
-    ForEachPiece(text, delim, [&out](std::string_view piece) { out.emplace_back(piece); });
+    norvo::GuardedVoid([&] {
+        if (IsEmptyDelimiter(delim)) {
+            return;
+        }
+        ForEachPiece(text, delim, [&out](std::string_view piece) { out.emplace_back(piece); });
+    });
 }
 
 void StringExplode(const std::string &text, const char *delim, void (*callback)(const std::string &, void *),
                    void *user) {
-    if (IsEmptyDelimiter(delim) || callback == nullptr) {
-        return;
-    }
-    ForEachPiece(text, delim, [callback, user](std::string_view piece) { callback(std::string(piece), user); });
+    norvo::GuardedVoid([&] {
+        if (IsEmptyDelimiter(delim) || callback == nullptr) {
+            return;
+        }
+        ForEachPiece(text, delim, [callback, user](std::string_view piece) { callback(std::string(piece), user); });
+    });
 }
 
 void StringExplodeToFileNameString(std::string &out, const std::string &text, const char *delim, const char *sep) {
-    if (IsEmptyDelimiter(delim)) {
-        return;
-    }
-    out.clear();
-    const std::string_view separator(sep != nullptr ? sep : "");
-    bool first = true;
-    ForEachPiece(text, delim, [&](std::string_view piece) {
-        if (!first) {
-            out += separator;
+    norvo::GuardedVoid([&] {
+        if (IsEmptyDelimiter(delim)) {
+            return;
         }
-        first = false;
-        const size_t slash = piece.rfind('/');
-        out += slash == std::string_view::npos ? piece : piece.substr(slash + 1);
+        out.clear();
+        const std::string_view separator(sep != nullptr ? sep : "");
+        bool first = true;
+        ForEachPiece(text, delim, [&](std::string_view piece) {
+            if (!first) {
+                out += separator;
+            }
+            first = false;
+            const size_t slash = piece.rfind('/');
+            out += slash == std::string_view::npos ? piece : piece.substr(slash + 1);
+        });
     });
 }

@@ -6,6 +6,7 @@
 #include "common/log.h"
 #include "common/modules.h"
 #include "common/text.h"
+#include "errors/guard.h"
 #include "norvo/norvomisc.h"
 
 using norvo::kNorvoMisc;
@@ -86,27 +87,31 @@ Pair MakePair(const char *from, const char *to) {
 }  // namespace
 
 int NvoLibStrReplace(const char *src, const char *from, const char *to, char **out) {
-    if (out == nullptr) {
-        return -1;
-    }
-    *out = nullptr;
-    if (norvo::IsEmpty(src) || norvo::IsEmpty(from) || norvo::IsEmpty(to)) {
-        return -1;
-    }
-    Pair pairs[] = {MakePair(from, to)};
-    return Replace(src, pairs, 1, out);
+    return norvo::Guarded<int>(-1, [&]() -> int {
+        if (out == nullptr) {
+            return -1;
+        }
+        *out = nullptr;
+        if (norvo::IsEmpty(src) || norvo::IsEmpty(from) || norvo::IsEmpty(to)) {
+            return -1;
+        }
+        Pair pairs[] = {MakePair(from, to)};
+        return Replace(src, pairs, 1, out);
+    });
 }
 
 int NvoLibTwoStrReplace(const char *src, const char *from1, const char *to1, const char *from2, const char *to2,
                         char **out) {
-    if (out == nullptr) {
-        return -1;
-    }
-    *out = nullptr;
-    if (norvo::IsEmpty(src) || norvo::IsEmpty(from1) || norvo::IsEmpty(to1) || norvo::IsEmpty(from2) ||
-        norvo::IsEmpty(to2)) {
-        return -1;
-    }
-    Pair pairs[] = {MakePair(from1, to1), MakePair(from2, to2)};
-    return Replace(src, pairs, 2, out);
+    return norvo::Guarded<int>(-1, [&]() -> int {
+        if (out == nullptr) {
+            return -1;
+        }
+        *out = nullptr;
+        if (norvo::IsEmpty(src) || norvo::IsEmpty(from1) || norvo::IsEmpty(to1) || norvo::IsEmpty(from2) ||
+            norvo::IsEmpty(to2)) {
+            return -1;
+        }
+        Pair pairs[] = {MakePair(from1, to1), MakePair(from2, to2)};
+        return Replace(src, pairs, 2, out);
+    });
 }

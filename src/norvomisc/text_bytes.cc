@@ -5,6 +5,7 @@
 
 #include <string>
 
+#include "errors/guard.h"
 #include "norvo/norvomisc.h"
 
 int NvoLibStringToLower(char *text) {
@@ -52,18 +53,20 @@ int IsUnicodeString(const char *text) {
 // Each pair goes through strtol, so its quirks are kept: leading blanks or a sign count and
 // parsing stops at the first non-hex character ("4g" gives 4).
 std::string NvoLibHex2Bin(const char *hex) {
-    std::string out;
-    if (hex == nullptr) {
-        return out;
-    }
-    const size_t pairs = strlen(hex) / 2;
-    for (size_t i = 0; i < pairs; ++i) {
-        const char two[3] = {hex[2 * i], hex[2 * i + 1], '\0'};
-        const char byte = static_cast<char>(strtol(two, nullptr, 16));
-        if (byte == '\0') {
-            break;  // the decoded bytes are read back as a C string
+    return norvo::Guarded<std::string>(std::string(), [&]() -> std::string {
+        std::string out;
+        if (hex == nullptr) {
+            return out;
         }
-        out += byte;
-    }
-    return out;
+        const size_t pairs = strlen(hex) / 2;
+        for (size_t i = 0; i < pairs; ++i) {
+            const char two[3] = {hex[2 * i], hex[2 * i + 1], '\0'};
+            const char byte = static_cast<char>(strtol(two, nullptr, 16));
+            if (byte == '\0') {
+                break;  // the decoded bytes are read back as a C string
+            }
+            out += byte;
+        }
+        return out;
+    });
 }

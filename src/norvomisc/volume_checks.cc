@@ -2,9 +2,9 @@
 
 #include "common/log.h"
 #include "common/modules.h"
-#include "common/owners.h"
+#include "common/share_encryption.h"
+#include "errors/guard.h"
 #include "norvo/errors.h"
-#include "norvo/norvodir.h"
 #include "norvo/norvomisc.h"
 #include "quib_fs.h"
 
@@ -41,16 +41,14 @@ int NvoLibCheckEncryptShare(const std::string &share, bool *encrypted) {
         NvoLibSetErr(NVO_ERR_GENERAL);
         return 0;
     }
-    *encrypted = false;
-    if (IsDirUserHome(share, nullptr)) {
+    return norvo::Guarded(0, [&] {
+        const norvo::Encryption state = norvo::ShareEncryption(share.c_str());
+        *encrypted = state == norvo::Encryption::kEncrypted;
+        if (state == norvo::Encryption::kNoShare) {
+            NVO_LOG(kNorvoMisc, "%s:%d QUIBShareGet fail %s", share.c_str());
+            NvoLibSetErr(NVO_ERR_NO_PATH);
+            return 0;
+        }
         return 1;
-    }
-    norvo::ShareRecord record = norvo::GetShare(share.c_str());
-    if (!record) {
-        NVO_LOG(kNorvoMisc, "%s:%d QUIBShareGet fail %s", share.c_str());
-        NvoLibSetErr(NVO_ERR_NO_PATH);
-        return 0;
-    }
-    *encrypted = (record->fStatus & SHARE_STATUS_ENCRYPTED) != 0;
-    return 1;
+    });
 }

@@ -1,6 +1,7 @@
 // The base of every condition: record ownership and the conjunction link.
 #include <stdlib.h>
 
+#include "errors/guard.h"
 #include "norvo/norvosearch.h"
 
 namespace FileSearch {
@@ -22,13 +23,15 @@ __tag_FI_SQL_COND *FindComp::getFirstCond() {
 // A user or group condition links onward from its name record, the end of its OR pair; a size
 // "equal" condition from its lower bound, the end of its AND pair.
 void FindComp::operator()(FindComp *next) {
-    if (next == nullptr) {
-        return;
-    }
-    __tag_FI_SQL_COND *last = extraCond != nullptr ? extraCond : cond;
-    if (last != nullptr) {
-        last->andNext = next->cond;
-    }
+    norvo::GuardedVoid([&] {
+        if (next == nullptr) {
+            return;
+        }
+        __tag_FI_SQL_COND *last = extraCond != nullptr ? extraCond : cond;
+        if (last != nullptr) {
+            last->andNext = next->cond;
+        }
+    });
 }
 
 }  // namespace FileSearch

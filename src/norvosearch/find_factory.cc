@@ -8,6 +8,7 @@
 
 #include <json/value.h>
 
+#include "errors/guard.h"
 #include "norvo/errors.h"
 #include "norvo/norvosearch.h"
 #include "quib_user.h"
@@ -200,18 +201,20 @@ bool AppendField(Field field, const char *op, const char *value, Conditions &out
 }  // namespace
 
 bool FindFactory::createFindOp(_tag_FIND_FIELD_ field, const char *op, const char *value, std::vector<FindComp *> &out) {
-    if (field != FIND_FIELD_TYPE && value == nullptr) {
-        return Fail(NVO_ERR_GENERAL);
-    }
-    if (NeedsOp(field) && op == nullptr) {
-        return Fail(NVO_ERR_GENERAL);
-    }
-    try {
-        return AppendField(field, op, value, out);
-    } catch (const OutOfMemory &) {
-    } catch (const std::bad_alloc &) {
-    }
-    return Fail(NVO_ERR_SYSTEM);
+    return norvo::Guarded<bool>(false, [&]() -> bool {
+        if (field != FIND_FIELD_TYPE && value == nullptr) {
+            return Fail(NVO_ERR_GENERAL);
+        }
+        if (NeedsOp(field) && op == nullptr) {
+            return Fail(NVO_ERR_GENERAL);
+        }
+        try {
+            return AppendField(field, op, value, out);
+        } catch (const OutOfMemory &) {
+        } catch (const std::bad_alloc &) {
+        }
+        return Fail(NVO_ERR_SYSTEM);
+    });
 }
 
 }  // namespace FileSearch

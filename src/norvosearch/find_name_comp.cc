@@ -6,6 +6,7 @@
 #include <new>
 
 #include "common/owners.h"
+#include "errors/guard.h"
 #include "norvo/norvomisc.h"
 #include "norvo/norvosearch.h"
 #include "norvosearch/sql_cond_text.h"
@@ -69,42 +70,46 @@ FindNameComp::~FindNameComp() {
 }
 
 bool FindNameComp::operator()(const char *path, const _tag_QUIBSTAT_ &st) {
-    if (path == nullptr) {
-        return false;
-    }
-    for (FindNameComp *alternative : alternatives) {
-        if ((*alternative)(path, st)) {
-            return true;
+    return norvo::Guarded<bool>(false, [&]() -> bool {
+        if (path == nullptr) {
+            return false;
         }
-    }
-    norvo::CString base(BaseNameOf(path));
-    return base && NvoLibStrLikeCompare(pattern, base.get(), '\\') == 1;
-}
-
-void FindNameComp::orComp(FindNameComp *other) {
-    // Each condition has one owner: joining this to itself, twice, or below its own
-    // alternative would free it twice.
-    const auto owns = [](const auto &self, const FindNameComp *node, const FindNameComp *target) -> bool {
-        for (const FindNameComp *alternative : node->alternatives) {
-            if (alternative == target || self(self, alternative, target)) {
+        for (FindNameComp *alternative : alternatives) {
+            if ((*alternative)(path, st)) {
                 return true;
             }
         }
-        return false;
-    };
-    if (other == nullptr || other == this || owns(owns, this, other) || owns(owns, other, this)) {
-        return;
-    }
-    try {
-        alternatives.push_back(other);
-    } catch (const std::bad_alloc &) {
-        delete other;  // ownership passed with the call: never leak it
-        return;
-    }
-    if (other->cond != nullptr) {
-        other->cond->orNext = cond;
-        cond = other->cond;
-    }
+        norvo::CString base(BaseNameOf(path));
+        return base && NvoLibStrLikeCompare(pattern, base.get(), '\\') == 1;
+    });
+}
+
+void FindNameComp::orComp(FindNameComp *other) {
+    norvo::GuardedVoid([&] {
+        // Each condition has one owner: joining this to itself, twice, or below its own
+        // alternative would free it twice.
+        const auto owns = [](const auto &self, const FindNameComp *node, const FindNameComp *target) -> bool {
+            for (const FindNameComp *alternative : node->alternatives) {
+                if (alternative == target || self(self, alternative, target)) {
+                    return true;
+                }
+            }
+            return false;
+        };
+        if (other == nullptr || other == this || owns(owns, this, other) || owns(owns, other, this)) {
+            return;
+        }
+        try {
+            alternatives.push_back(other);
+        } catch (const std::bad_alloc &) {
+            delete other;  // ownership passed with the call: never leak it
+            return;
+        }
+        if (other->cond != nullptr) {
+            other->cond->orNext = cond;
+            cond = other->cond;
+        }
+    });
 }
 
 }  // namespace FileSearch

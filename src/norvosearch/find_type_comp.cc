@@ -2,6 +2,7 @@
 #include <new>
 #include <strings.h>
 
+#include "errors/guard.h"
 #include "norvo/norvosearch.h"
 #include "norvosearch/sql_cond_text.h"
 
@@ -26,16 +27,18 @@ bool FindTypeComp::operator()(const char * /*path*/, const _tag_QUIBSTAT_ &st) {
 }
 
 FindComp *FindTypeCompFactory::createFindTypeOpt(const char *word) {
-    if (word == nullptr) {
+    return norvo::Guarded<FindComp *>(nullptr, [&]() -> FindComp * {
+        if (word == nullptr) {
+            return nullptr;
+        }
+        if (strcasecmp(word, "dir") == 0) {
+            return new (std::nothrow) FindTypeComp(true);
+        }
+        if (strcasecmp(word, "file") == 0) {
+            return new (std::nothrow) FindTypeComp(false);
+        }
         return nullptr;
-    }
-    if (strcasecmp(word, "dir") == 0) {
-        return new (std::nothrow) FindTypeComp(true);
-    }
-    if (strcasecmp(word, "file") == 0) {
-        return new (std::nothrow) FindTypeComp(false);
-    }
-    return nullptr;
+    });
 }
 
 }  // namespace FileSearch

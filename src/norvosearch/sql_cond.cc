@@ -7,6 +7,7 @@
 
 #include <string>
 
+#include "errors/guard.h"
 #include "norvo/norvosearch.h"
 #include "norvosearch/sql_cond_text.h"
 
@@ -53,7 +54,9 @@ namespace FileSearch {
 
 void setSqlCond(__tag_FI_SQL_COND &c, __tag_FI_SQL_COND_TYPE type, __tag_FI_SQL_COND_OP op, std::string value,
                 __tag_FI_SQL_COND *andNext, __tag_FI_SQL_COND *orNext) {
-    norvo::search::SetSqlCondText(c, type, op, value.c_str(), andNext, orNext);
+    norvo::GuardedVoid([&] {
+        norvo::search::SetSqlCondText(c, type, op, value.c_str(), andNext, orNext);
+    });
 }
 
 void setSqlCond(__tag_FI_SQL_COND &c, __tag_FI_SQL_COND_TYPE type, __tag_FI_SQL_COND_OP op, unsigned long long value,

@@ -1,3 +1,4 @@
+#include "errors/guard.h"
 #include "norvo/nvoman.h"
 #include "quib_login.h"
 #include "quib_user.h"
@@ -9,9 +10,11 @@ constexpr char kFileManagerPrivilege[] = "QUIB.TVQ.App.Tovana3.Instance";
 }  // namespace
 
 bool IsAuthorized(WebMan &webman, const char *text) {
-    if (!webman.IsAuthorized(text, kAnyAccount, kRequestDataPosition)) {
-        return false;
-    }
-    const std::string user = webman.GetLoginUserName();
-    return VLIBUserPrivilegeHas(user.c_str(), kFileManagerPrivilege) != 0;
+    return norvo::Guarded<bool>(false, [&]() -> bool {
+        if (!webman.IsAuthorized(text, kAnyAccount, kRequestDataPosition)) {
+            return false;
+        }
+        const std::string user = webman.GetLoginUserName();
+        return VLIBUserPrivilegeHas(user.c_str(), kFileManagerPrivilege) != 0;
+    });
 }

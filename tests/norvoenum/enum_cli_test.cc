@@ -1,5 +1,7 @@
 // norvo mounts and norvo whois, run as programs in the appliance: the library's view in JSON,
 // failures with their codes, usage errors.
+#include <unistd.h>
+
 #include <string>
 
 #include <gtest/gtest.h>
@@ -60,10 +62,22 @@ TEST(EnumCli, WhoisNamesIdsThroughTheCaches) {
     EXPECT_EQ(unknown.exitStatus, 1);
     EXPECT_NE(unknown.out.find("\"code\":403"), std::string::npos) << unknown.out;
     EXPECT_EQ(RunNorvo({"whois", "--gid", "4242"}).exitStatus, 1);
-    for (const Args &args : {Args{"whois"}, Args{"whois", "--uid", "1", "--gid", "1"}, Args{"whois", "--uid", "-1"},
-                             Args{"whois", "--uid", "4294967296"}}) {
-        EXPECT_EQ(RunNorvo(args).exitStatus, 2) << args.back();
-    }
+}
+
+// carol's link inside public is described as the link it is, with a link's rights, and never
+// followed; a path through it is refused, as a listing would refuse it.
+TEST(EnumCli, PrivilegeDescribesALinkAndRefusesAPathThroughIt) {
+    Appliance app;
+    app.Basic().AddUser("carol").WriteFile("/volume1/photo/x.jpg");
+    ASSERT_EQ(app.RunAs("carol", [] { return symlink("/volume1/photo", "/volume1/public/photo"); }), 0);
+    const CliResult link = RunNorvo({"--json", "privilege", "--user", "carol", "/public/photo"});
+    ASSERT_EQ(link.exitStatus, 0) << link.err;
+    EXPECT_EQ(Data(link)["link"].asString(), "/volume1/photo");
+    EXPECT_EQ(Data(link)["acl"]["value"].asUInt(), unsigned{ACL_PERM_READ_ATTR | ACL_PERM_READ_ACL | ACL_PERM_DELETE});
+    const CliResult through = RunNorvo({"--json", "privilege", "--user", "carol", "/public/photo/x.jpg"});
+    EXPECT_EQ(through.exitStatus, 1);
+    EXPECT_NE(through.out.find("\"code\":407"), std::string::npos) << through.out;
+    EXPECT_TRUE(Data(RunNorvo({"--json", "privilege", "--user", "carol", "/public"}))["link"].isNull());
 }
 
 }  // namespace

@@ -2,6 +2,7 @@
 // volume figures, for local, domain and directory accounts, ordered and paged; the failures
 // with their log lines.
 #include <sys/statfs.h>
+#include <unistd.h>
 #include <syslog.h>
 
 #include <list>
@@ -72,7 +73,7 @@ TEST_F(ShareListing, EachAccountSeesItsHomeAndItsShares) {
     app_.SetDomain("CORP").SetHomeService(true, "/volume1/homes", false, true);  // no homes for domain accounts
     const struct { const char *user; std::string names; } rows[] = {
         {"alice", "home public photo secret archive"},  // the hidden share is left out
-        {"bob", ""},  // his home folder was never made: the listing fails (checked below)
+        {"bob", "home public photo"},  // his home is not made yet: it is listed all the same, and stays unmade
         {"carol", "public"},  // no home folder, shares only
         {"admin", "home public"},  // administrators see what the lists give them
         {"CORP\\dave", "public archive"},
@@ -89,14 +90,27 @@ TEST_F(ShareListing, EachAccountSeesItsHomeAndItsShares) {
     EXPECT_EQ(std::pair(erin.rc, erin.err), std::pair(0, int(NVO_ERR_SYSTEM)));
     app_.SetDirectory("ldap.corp.example");
     EXPECT_EQ(List({"erin@corp.example"}).Names(), "home public archive");
+    // A new user's first listing, as the user: the home entry is a folder with the volume's
+    // figures, and opening it makes it.
+    const int info = NVO_INFO_PERM | NVO_INFO_VOLUME_STATUS | NVO_INFO_SIZE;
+    app_.ClearLogs();
+    EXPECT_EQ(app_.RunAs("bob", [&] {
+                  const Listed got = List({"bob", "name", info});
+                  const DIRENTRY_INFO &home = got.Entry("home");
+                  return got.rc == 1 && home.isdir && home.share_privilege == 2 && home.totalspace > 0 ? 1 : 0;
+              }),
+              1);
+    EXPECT_NE(access("/volume1/homes/bob", F_OK), 0);
+    EXPECT_TRUE(app_.ErrorLines().empty());
 }
 
 TEST_F(ShareListing, FailuresAndTheirLogLines) {
-    app_.SetSetting("domain_joined", "no");
+    app_.SetSetting("domain_joined", "no").WriteFile("/volume1/homes/f");
+    app_.AddUser(norvo::testing::UserSpec{.name = "frank", .home = "/volume1/homes/f/frank"});  // not a folder
     const struct { const char *user; int err; std::vector<std::string> lines; } rows[] = {
         {nullptr, NVO_ERR_NO_USER, {"norvoenum.cpp:402 Failed to get user ((null))"}},
         {"CORP\\dave", NVO_ERR_SYSTEM, {"norvoenum.cpp:407 Failed to enum valid shares"}},
-        {"bob", NVO_ERR_NO_PATH, {"norvoenum.cpp:415 Failed to get real path (/volume1/homes/bob)"}},
+        {"frank", NVO_ERR_SYSTEM, {"norvoenum.cpp:415 Failed to get real path (/volume1/homes/f/frank)"}},
     };
     for (const auto &row : rows) {
         app_.ClearLogs();
@@ -127,19 +141,15 @@ TEST_F(ShareListing, ShareFieldsAndVolumeFigures) {
     };
     for (const auto &row : rows) {
         const DIRENTRY_INFO &e = got.Entry(row.name);
-        EXPECT_TRUE(e.isdir) << row.name;
-        EXPECT_EQ(e.share_privilege, row.priv) << row.name;
-        EXPECT_EQ(e.acl_enabled, row.acl) << row.name;
-        EXPECT_EQ(e.ftp_privilege, 0) << row.name;
-        EXPECT_EQ(e.mount_point_type, row.type) << row.name;
-        EXPECT_EQ(e.readonly, row.readonly) << row.name;
         const uint64_t bsize = row.volume ? row.volume->f_bsize : 0;
-        EXPECT_EQ(e.freespace, row.volume ? row.volume->f_bavail * bsize : 0) << row.name;
-        EXPECT_EQ(e.totalspace, row.volume ? row.volume->f_blocks * bsize : 0) << row.name;
+        EXPECT_EQ(std::tuple(e.isdir, e.share_privilege, e.acl_enabled, e.ftp_privilege, e.mount_point_type, e.readonly,
+                             e.freespace, e.totalspace),
+                  std::tuple(true, row.priv, row.acl, 0, row.type, row.readonly,
+                             row.volume ? row.volume->f_bavail * bsize : 0, row.volume ? row.volume->f_blocks * bsize : 0))
+            << row.name;
     }
-    EXPECT_EQ(got.Entry("home").real_path, "");  // not asked for
-    EXPECT_EQ(got.Entry("home").path, "/home");
-    EXPECT_EQ(got.Entry("photo").path, "/photo");
+    EXPECT_EQ(std::tuple(got.Entry("home").real_path, got.Entry("home").path, got.Entry("photo").path),
+              std::tuple("", "/home", "/photo"));  // the real path was not asked for
     // Without the flags nothing share-level is filled.
     const Listed bare = List({"alice"});
     const DIRENTRY_INFO &plain = bare.Entry("archive");

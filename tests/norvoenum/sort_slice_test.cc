@@ -10,7 +10,6 @@
 #include <unicode/ustring.h>
 
 #include "norvo/norvoenum.h"
-#include "norvoenum/info_flags.h"
 #include "vlibc_unicode.h"
 
 namespace {
@@ -209,22 +208,6 @@ TEST(EntrySlice, PagesAtTheEdges) {
     std::list<DIRENTRY_INFO> empty;
     enumeration.NvoLibDirEntrySlice(empty, 0xFFFFFFFFul, 1);
     EXPECT_TRUE(empty.empty());
-}
-
-TEST(InfoFlags, TheSortKeyWidensWhatIsFilled) {
-    const struct {
-        const char *key;
-        int added;
-    } table[] = {
-        {"size", NVO_INFO_SIZE},   {"mtime", NVO_INFO_TIME}, {"crtime", NVO_INFO_TIME}, {"ctime", NVO_INFO_TIME},
-        {"atime", NVO_INFO_TIME},  {"user", NVO_INFO_OWNER}, {"group", NVO_INFO_OWNER}, {"posix", NVO_INFO_PERM},
-        {"type", NVO_INFO_TYPE},   {"name", 0},              {"", 0},                   {nullptr, 0},
-        {"Size", 0},
-    };
-    for (const auto &row : table) {
-        EXPECT_EQ(norvo::WidenInfoBySortKey(row.key, NVO_INFO_REAL_PATH), NVO_INFO_REAL_PATH | row.added)
-            << (row.key ? row.key : "null");
-    }
 }
 
 }  // namespace

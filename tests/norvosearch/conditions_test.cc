@@ -102,22 +102,18 @@ TEST(Records, SetSqlCondFillsAndCuts) {
     EXPECT_EQ(std::string(c.value, sizeof(c.value)).find_first_not_of('\0', 20), std::string::npos);  // zero-filled
 }
 
+// Alternatives head their chain, newest first; joining one twice, itself or in a circle (which
+// would make each own the other) changes nothing.
 TEST(Chains, AlternativesHeadTheirChainNewestFirst) {
-    auto head = std::make_unique<FindNameComp>("a");
-    head->orComp(new FindNameComp("b"));
-    head->orComp(new FindNameComp("c"));
-    EXPECT_EQ(ChainOf(std::unique_ptr<FindComp>(head.release())), "{0 ~ *c* |{0 ~ *b* |{0 ~ *a*}}}");
-}
-
-TEST(Chains, JoiningItselfTwiceOrInACircleChangesNothing) {
     auto head = std::make_unique<FindNameComp>("a");
     auto *b = new FindNameComp("b");
     head->orComp(b);
     head->orComp(b);
     head->orComp(head.get());
     head->orComp(nullptr);
-    b->orComp(head.get());  // would make each own the other
-    EXPECT_EQ(Chain(head->getFirstCond()), "{0 ~ *b* |{0 ~ *a*}}");
+    b->orComp(head.get());
+    head->orComp(new FindNameComp("c"));
+    EXPECT_EQ(Chain(head->getFirstCond()), "{0 ~ *c* |{0 ~ *b* |{0 ~ *a*}}}");
 }
 
 TEST(Chains, ConjunctionLinksFromTheLastRecordOfEachCondition) {
@@ -144,6 +140,7 @@ protected:
 TEST_F(Factory, AppendsTheConditionsOfEachField) {
     const std::string alice = std::to_string(app.Uid("alice"));
     const std::string staff = std::to_string(app.Gid("staff"));
+    const std::string longTerm(5000, 'n');
     const struct {
         int field;
         const char *op;
@@ -174,6 +171,7 @@ TEST_F(Factory, AppendsTheConditionsOfEachField) {
         {8, "equal", "100", {"{7 < 105 &{7 >= 95}}"}},
         {8, "EQUAL", "100", {"{7 > 100}"}},
         {8, "less", "1k", {"{7 < 1}"}},
+        {0, nullptr, longTerm.c_str(), {"{0 ~ *" + std::string(4094, 'n') + "}"}},  // cut to the record
         {9, nullptr, "x", {}},
         {-1, "x", "y", {}},
     };

@@ -80,14 +80,10 @@ TEST(FileLStat, FailuresLeaveTheRecordAndSayWhy) {
         int err;
         int slot;
     } cases[] = {
-        {nullptr, 1, true, EINVAL, 0x0D00},
-        {"", 1, true, EINVAL, 0x0D00},
-        {"/volume1/file", 1, false, EINVAL, 0x0D00},
-        {"/volume1/file", 2, true, EINVAL, 0x0D00},
-        {"/volume1/file", -1, true, EINVAL, 0x0D00},
-        {tooLong.c_str(), 1, true, ENAMETOOLONG, 0xC300},
-        {"/volume1/missing", 1, true, ENOENT, 0x0600},
-        {"/volume1/file/below", 9, true, ENOTDIR, 0x0700},
+        {nullptr, 1, true, EINVAL, 0x0D00}, {"", 1, true, EINVAL, 0x0D00},
+        {"/volume1/file", 1, false, EINVAL, 0x0D00}, {"/volume1/file", 2, true, EINVAL, 0x0D00},
+        {"/volume1/file", -1, true, EINVAL, 0x0D00}, {tooLong.c_str(), 1, true, ENAMETOOLONG, 0xC300},
+        {"/volume1/missing", 1, true, ENOENT, 0x0600}, {"/volume1/file/below", 9, true, ENOTDIR, 0x0700},
     };
     for (const auto &c : cases) {
         QUIBSTAT st;
@@ -106,10 +102,7 @@ TEST(ParseToArray, SplitsAtEveryComma) {
         const char *value;
         std::vector<std::string> pieces;
     } cases[] = {
-        {"a,b", {"a", "b"}},
-        {"", {""}},
-        {",a,,b,", {"", "a", "", "b", ""}},
-        {" a , b", {" a ", " b"}},
+        {"a,b", {"a", "b"}}, {"", {""}}, {",a,,b,", {"", "a", "", "b", ""}}, {" a , b", {" a ", " b"}},
         {"\"x,y\"", {"\"x", "y\""}},  // quotes do not group
         {"\xff,\xc3", {"\xff", "\xc3"}},
     };

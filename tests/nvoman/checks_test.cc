@@ -40,7 +40,7 @@ TEST(ReservedNames, Table) {
     EXPECT_EQ(NvoLibGetErr(), 400);
 }
 
-TEST(FileNames, FatCharactersOnlyOnFat) {
+TEST(FileNames, FatCharactersOnlyOnFatAndBadArguments) {
     Appliance app;
     app.MountFat("/volumeUSB1");
     const char *fatNames[] = {"a\\b", "a*b", "a?b", "a\"b", "a>b", "a<b", "a|b", "a\rb", "a\nb"};
@@ -54,10 +54,6 @@ TEST(FileNames, FatCharactersOnlyOnFat) {
     EXPECT_EQ(NvoCheckFileName("/volumeUSB1", "a:b"), -1);
     EXPECT_EQ(NvoLibGetErr(), 418);
     EXPECT_TRUE(app.ErrorLines().empty());
-}
-
-TEST(FileNames, BadArgumentsAndUnreadableDirectories) {
-    Appliance app;
     EXPECT_EQ(NvoCheckFileName(nullptr, "a"), -1);
     EXPECT_EQ(NvoLibGetErr(), 400);
     EXPECT_EQ(NvoCheckFileName("/volume1", ""), -1);
@@ -68,7 +64,7 @@ TEST(FileNames, BadArgumentsAndUnreadableDirectories) {
               (Lines{"nvoman.cpp:# Failed to statfs /volume1/missing, reason=No such file or directory"}));
 }
 
-TEST(CheckPath, FindsTheExistingPartOfAPath) {
+TEST(CheckPath, ExistingPartReservedComponentsAndDeadMounts) {
     Appliance app;
     app.Basic();
     std::string existing;
@@ -80,11 +76,6 @@ TEST(CheckPath, FindsTheExistingPartOfAPath) {
     EXPECT_EQ(NvoCheckPath("/volume1/photo/new", false, 32, nullptr), -1);
     EXPECT_EQ(NvoLibGetErr(), 408);
     EXPECT_EQ(VLIBCErrGet(), 0x600);
-}
-
-TEST(CheckPath, RefusesReservedComponentsEvenMissingOnes) {
-    Appliance app;
-    app.Basic();
     EXPECT_EQ(NvoCheckPath("/volume1/photo/new/._x/y", true, 32, nullptr), -1);
     EXPECT_EQ(NvoLibGetErr(), 418);
     EXPECT_EQ(NvoCheckPath("/volume1/photo/@eaDir", true, 32, nullptr), -1);
@@ -137,11 +128,6 @@ TEST(CheckPath, AccessIsJudgedForTheCaller) {
         return NvoCheckPath("/volume1/photo/mine/x", false, 32, nullptr) == -1 ? NvoLibGetErr() - 400 : 0;
     }), 7);
     EXPECT_EQ(app.ErrorLines(), (Lines{"nvoman.cpp:# Can't access /volume1/photo/open, errno=197 "}));
-}
-
-TEST(CheckPath, ADeadRemoteMountIsARemoteFailure) {
-    Appliance app;
-    app.Basic();
     app.MountDeadRemote("/volume1/photo/nas2");
     EXPECT_EQ(NvoCheckPath("/volume1/photo/nas2/docs", false, 32, nullptr), -1);
     EXPECT_EQ(NvoLibGetErr(), 410);
@@ -153,7 +139,7 @@ TEST(CheckPath, ADeadRemoteMountIsARemoteFailure) {
     EXPECT_EQ(NvoLibGetErr(), 408);
 }
 
-TEST(TmpDir, CreatesBothLevelsOpenToAll) {
+TEST(TmpDir, CreatesBothLevelsOpenToAllAndLeavesWhatStandsThere) {
     Appliance app;
     ASSERT_EQ(NvoCreateTmpDir("/volume1"), 0);
     struct stat st;
@@ -163,17 +149,14 @@ TEST(TmpDir, CreatesBothLevelsOpenToAll) {
     EXPECT_EQ(st.st_mode & 07777, 0777u);
     EXPECT_EQ(umask(022), 0u);  // left open for every user's search
     EXPECT_EQ(NvoCreateTmpDir("/volume1"), 0);  // again: nothing to do
-}
-
-TEST(TmpDir, LeavesWhatStandsThereAndFailsBelowAFile) {
-    Appliance app;
     app.WriteFile("/volume2/@tmp", "a file");
     EXPECT_EQ(NvoCreateTmpDir("/volume2"), -1);
     EXPECT_EQ(NvoCreateTmpDir(nullptr), -1);
     EXPECT_EQ(NvoCreateTmpDir(""), -1);
+    ASSERT_EQ(rmdir("/volume1/@tmp/norvo"), 0);
+    ASSERT_EQ(rmdir("/volume1/@tmp"), 0);
     symlink("/nowhere", "/volume1/@tmp");
     EXPECT_EQ(NvoCreateTmpDir("/volume1"), 0);  // a dangling link is replaced
-    struct stat st;
     EXPECT_EQ(lstat("/volume1/@tmp", &st), 0);
     EXPECT_TRUE(S_ISDIR(st.st_mode));
     EXPECT_EQ(app.ErrorLines(),
@@ -181,9 +164,6 @@ TEST(TmpDir, LeavesWhatStandsThereAndFailsBelowAFile) {
                      "nvoman.cpp(#) Bad Parameter", "nvoman.cpp(#) Bad Parameter"}));
 }
 
-}  // namespace
-
-namespace {
 
 TEST(Authorized, NeedsALiveLoginAndTheApplicationPrivilege) {
     Appliance app;

@@ -76,10 +76,6 @@ TEST_F(AccountDB, BadArgumentsAndBrokenDatabases) {
     const AUTH_TYPE none = static_cast<AUTH_TYPE>(0);
     EXPECT_EQ(OutcomeOf([&] { return QUIBUserDBGetByCursor(db, &user, none, 1); }), bad);
     EXPECT_EQ(OutcomeOf([&] { return QUIBGroupDBGetByCursor(gdb, &group, none, 1); }), bad);
-    EXPECT_EQ(OutcomeOf([&] { return QUIBUserDBGetByCursor(nullptr, &user, AUTH_ALL, 1); }), bad);
-    EXPECT_EQ(OutcomeOf([&] { return QUIBUserDBGetByCursor(db, nullptr, AUTH_ALL, 1); }), bad);
-    EXPECT_EQ(OutcomeOf([&] { return QUIBGroupDBGetByCursor(nullptr, &group, AUTH_ALL, 1); }), bad);
-    EXPECT_EQ(OutcomeOf([&] { return QUIBGroupDBGetByCursor(gdb, nullptr, AUTH_ALL, 1); }), bad);
     QUIBUserDBClose(db);
     QUIBGroupDBClose(gdb);
     QUIBUserDBClose(nullptr);

@@ -7,8 +7,9 @@
 #include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
-#include <sys/ioctl.h>
 #include <grp.h>
+#include <sys/acl.h>
+#include <sys/ioctl.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -35,8 +36,32 @@ constexpr long kW = ACL_PERM_WRITE | ACL_PERM_APPEND | ACL_PERM_WRITE_XATTR, kRW
 constexpr long kOwn = ACL_PERM_WRITE_ATTR | ACL_PERM_WRITE_ACL | ACL_PERM_CHANGE_OWNER;
 constexpr long kX = ACL_PERM_EXECUTE, kDel = ACL_PERM_DELETE, kDC = ACL_PERM_DELETE_CHILD, kAll = ACL_PERM_ALL;
 
+// As "setfacl -m entries path": each entry replaces the one of its tag and qualifier or is
+// added, and the mask is recomputed unless given.
 bool SetAcl(const std::string &path, const std::string &entries) {
-    return system(("setfacl -m '" + entries + "' '" + path + "'").c_str()) == 0;
+    acl_t acl = acl_get_file(path.c_str(), ACL_TYPE_ACCESS);
+    acl_t add = acl_from_text(entries.c_str());
+    bool ok = acl != nullptr && add != nullptr, maskGiven = false;
+    acl_entry_t from, to;
+    for (int i = ACL_FIRST_ENTRY; ok && acl_get_entry(add, i, &from) == 1; i = ACL_NEXT_ENTRY) {
+        acl_tag_t tag, otherTag;
+        acl_get_tag_type(from, &tag);
+        maskGiven |= tag == ACL_MASK;
+        void *id = acl_get_qualifier(from);
+        bool found = false;
+        for (int j = ACL_FIRST_ENTRY; !found && acl_get_entry(acl, j, &to) == 1; j = ACL_NEXT_ENTRY) {
+            void *otherId = acl_get_qualifier(to);
+            acl_get_tag_type(to, &otherTag);
+            found = otherTag == tag && (id == nullptr || *static_cast<id_t *>(id) == *static_cast<id_t *>(otherId));
+            acl_free(otherId);
+        }
+        acl_free(id);
+        ok = (found || acl_create_entry(&acl, &to) == 0) && acl_copy_entry(to, from) == 0;
+    }
+    ok = ok && (maskGiven || acl_calc_mask(&acl) == 0) && acl_set_file(path.c_str(), ACL_TYPE_ACCESS, acl) == 0;
+    acl_free(acl);
+    acl_free(add);
+    return ok;
 }
 
 // The mask user holds on path, or minus the error slot when the call failed and left the mask
@@ -63,24 +88,16 @@ protected:
     Appliance appliance_;
 };
 
+// What the generated trees below can't show: mount roots, read-only and foreign file systems,
+// links, the errors, and an ACL where two groups each grant half of what deleting a child takes.
 TEST_F(AclPerm, EachUserHoldsWhatTheKernelGrants) {
     struct Made { const char *path, *owner; mode_t mode; bool dir; const char *acl = ""; } made[] = {
         {"/volume1/s", "root", 0777, true}, {"/volume1/s/own", "alice", 0600, false},
-        {"/volume1/s/group", "root:staff", 0640, false}, {"/volume1/s/tool", "root", 0755, false},
-        {"/volume1/s/dir", "alice", 0755, true}, {"/volume1/s/nothing", "bob", 0000, false},
-        {"/volume1/s/emptydir", "bob", 0000, true}, {"/volume1/s/shared", "root", 0600, false, "u:alice:rw-"},
-        {"/volume1/s/masked", "root", 0600, false, "u:alice:rwx,m::r--"},
-        {"/volume1/s/denied", "root", 0666, false, "u:alice:---"},
-        {"/volume1/s/team", "root", 0700, true, "g:staff:r-x"},
-        // alice is in both groups; each grants half of what removing an entry takes.
-        {"/volume1/s/split", "root", 0700, true, "g:staff:-w-,g:users:--x"},
-        {"/volume1/s/split/f", "root", 0666, false},
-        {"/volume1/drop", "root", 01777, true}, {"/volume1/drop/bobs", "bob", 0666, false},
-        {"/volume1/drop/alices", "alice", 0600, false}, {"/volume1/alicedrop", "alice", 01777, true},
-        {"/volume1/alicedrop/bobs", "bob", 0600, false}, {"/volume1/locked", "alice", 0555, true},
-        {"/volume1/locked/mine", "alice", 0600, false}, {"/volume1/private", "root", 0700, true},
-        {"/volume1/private/inside", "root", 0644, false}, {"/volume2/file", "alice", 0666, false},
-        {"/volume2/dir", "alice", 0777, true},
+        {"/volume1/s/dir", "alice", 0755, true},
+        {"/volume1/s/split", "root", 0700, true, "g:staff:-w-,g:users:--x"}, {"/volume1/s/split/f", "root", 0666, false},
+        {"/volume1/locked", "alice", 0555, true}, {"/volume1/locked/mine", "alice", 0600, false},
+        {"/volume1/private", "root", 0700, true}, {"/volume1/private/inside", "root", 0644, false},
+        {"/volume2/file", "alice", 0666, false}, {"/volume2/dir", "alice", 0777, true},
     };
     for (const Made &m : made) {
         m.dir ? appliance_.MakeDir(m.path, m.owner, m.mode) : appliance_.WriteFile(m.path, "x", m.owner, m.mode);
@@ -93,25 +110,14 @@ TEST_F(AclPerm, EachUserHoldsWhatTheKernelGrants) {
     const std::string overlong = "/volume1/" + std::string(PATH_MAX, 'a');
 
     struct Case { const char *user, *path; long mask; } cases[] = {  // the mask, or minus the error slot
-        {"alice", "/volume1/s/own", kRW | kOwn | kDel}, {"alice", "/volume1/s/group", kR | kDel},
-        {"alice", "/volume1/s/tool", kR | kX | kDel}, {"alice", "/volume1/s/dir", kRW | kX | kDC | kOwn | kDel},
-        {"root", "/volume1/s/nothing", kAll & ~(kX | kDC)}, {"root", "/volume1/s/emptydir", kAll},
         {"root", "/volume1", kAll & ~kDel},  // a mount root can't be removed, not even by root
-        {"alice", "/volume1/s/shared", kRW | kDel}, {"bob", "/volume1/s/shared", kNone | kDel},
-        {"alice", "/volume1/s/masked", kR | kDel}, {"bob", "/volume1/s/team", kR | kX | kDel},
-        {"admin", "/volume1/s/team", kNone | kDel}, {"alice", "/volume1/s/denied", kNone | kDel},
-        {"bob", "/volume1/s/denied", kRW | kDel}, {"alice", "/volume1/s/split", kNone | kW | kX | kDel},
-        {"alice", "/volume1/s/split/f", kRW},
-        // The sticky bit: only the file's owner, the directory's owner and root may delete.
-        {"alice", "/volume1/drop/bobs", kRW}, {"alice", "/volume1/drop/alices", kRW | kOwn | kDel},
-        {"alice", "/volume1/alicedrop/bobs", kNone | kDel},
-        {"root", "/volume1/alicedrop/bobs", kAll & ~(kX | kDC)},
+        {"alice", "/volume1/s/split", kNone | kW | kX | kDel}, {"alice", "/volume1/s/split/f", kRW},
         // The parent decides deletion, and "." can't be removed.
         {"alice", "/volume1/locked/mine", kRW | kOwn}, {"alice", "/volume1/s/dir/.", kRW | kX | kDC | kOwn},
         // A read-only volume is no error: the mask just lacks every writing bit.
         {"root", "/volume2/file", kR}, {"alice", "/volume2/file", kR}, {"root", "/volume2/dir", kR | kX},
-        // A link is judged itself, never followed (here not into the FAT).
-        {"root", "/volume1/s/tousb", kAll & ~kDC}, {"root", "/volume1/s/dangling", kAll & ~kDC},
+        // A link is judged itself, never followed (here not into the FAT): nothing but its name.
+        {"root", "/volume1/s/tousb", kNone | kDel}, {"alice", "/volume1/s/dangling", kNone | kDel},
         {"alice", "/volume1/s/missing", -QUIB_ERR_NO_SUCH_FILE}, {"alice", "/volume1/s/own/x", -QUIB_ERR_NO_SUCH_PATH},
         {"alice", "/volume1/locked/mine/", -QUIB_ERR_NO_SUCH_PATH},
         {"alice", "/volume1/private/inside", -QUIB_ERR_ACCESS_DENIED},
@@ -236,12 +242,6 @@ std::vector<std::string> MakeTree(Appliance &appliance, const std::string &root,
     return entries;
 }
 
-TEST_F(AclPerm, AgreesWithTheKernelOnGeneratedTrees) {
-    const std::vector<std::string> entries = MakeTree(appliance_, "/volume1/gen", 20240611);
-    ASSERT_FALSE(entries.empty());
-    EXPECT_EQ(appliance_.RunAs("alice", [&] { return CountDisagreements(entries); }), 0);
-}
-
 // Every account of the appliance, root among them (its capabilities: execute only with some x
 // bit, deletion past the sticky bit), each on its own copy of several generated trees.
 TEST_F(AclPerm, AgreesWithTheKernelForEveryUser) {
@@ -314,40 +314,6 @@ TEST_F(AclPerm, APassAnswersAsTheCallsDoAlone) {
             }
             EXPECT_EQ(appliance_.RunAs(user, [&] { return CountPassDifferences(entries); }), 0) << user << " " << seed;
         }
-    }
-}
-
-TEST_F(AclPerm, NamedEntriesMasksAndRoot) {
-    struct Made { const char *path, *owner; mode_t mode; bool dir; const char *acl; } made[] = {
-        {"/volume1/n", "root", 0777, true, ""},
-        {"/volume1/n/named", "root:administrators", 0640, false, "u:bob:rwx,g:users:r--"},  // mask rwx
-        {"/volume1/n/maskw", "root", 0600, false, "u:bob:rwx,m::-w-"},
-        {"/volume1/n/nomask", "root", 0600, false, "u:alice:rwx,m::---"},  // group bits 0: no ACL check
-        {"/volume1/n/groupobj", "root:staff", 0600, false, "g::rw-,g:users:--x,m::rwx"},
-        {"/volume1/n/noexec", "alice", 0666, false, ""},
-        {"/volume1/n/someexec", "alice", 0601, false, ""},
-        {"/volume1/n/aclexec", "alice", 0600, false, "u:bob:--x"},  // the mask gives a group x bit
-        {"/volume1/n/ownerdenied", "alice", 0077, false, ""},  // the owner class decides alone
-    };
-    for (const Made &m : made) {
-        m.dir ? appliance_.MakeDir(m.path, m.owner, m.mode) : appliance_.WriteFile(m.path, "x", m.owner, m.mode);
-        ASSERT_TRUE(*m.acl == '\0' || SetAcl(m.path, m.acl)) << m.path;
-    }
-    struct Case { const char *user, *path; long mask; } cases[] = {
-        {"bob", "/volume1/n/named", kRW | kX | kDel}, {"alice", "/volume1/n/named", kR | kDel},
-        {"admin", "/volume1/n/named", kR | kDel},  // the owning group (administrators)
-        {"bob", "/volume1/n/maskw", kNone | kW | kDel}, {"alice", "/volume1/n/maskw", kNone | kDel},
-        {"alice", "/volume1/n/nomask", kNone | kDel},
-        // alice: the owning group staff (rw) and the named group users (x): no single entry
-        // holds rwx, but each bit alone is granted by one of them.
-        {"alice", "/volume1/n/groupobj", kRW | kX | kDel}, {"bob", "/volume1/n/groupobj", kRW | kX | kDel},
-        {"admin", "/volume1/n/groupobj", kNone | kX | kDel},  // users, its primary group
-        {"root", "/volume1/n/noexec", kAll & ~(kX | kDC)}, {"root", "/volume1/n/someexec", kAll & ~kDC},
-        {"root", "/volume1/n/aclexec", kAll & ~kDC}, {"bob", "/volume1/n/aclexec", kNone | kX | kDel},
-        {"alice", "/volume1/n/ownerdenied", kNone | kOwn | kDel}, {"bob", "/volume1/n/ownerdenied", kRW | kX | kDel},
-    };
-    for (const Case &c : cases) {
-        EXPECT_EQ(MaskAs(appliance_, c.user, c.path), c.mask) << c.user << " " << c.path;
     }
 }
 

@@ -73,6 +73,31 @@ TEST_F(AppPrivilege, OnlyTheNamedPrivilegeCounts) {
     EXPECT_EQ(VLIBUserPrivilegeHas("admin", kPriv), 1);
 }
 
+// A damaged line (a control byte, invalid UTF-8, an unbalanced quote) could have lost a denial:
+// it grants nobody. Each row was a way in for carol, whom the intact line denies.
+TEST_F(AppPrivilege, ADamagedLineGrantsNobody) {
+    app_.AddUser("carol");
+    const std::string p = std::string(kPriv) + "=";
+    const struct { std::string line; int alice; } rows[] = {
+        {p + "\"@users,!carol\" # intact, with a note", 1},
+        {p + "\"@users,!carol" + std::string(1, '\0') + "\"", 0},
+        {p + "\"@users,!carol", 0},
+        {p + "@users,\"!carol", 0},
+        {p + "\"@users,\\\"!carol\"", 0},
+        {p + "\"@users,\"!carol\"", 0},
+        {p + "\"@users,!ca\x1brol\"", 0},
+        {p + "\"@users,!carol\rx\"", 0},
+        {p + "\"@users,!car\xffol\"", 0},
+        {p + "'@users,!carol", 0},
+    };
+    for (const auto &row : rows) {
+        app_.WriteFile(QUIB_APP_PRIVILEGE_CONF, "# privileges\n" + row.line + "\n");
+        EXPECT_EQ(VLIBUserPrivilegeHas("carol", kPriv), 0) << row.line;
+        EXPECT_EQ(VLIBUserPrivilegeHas("alice", kPriv), row.alice) << row.line;
+        EXPECT_EQ(VLIBUserPrivilegeHas("admin", kPriv), 1) << row.line;
+    }
+}
+
 // A holder that can't be checked might have been a denial: the privilege is refused.
 TEST_F(AppPrivilege, UncheckableDenialRefuses) {
     app_.SetAppPrivilege(kPriv, "alice,!@interns").SetAppPrivilege(kOther, "alice");

@@ -2,6 +2,7 @@
 // answers, and its life (nesting, ending out of order, bad arguments). That its answers equal
 // the calls' own is proven with the ACL masks' generated trees.
 #include <errno.h>
+#include <fcntl.h>
 #include <stdio.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -75,15 +76,20 @@ TEST_F(DirPass, OnlyTheDirectoryEntriesAnswerFromThePass) {
 }
 
 // The directory as it was opened: renamed and replaced meanwhile, its entries are still read in
-// the one the pass began on.
+// the one the pass began on, also when the caller opened it and has closed its descriptor since.
 TEST_F(DirPass, NamesResolveInTheDirectoryThePassOpened) {
-    QUIBDirPass *pass = QUIBDirPassBegin("/volume1/p");
-    ASSERT_NE(pass, nullptr);
-    ASSERT_EQ(rename("/volume1/p", "/volume1/old"), 0);
-    app_.MakeDir("/volume1/p", "root", 0777).WriteFile("/volume1/p/f", "new", "bob", 0666);
-    EXPECT_EQ(ModeOf("/volume1/p/f"), 0640u);
-    QUIBDirPassEnd(pass);
-    EXPECT_EQ(ModeOf("/volume1/p/f"), 0666u);
+    for (const bool given : {false, true}) {
+        ASSERT_EQ(chmod("/volume1/p/f", 0640), 0);
+        const int fd = given ? open("/volume1/p", O_PATH | O_DIRECTORY | O_CLOEXEC) : -1;
+        QUIBDirPass *pass = given ? QUIBDirPassBeginAt(fd, "/volume1/p") : QUIBDirPassBegin("/volume1/p");
+        ASSERT_NE(pass, nullptr);
+        close(fd);
+        ASSERT_EQ(rename("/volume1/p", given ? "/volume1/old2" : "/volume1/old"), 0);
+        app_.MakeDir("/volume1/p", "root", 0777).WriteFile("/volume1/p/f", "new", "bob", 0666);
+        EXPECT_EQ(ModeOf("/volume1/p/f"), 0640u);
+        QUIBDirPassEnd(pass);
+        EXPECT_EQ(ModeOf("/volume1/p/f"), 0666u);
+    }
 }
 
 // The identity of the pass's first permission question holds for the whole pass.
@@ -142,6 +148,18 @@ TEST_F(DirPass, BadDirectoriesGetNoPassAndLeakNothing) {
         EXPECT_EQ(OutcomeOf([&] { return QUIBDirPassBegin(c.path) == nullptr ? -1 : 0; }), Failed(c.slot, c.err))
             << (c.path ? c.path : "(null)");
     }
+    const int file = ::open("/volume1/p/f", O_RDONLY | O_CLOEXEC);
+    const struct {
+        int fd;
+        const char *path;
+        int slot, err;
+    } given[] = {{file, "/volume1/p/f", QUIB_ERR_NO_SUCH_PATH, ENOTDIR}, {-1, "/volume1/p", QUIB_ERR_FAILED, EBADF},
+                 {999, "/volume1/p", QUIB_ERR_FAILED, EBADF}, {file, "", QUIB_ERR_BAD_PARAMETER, EINVAL}};
+    for (const auto &c : given) {
+        const auto begin = [&] { return QUIBDirPassBeginAt(c.fd, c.path) == nullptr ? -1 : 0; };
+        EXPECT_EQ(OutcomeOf(begin), Failed(c.slot, c.err)) << c.fd << " " << c.path;
+    }
+    close(file);
     app_.MakeDir("/volume1/closed", "root", 0700).MakeDir("/volume1/closed/in", "root", 0777);
     EXPECT_EQ(app_.RunAs("alice", [] {
         return QUIBDirPassBegin("/volume1/closed/in") == nullptr && VLIBCErrGet() == QUIB_ERR_ACCESS_DENIED ? 0 : 1;

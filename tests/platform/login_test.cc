@@ -8,6 +8,9 @@
 #include <time.h>
 #include <unistd.h>
 
+#include <fcntl.h>
+
+#include <functional>
 #include <string>
 #include <utility>
 
@@ -70,7 +73,6 @@ TEST_F(Login, ACorrectPasswordGivesASidThatNamesTheUser) {
     struct stat info {};
     ASSERT_EQ(stat(QUIB_LOGIN_DB, &info), 0);
     EXPECT_EQ(info.st_mode & 07777, 0600u) << "born private whatever the umask";
-    EXPECT_EQ(info.st_uid, 0u);
     const std::string again = LogIn("alice");
     EXPECT_NE(again, sid);
     // Domain and directory accounts log in by their full names.
@@ -135,22 +137,54 @@ TEST_F(Login, WrongPasswordsClosedAccountsAndHostileArgumentsAreRefused) {
     EXPECT_STREQ(user_, "alice");
 }
 
-// The database lives at a well-known name in /tmp: a link or someone else's file there is
-// never used, and a lookup never creates it.
-TEST_F(Login, OnlyItsOwnDatabaseIsUsed) {
-    EXPECT_EQ(Get(kUnknownSid), Failed(QUIB_ERR_ACCESS_DENIED));
+// The records live in root's own directory: SQLite rolls in whatever journal it finds beside
+// a database, so anything there that root did not make, or a link, is refused, never used.
+TEST_F(Login, OnlyRootsOwnDirectoryAndFilesAreUsed) {
+    EXPECT_EQ(Get(kUnknownSid), Failed(QUIB_ERR_ACCESS_DENIED)) << "a lookup creates nothing";
     EXPECT_EQ(Remove(kUnknownSid), Failed(QUIB_ERR_ACCESS_DENIED));
-    EXPECT_EQ(access(QUIB_LOGIN_DB, F_OK), -1);
-    ASSERT_EQ(symlink("/tmp/elsewhere.db", QUIB_LOGIN_DB), 0);
-    EXPECT_EQ(Create("alice").rc, -1);
-    EXPECT_NE(VLIBCErrGet(), 0);
-    EXPECT_EQ(access("/tmp/elsewhere.db", F_OK), -1);
-    ASSERT_EQ(unlink(QUIB_LOGIN_DB), 0);
-    appliance_.WriteFile(QUIB_LOGIN_DB, "", "bob", 0666);
-    EXPECT_EQ(Create("alice"), Failed(QUIB_ERR_ACCESS_DENIED));
-    EXPECT_EQ(Get(kUnknownSid), Failed(QUIB_ERR_ACCESS_DENIED));
-    appliance_.WriteFile(QUIB_LOGIN_DB, "this is not a database", "root", 0600);
-    EXPECT_EQ(Create("alice"), Failed(QUIB_ERR_FAILED));
+    EXPECT_EQ(access(QUIB_LOGIN_DIR, F_OK), -1);
+    // The old place in /tmp, taken by bob: a journal of his pages and a link at the name.
+    ASSERT_EQ(appliance_.RunAs("bob", [] {
+        return symlink("/tmp/bobs.db", "/tmp/quib_login.db") == 0 &&
+               creat("/tmp/quib_login.db-journal", 0666) >= 0 ? 0 : 1;
+    }), 0);
+    const std::string sid = LogIn("alice");
+    EXPECT_EQ(UserOf(sid), "alice");
+    EXPECT_EQ(access("/tmp/bobs.db", F_OK), -1);
+    struct stat info {};
+    ASSERT_EQ(stat(QUIB_LOGIN_DIR, &info), 0);
+    EXPECT_EQ(info.st_mode & 07777, 0700u);
+    EXPECT_EQ(info.st_uid, 0u);
+    EXPECT_EQ(appliance_.RunAs("bob", [] { return creat(QUIB_LOGIN_DB "-journal", 0666) < 0 ? errno : 0; }),
+              EACCES);
+    EXPECT_EQ(appliance_.RunAs("alice", [&] { return QUIBLoginGet(sid.c_str(), user_, 64) == -1 ? VLIBCErrGet() >> 8 : 0; }),
+              QUIB_ERR_ACCESS_DENIED >> 8) << "only root reads the records";
+
+    // What root finds planted in its own place (as if by another user) is an error, not a login.
+    const auto chownToBob = [&](const char *path) { return lchown(path, appliance_.Uid("bob"), 0); };
+    const struct Case { const char *what; std::function<int()> plant; int slot; } cases[] = {
+        {"dir is a link", [] { return mkdir("/tmp/d", 0700) | symlink("/tmp/d", QUIB_LOGIN_DIR); }, QUIB_ERR_ACCESS_DENIED},
+        {"dir writable by others", [] { return mkdir(QUIB_LOGIN_DIR, 0700) | chmod(QUIB_LOGIN_DIR, 0733); }, QUIB_ERR_ACCESS_DENIED},
+        {"dir of bob's", [&] { return mkdir(QUIB_LOGIN_DIR, 0700) | chownToBob(QUIB_LOGIN_DIR); }, QUIB_ERR_ACCESS_DENIED},
+        {"dir is a file", [] { return creat(QUIB_LOGIN_DIR, 0600) < 0; }, QUIB_ERR_ACCESS_DENIED},
+        {"db is a link", [] { return mkdir(QUIB_LOGIN_DIR, 0700) | symlink("/tmp/x.db", QUIB_LOGIN_DB); }, QUIB_ERR_ACCESS_DENIED},
+        {"db is a dir", [] { return mkdir(QUIB_LOGIN_DIR, 0700) | mkdir(QUIB_LOGIN_DB, 0700); }, QUIB_ERR_ACCESS_DENIED},
+        {"db of bob's", [&] { return mkdir(QUIB_LOGIN_DIR, 0700) | (creat(QUIB_LOGIN_DB, 0600) < 0) | chownToBob(QUIB_LOGIN_DB); }, QUIB_ERR_ACCESS_DENIED},
+        {"db readable by others", [] { return mkdir(QUIB_LOGIN_DIR, 0700) | (creat(QUIB_LOGIN_DB, 0644) < 0); }, QUIB_ERR_ACCESS_DENIED},
+        {"journal of bob's", [&] { return mkdir(QUIB_LOGIN_DIR, 0700) | (creat(QUIB_LOGIN_DB "-journal", 0600) < 0) | chownToBob(QUIB_LOGIN_DB "-journal"); }, QUIB_ERR_ACCESS_DENIED},
+        {"journal is a link", [] { return mkdir(QUIB_LOGIN_DIR, 0700) | symlink("/tmp/j", QUIB_LOGIN_DB "-journal"); }, QUIB_ERR_ACCESS_DENIED},
+        {"wal of bob's", [&] { return mkdir(QUIB_LOGIN_DIR, 0700) | (creat(QUIB_LOGIN_DB "-wal", 0600) < 0) | chownToBob(QUIB_LOGIN_DB "-wal"); }, QUIB_ERR_ACCESS_DENIED},
+        {"db not a database", [] { return mkdir(QUIB_LOGIN_DIR, 0700) | (system("echo junk > " QUIB_LOGIN_DB "; chmod 600 " QUIB_LOGIN_DB) != 0); }, QUIB_ERR_FAILED},
+    };
+    for (const Case &c : cases) {
+        ASSERT_EQ(system("rm -rf " QUIB_LOGIN_DIR " /tmp/d /tmp/x.db /tmp/j"), 0);
+        ASSERT_EQ(c.plant(), 0) << c.what;
+        const int before = OpenDescriptors();
+        EXPECT_EQ(Create("alice"), Failed(c.slot)) << c.what;
+        EXPECT_EQ(Get(sid.c_str()), Failed(c.slot)) << c.what;
+        EXPECT_EQ(OpenDescriptors(), before) << c.what;
+        EXPECT_EQ(access("/tmp/d/" QUIB_LOGIN_DB_NAME, F_OK) | access("/tmp/x.db", F_OK) | access("/tmp/j", F_OK), -1) << c.what;
+    }
 }
 
 // What was stored, read and aged through the sqlite3 shell.

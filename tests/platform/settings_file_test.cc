@@ -241,23 +241,6 @@ TEST_F(SettingsFile, WriterFailuresAreTranslatedAndLeaveNoTrace) {
     EXPECT_EQ(DirEntries("/tmp/conf/closed"), (Strings{"a.conf"}));
 }
 
-TEST_F(SettingsFile, NoDescriptorLeaksOnAnyPath) {
-    Put("key=\"v\"\n");
-    int before = norvo::testing::OpenDescriptors();
-    char buf[8];
-    for (int i = 0; i < 50; ++i) {
-        for (const char *file : {kFile, kNone, kDir, "/tmp/conf/missing/x"}) {
-            (void)VLIBCFileGetKeyValue(file, i % 2 ? "key" : "absent", buf, sizeof buf, 0);
-            (void)VLIBCFileSetKeyValue(file == kNone ? kFile : file, "key", i % 2 ? "a" : "b", 0);
-            (void)VLIBCFileRemoveKey(file, "absent");
-            (void)VLIBCFileCheckKeyValue(file, "key", "a", 0);
-            (void)KeysOf(file);
-        }
-    }
-    EXPECT_EQ(norvo::testing::OpenDescriptors(), before);
-    EXPECT_EQ(DirEntries(kDir), (Strings{"test.conf"}));
-}
-
 // Runs body(index) in count children, calling between() until every child has exited; true
 // when each returned 0. Children still running after 30 s (the whole normally takes well under
 // a second) are stopped with SIGSEGV first, so that a sanitized build prints where each was
@@ -351,6 +334,31 @@ TEST_F(SettingsFile, ConcurrentWritersLoseNoUpdate) {
     }
     EXPECT_EQ(ReadText(kFile).rfind("# shared by four writers\n", 0), 0u);
     EXPECT_EQ(DirEntries(kDir), (Strings{"test.conf"}));
+}
+
+// A writer killed between making its temporary and renaming it leaves the temporary behind;
+// the next writer of the same file removes it, and nothing that is not one.
+TEST_F(SettingsFile, TheNextWriterRemovesTemporariesOfKilledWriters) {
+    Put("key=\"v\"\n");
+    for (int round = 0; round < 100; ++round) {
+        const pid_t pid = fork();
+        if (pid == 0) {
+            for (int i = 0;; ++i) (void)VLIBCFileSetKeyValue(kFile, "key", i % 2 ? "a" : "b", 0);
+        }
+        usleep(static_cast<useconds_t>(round * 397 % 3000));
+        kill(pid, SIGKILL);
+        waitpid(pid, nullptr, 0);
+    }
+    const Strings kept = {".other.conf.AbC123", ".test.conf.AbC12", ".test.conf.AbC12-", ".test.conf.AbC1234",
+                          ".test.conf.Link00", "test.conf", "test.conf.AbC123"};
+    for (const std::string &name : kept) {
+        if (name != "test.conf" && name != ".test.conf.Link00") app_.WriteFile(std::string(kDir) + "/" + name, "");
+    }
+    ASSERT_EQ(symlink("test.conf", "/tmp/conf/.test.conf.Link00"), 0);
+    app_.WriteFile("/tmp/conf/.test.conf.Left01", "planted");
+    ASSERT_EQ(VLIBCFileSetKeyValue(kFile, "key", "final", 0), 0);
+    EXPECT_EQ(DirEntries(kDir), kept);
+    EXPECT_EQ(Get(kFile, "key"), "final");
 }
 
 }  // namespace

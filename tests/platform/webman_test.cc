@@ -61,16 +61,14 @@ TEST_F(WebManTest, TheSidComesFromTheIdCookieOrElseTheSidParameter) {
         {"xid=" + alice, "", ""}, {"id2=" + alice, "", ""}, {"ID=" + alice, "", ""}, {"_sid=" + alice, "", ""},
         {"i d=" + alice, "", ""}, {"id", "", ""}, {"id=", "", ""}, {"=" + alice, "", ""}, {"id=\"" + alice, "", ""},
         {"id=" + alice + "x", "", ""}, {"id=" + alice.substr(1), "", ""}, {";;;;", "", ""}, {"", "", ""},
-        {"id=" + huge, "", ""}, {"id=' OR '1'='1", "", ""}, {"id=" + alice + "' OR '1'='1", "", ""},
-        {"id=\xff\xfe\xfd", "", ""}, {"id=\x01" + alice, "", ""}, {std::string(20000, ';'), "", ""},
-        {"id=\"\"", "", ""}, {"id=\"", "", ""},
+        {"id=" + huge, "", ""}, {"id=" + alice + "' OR '1'='1", "", ""}, {"id=\x01" + alice, "", ""},
         {"", "_sid=" + bob, bob}, {"", "api=x&_sid=" + bob + "&version=1", bob}, {"", "%5Fsid=" + bob, bob},
         {"", "%5fsid=" + bob, bob}, {"", "_sid=" + EncodeAll(bob), bob}, {"", "&&_sid=" + bob + "&&", bob},
         {"", "_sid=%zz&_sid=" + bob, bob},  // a broken escape skips that parameter only
         {"", "_sid=" + bob + "%00", ""},    // so does an escaped NUL, which would cut the sid short
         {"", "sid=" + bob, ""}, {"", "_sid", ""}, {"", "_sid=", ""}, {"", "x_sid=" + bob, ""},
         {"", "_sid=" + bob + "+", ""}, {"", "_sid=%" + bob, ""}, {"", "_sid=" + bob.substr(0, 31) + "%2", ""},
-        {"", "_sid+=" + bob, ""}, {"", "_sid=" + huge, ""}, {"", std::string(50000, '&'), ""}, {"", "_sid=%FF%FE", ""},
+        {"", "_sid+=" + bob, ""}, {"", "_sid=" + huge, ""},
         // A browser may still send a stale cookie while the page passes a live sid.
         {"id=" + stale, "_sid=" + bob, bob}, {"id=garbage'--", "_sid=" + bob, bob}, {"id=" + bob, "_sid=" + stale, bob},
     };

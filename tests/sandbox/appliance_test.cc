@@ -8,22 +8,26 @@
 #include <pwd.h>
 #include <shadow.h>
 #include <signal.h>
+#include <sys/mount.h>
 #include <sys/stat.h>
-#include <sys/statvfs.h>
 #include <sys/wait.h>
 #include <syslog.h>
 #include <unistd.h>
 
 #include <algorithm>
+#include <chrono>
 #include <fstream>
 #include <sstream>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include <gtest/gtest.h>
 
 #include "appliance.h"
 #include "appliance_file.h"
+#include "extra_mounts.h"
+#include "private_root.h"
 
 namespace norvo::testing {
 namespace {
@@ -40,16 +44,6 @@ bool Exists(const std::string &path) {
     return lstat(path.c_str(), &st) == 0;
 }
 
-// The type of the mount on top at path, "" when none.
-std::string MountType(const std::string &path) {
-    std::string type;
-    FILE *table = setmntent("/proc/self/mounts", "re");
-    while (const mntent *entry = getmntent(table))
-        if (path == entry->mnt_dir) type = entry->mnt_type;
-    endmntent(table);
-    return type;
-}
-
 // The mount lines about places the appliance mounts over; the host's other mounts may change
 // under a concurrent build.
 std::string SandboxRelevantMounts() {
@@ -64,7 +58,9 @@ std::string SandboxRelevantMounts() {
     return lines;
 }
 
-TEST(ApplianceTest, LeavesTheHostUntouched) {
+// Appliances in turn in one process, the middle one with a dead network share and a thread
+// still ending when it goes (as a thread just joined may be): each starts from the host.
+TEST(ApplianceTest, AppliancesInTurnLeaveTheHostUntouched) {
     ASSERT_FALSE(Exists("/etc/quibinfo.conf")) << "the host itself has appliance settings";
     const std::string passwd = Slurp("/etc/passwd");
     const std::string mounts = SandboxRelevantMounts();
@@ -73,17 +69,21 @@ TEST(ApplianceTest, LeavesTheHostUntouched) {
     ASSERT_GE(pid, 0);
     if (pid == 0) {
         int failures = 0;
-        {
-            Appliance appliance;
-            appliance.Basic().SetSetting("probe", "1").SetDefaultSetting("probe", "1");
-            appliance.WriteFile("/volume1/norvo-probe", "x").WriteFile("/tmp/norvo-probe", "x");
-            appliance.WriteFile("/usr/norvo-probe", "x").WriteFile("/etc/norvo-probe", "x");
-            appliance.MountDeadRemote("/volume1/dead");
-            if (getpwnam("alice") == nullptr) failures |= 1;
-            if (!Exists("/etc/quibinfo.conf") || !Exists("/volume1/norvo-probe")) failures |= 2;
+        for (int round = 0; round < 3; ++round) {
+            {
+                Appliance appliance;
+                appliance.Basic().SetSetting("probe", "1").SetDefaultSetting("probe", "1");
+                if (round != 1) continue;
+                appliance.WriteFile("/volume1/norvo-probe", "x").WriteFile("/tmp/norvo-probe", "x");
+                appliance.WriteFile("/usr/norvo-probe", "x").WriteFile("/etc/norvo-probe", "x");
+                appliance.MountDeadRemote("/volume1/dead");
+                for (const std::string dir : {"/var/tmp", "/root", "/home", "/opt", "/srv"})  // read-only
+                    close(open((dir + "/norvo-probe").c_str(), O_WRONLY | O_CREAT | O_CLOEXEC, 0644));
+                if (getpwnam("alice") == nullptr || !Exists("/volume1/norvo-probe")) failures |= 1;
+                std::thread([] { std::this_thread::sleep_for(std::chrono::milliseconds(50)); }).detach();
+            }
+            if (Exists("/etc/quibinfo.conf") || Exists("/volume1/norvo-probe")) failures |= 2 << round;
         }
-        // Back in the host's namespace once the appliance is gone.
-        if (Exists("/etc/quibinfo.conf") || Exists("/volume1/norvo-probe")) failures |= 4;
         _exit(failures);
     }
     int status = 0;
@@ -95,37 +95,73 @@ TEST(ApplianceTest, LeavesTheHostUntouched) {
     EXPECT_EQ(SandboxRelevantMounts(), mounts);
     for (const char *path : {"/etc/quibinfo.conf", "/etc.defaults", "/usr/quib", "/volume1/norvo-probe",
                              "/tmp/norvo-probe", "/usr/norvo-probe", "/etc/norvo-probe", "/volume1/dead",
-                             "/mnt/.norvo-sandbox"})
+                             "/mnt/.norvo-sandbox", "/var/tmp/norvo-probe", "/root/norvo-probe",
+                             "/home/norvo-probe", "/opt/norvo-probe", "/srv/norvo-probe"}) {
         EXPECT_FALSE(Exists(path)) << path;
+        unlink(path);
+    }
+}
+
+// A checkout in a directory no other user may enter (a clone in /root, or under a 0700 /tmp/ci):
+// appliance users still run its programs, and the rest of that directory stays out of sight.
+TEST(ApplianceTest, ProjectTreesAreReachableFromAnyCheckout) {
+    const pid_t pid = fork();
+    ASSERT_GE(pid, 0);
+    if (pid == 0) {
+        // A host of the test's own: /var/locked (0700) holds the checkout n and a private folder.
+        if (unshare(CLONE_NEWNS) != 0 || mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr) != 0 ||
+            mount("tmpfs", "/var", "tmpfs", 0, "mode=0755") != 0)
+            _exit(100);
+        mkdir("/var/locked", 0700);
+        mkdir("/var/locked/private", 0700);
+        mkdir("/var/locked/n", 0755);
+        std::ofstream("/var/locked/n/prog") << "#!/bin/sh\nexit 7\n";
+        chmod("/var/locked/n/prog", 0755);
+        const int tree = open("/var/locked/n", O_PATH | O_DIRECTORY | O_CLOEXEC);
+        internal::EnterPrivateRoot({"/var/locked/n"});
+        int failures = 0;
+        const pid_t user = fork();
+        if (user == 0) {
+            if (setgroups(0, nullptr) == 0 && setresgid(100, 100, 100) == 0 &&
+                setresuid(1026, 1026, 1026) == 0)
+                execl("/var/locked/n/prog", "prog", nullptr);
+            _exit(1);
+        }
+        int status = 0;
+        if (waitpid(user, &status, 0) != user || !WIFEXITED(status) || WEXITSTATUS(status) != 7)
+            failures |= 1;
+        if (Exists("/var/locked/private")) failures |= 2;
+        std::ofstream("/var/locked/n/written") << "x";
+        if (faccessat(tree, "written", F_OK, 0) != 0) failures |= 4;  // the tree is the host's, writable
+        if (mkdir("/var/elsewhere", 0755) == 0 || errno != EROFS) failures |= 8;
+        _exit(failures);
+    }
+    int status = 0;
+    ASSERT_EQ(waitpid(pid, &status, 0), pid);
+    EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << status;
 }
 
 TEST(ApplianceTest, AccountsAreSeenThroughNss) {
     Appliance appliance;
     appliance.Basic().AddUser("CORP\\dave");
-    UserSpec erin;
-    erin.name = "erin@corp.example";
-    erin.uid = 5000;
-    erin.expireDay = 100;
-    appliance.AddUser(erin);
+    appliance.AddUser(UserSpec{.name = "erin@corp.example", .uid = 5000, .expireDay = 100});
 
-    const passwd *alice = getpwnam("alice");
-    ASSERT_NE(alice, nullptr);
-    EXPECT_EQ(alice->pw_uid, appliance.Uid("alice"));
-    EXPECT_EQ(alice->pw_gid, 100u);
-    EXPECT_STREQ(alice->pw_dir, "/volume1/homes/alice");
-    EXPECT_FALSE(Exists("/volume1/homes/alice"));
-    EXPECT_TRUE(Exists("/volume1/homes"));
-    ASSERT_NE(getpwnam("CORP\\dave"), nullptr);
-    EXPECT_EQ(getpwnam("CORP\\dave")->pw_uid, appliance.Uid("CORP\\dave"));
-    ASSERT_NE(getpwnam("erin@corp.example"), nullptr);
-    EXPECT_EQ(getpwnam("erin@corp.example")->pw_uid, 5000u);
+    for (const auto &[name, uid] : {std::pair<std::string, uid_t>{"alice", appliance.Uid("alice")},
+                                    {"CORP\\dave", appliance.Uid("CORP\\dave")},
+                                    {"erin@corp.example", 5000}}) {
+        const passwd *entry = getpwnam(name.c_str());
+        ASSERT_NE(entry, nullptr) << name;
+        EXPECT_EQ(entry->pw_uid, uid) << name;
+        EXPECT_EQ(entry->pw_gid, 100u) << name;
+    }
+    EXPECT_STREQ(getpwnam("alice")->pw_dir, "/volume1/homes/alice");
     EXPECT_EQ(getpwnam("daemon"), nullptr) << "a host account leaks into the appliance";
 
     const group *staff = getgrnam("staff");
     ASSERT_NE(staff, nullptr);
     EXPECT_EQ(staff->gr_gid, appliance.Gid("staff"));
-    std::vector<std::string> members(staff->gr_mem, staff->gr_mem + 2);
-    EXPECT_EQ(members, (std::vector<std::string>{"alice", "bob"}));
+    EXPECT_EQ(std::vector<std::string>(staff->gr_mem, staff->gr_mem + 2),
+              (std::vector<std::string>{"alice", "bob"}));
     ASSERT_NE(getgrnam("administrators"), nullptr);
     EXPECT_EQ(getgrnam("administrators")->gr_gid, 101u);
     EXPECT_STREQ(getgrnam("administrators")->gr_mem[0], "admin");
@@ -203,8 +239,8 @@ TEST(ApplianceTest, RunAsTakesTheUsersIdentity) {
 TEST(ApplianceTest, FatAndDeadRemoteMounts) {
     Appliance appliance;
     appliance.Basic().MountFat("/volumeUSB1").MountDeadRemote("/volume1/photo/nas2");
-    EXPECT_EQ(MountType("/volumeUSB1"), "fuse.fusefat");
-    EXPECT_EQ(MountType("/volume1/photo/nas2"), "fuse.norvo-deadremote");
+    EXPECT_EQ(internal::MountTypeAt("/volumeUSB1"), "fuse.fusefat");
+    EXPECT_EQ(internal::MountTypeAt("/volume1/photo/nas2"), "fuse.norvo-deadremote");
 
     EXPECT_EQ(appliance.RunAs("alice", [] {
         std::ofstream("/volumeUSB1/by-alice.txt") << "on fat";
@@ -219,24 +255,6 @@ TEST(ApplianceTest, FatAndDeadRemoteMounts) {
     errno = 0;
     EXPECT_EQ(stat("/volume1/photo/nas2", &st), -1);
     EXPECT_EQ(errno, EIO);
-}
-
-TEST(ApplianceTest, RemountReadOnly) {
-    Appliance appliance;
-    appliance.WriteFile("/volume2/kept.txt", "kept").MakeDir("/volume1/archive");
-    appliance.RemountReadOnly("/volume2").RemountReadOnly("/volume1/archive");
-
-    EXPECT_EQ(Slurp("/volume2/kept.txt"), "kept");
-    errno = 0;
-    EXPECT_EQ(open("/volume2/new.txt", O_WRONLY | O_CREAT | O_CLOEXEC, 0644), -1);
-    EXPECT_EQ(errno, EROFS);
-    errno = 0;
-    EXPECT_EQ(mkdir("/volume1/archive/new", 0755), -1);
-    EXPECT_EQ(errno, EROFS);
-    EXPECT_EQ(mkdir("/volume1/still-writable", 0755), 0);
-    struct statvfs fs;
-    ASSERT_EQ(statvfs("/volume2", &fs), 0);
-    EXPECT_NE(fs.f_flag & ST_RDONLY, 0u);
 }
 
 TEST(ApplianceFileTest, RejectsBadLinesWithTheirNumber) {
@@ -270,6 +288,7 @@ TEST(ApplianceFileTest, BuildsWhatItDescribes) {
     const char *text = R"(# read-only remounts wait until everything else is built
 basic
 readonly /volume2
+readonly /volume1/photo/2012
 user CORP\dave uid=3000 groups=staff
 share media volume=/volume2 rw=alice,@staff hidden restrict=nobrowse,nodownload acl=no comment="Family \"pics\""
 dir /volume1/photo/2012 owner=alice mode=0750   # trailing comment
@@ -280,10 +299,10 @@ privilege QUIB.TVQ.App.Tovana3.Instance @users,admin
     ApplianceFile file;
     std::string error;
     ASSERT_TRUE(ParseApplianceFile(text, "t", &file, &error)) << error;
-    ASSERT_EQ(file.steps.size(), 8u);
-    EXPECT_EQ(file.steps[2].user.name, "CORP\\dave");
-    EXPECT_EQ(file.steps[3].share.comment, "Family \"pics\"");
-    EXPECT_EQ(file.steps[3].line, 5);
+    ASSERT_EQ(file.steps.size(), 9u);
+    EXPECT_EQ(file.steps[3].user.name, "CORP\\dave");
+    EXPECT_EQ(file.steps[4].share.comment, "Family \"pics\"");
+    EXPECT_EQ(file.steps[4].line, 6);
 
     Appliance appliance;
     BuildAppliance(appliance, file);
@@ -296,8 +315,13 @@ privilege QUIB.TVQ.App.Tovana3.Instance @users,admin
     EXPECT_EQ(st.st_size, 10);
     ASSERT_EQ(stat("/volume2/media", &st), 0);
     EXPECT_EQ(st.st_mode & 07777, 0777u);
-    EXPECT_EQ(mkdir("/volume2/media/x", 0755), -1);
-    EXPECT_EQ(errno, EROFS);
+    // Read-only last, whether a mount point or a folder (bound onto itself); the rest stays writable.
+    for (const char *dir : {"/volume2/media/x", "/volume1/photo/2012/x"}) {
+        errno = 0;
+        EXPECT_EQ(mkdir(dir, 0755), -1) << dir;
+        EXPECT_EQ(errno, EROFS) << dir;
+    }
+    EXPECT_EQ(mkdir("/volume1/photo/x", 0755), 0);
 
     const std::string shares = Slurp("/usr/quib/etc/shares.conf");
     EXPECT_NE(shares.find("[media]\n\tpath = /volume2/media\n\tcomment = Family \"pics\"\n"

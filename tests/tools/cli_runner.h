@@ -2,7 +2,8 @@
 //
 // The binary is found next to the test: build/tests/<test> runs build/tools/norvo (the tests'
 // CMakeLists puts every test executable in build/tests, the tools' puts norvo in build/tools).
-// NORVO_CLI in the environment overrides that path.
+// NORVO_CLI in the environment overrides that path. Inside the appliance the build tree is
+// reachable to every user wherever the checkout is, so RunAs children can run it too.
 #pragma once
 
 #include <fcntl.h>

@@ -1,10 +1,17 @@
 // The norvo command, run as a program inside a throwaway appliance: its JSON answers, its
-// failure output, its usage errors, and hostile arguments.
+// failure output, its usage errors, hostile arguments; and, linked in, its command table and
+// the escaped form of names.
 #include <gtest/gtest.h>
 #include <json/json.h>
+#include <unicode/uchar.h>
+#include <unicode/utf8.h>
 #include <unistd.h>
 
+#include <string.h>
+
 #include <algorithm>
+#include <functional>
+#include <random>
 #include <sstream>
 #include <string>
 #include <vector>
@@ -12,10 +19,15 @@
 #include "appliance.h"
 #include "appliance_file.h"
 #include "cli_runner.h"
+#include "command.h"
+#include "json_text.h"
 #include "quib_fs.h"
+#include "text_safe.h"
 
 namespace norvo::testing {
 namespace {
+
+using Strings = std::vector<std::string>;
 
 class NorvoCliTest : public ::testing::Test {
 protected:
@@ -25,19 +37,19 @@ protected:
         appliance_.Basic();
     }
 
-    // Runs norvo with --json, checks the exit status and returns the parsed stdout.
-    Json::Value RunJson(std::vector<std::string> args, int wantStatus = 0, const std::string &input = "") {
+    // Runs norvo with --json, checks the exit status and that the answer is plain ASCII JSON,
+    // and returns it parsed.
+    static Json::Value RunJson(Strings args, int wantStatus = 0, const std::string &input = "") {
         args.insert(args.begin(), "--json");
         const CliResult result = RunNorvo(args, input);
         EXPECT_EQ(result.exitStatus, wantStatus) << result.err;
         Json::Value root;
-        Json::CharReaderBuilder builder;
         std::string errors;
         std::istringstream in(result.out);
-        EXPECT_TRUE(Json::parseFromStream(builder, in, &root, &errors)) << errors << "\n" << result.out;
+        EXPECT_TRUE(Json::parseFromStream(Json::CharReaderBuilder(), in, &root, &errors)) << errors << result.out;
         EXPECT_TRUE(std::all_of(result.out.begin(), result.out.end(),
                                 [](char c) { return static_cast<unsigned char>(c) < 0x80; }))
-            << "JSON output is not plain ASCII: " << result.out;
+            << result.out;
         return root;
     }
 
@@ -52,57 +64,47 @@ protected:
     Appliance appliance_;
 };
 
-std::vector<std::string> Strings(const Json::Value &array) {
-    std::vector<std::string> out;
+Strings Items(const Json::Value &array) {
+    Strings out;
     for (const Json::Value &item : array) out.push_back(item.asString());
     return out;
 }
 
 TEST_F(NorvoCliTest, ResolveReportsShareAndHomePaths) {
-    Json::Value root = RunJson({"resolve", "--user", "alice", "/photo/2024/a.jpg"});
-    EXPECT_TRUE(root["success"].asBool());
-    const Json::Value &data = root["data"];
+    const Json::Value data = RunJson({"resolve", "--user", "alice", "/photo/2024/a.jpg"})["data"];
     EXPECT_EQ(data["real_path"].asString(), "/volume1/photo/2024/a.jpg");
-    EXPECT_EQ(data["share"].asString(), "photo");
-    EXPECT_EQ(data["volume_path"].asString(), "/volume1");
     EXPECT_EQ(data["share_path"].asString(), "/volume1/photo");
     EXPECT_FALSE(data["home"].asBool());
-    EXPECT_FALSE(data["encrypted"].asBool());
     EXPECT_TRUE(RunJson({"resolve", "--user", "alice", "/secret/plan.txt"})["data"]["encrypted"].asBool());
-
-    root = RunJson({"resolve", "--user=alice", "/home/notes"});
-    EXPECT_EQ(root["data"]["real_path"].asString(), "/volume1/homes/alice/notes");
-    EXPECT_EQ(root["data"]["share_path"].asString(), "/volume1/homes/alice");
-    EXPECT_TRUE(root["data"]["home"].asBool());
+    const Json::Value home = RunJson({"resolve", "--user=alice", "/home/notes"})["data"];
+    EXPECT_EQ(home["real_path"].asString(), "/volume1/homes/alice/notes");
+    EXPECT_TRUE(home["home"].asBool());
 }
 
 TEST_F(NorvoCliTest, PrivilegeOfTwoUsersOnOneShare) {
     appliance_.MakeDir("/volume1/photo/private", "root", 0700);
-    Json::Value alice = RunJson({"privilege", "--user", "alice", "/photo/private"})["data"];
+    const Json::Value alice = RunJson({"privilege", "--user", "alice", "/photo/private"})["data"];
     EXPECT_EQ(alice["privilege"].asInt(), 2);
-    EXPECT_EQ(alice["restrict"]["value"].asUInt(), 0u);
-    EXPECT_TRUE(alice["list"]["allowed"].asBool());
-    EXPECT_TRUE(alice["download"]["allowed"].asBool());
     EXPECT_TRUE(alice["upload"]["allowed"].asBool());
-    EXPECT_EQ(alice["upload"]["type"].asInt(), 1);
-    EXPECT_FALSE(alice["upload_no_overwrite"]["allowed"].asBool());
     EXPECT_EQ(alice["upload_no_overwrite"]["error"]["code"].asInt(), 414);
     // Asked as alice, not as root: a root-only directory lets her neither read, write nor enter.
     EXPECT_TRUE(alice["real_path_exists"].asBool());
     EXPECT_EQ(alice["acl"]["value"].asUInt() & (ACL_PERM_READ | ACL_PERM_WRITE | ACL_PERM_EXECUTE), 0u)
         << alice["acl"];
 
-    Json::Value bob = RunJson({"privilege", "--user", "bob", "/photo"})["data"];
+    const Json::Value bob = RunJson({"privilege", "--user", "bob", "/photo"})["data"];
     EXPECT_EQ(bob["privilege"].asInt(), 1);
     EXPECT_TRUE(bob["list"]["allowed"].asBool());
-    EXPECT_FALSE(bob["upload"]["allowed"].asBool());
-    EXPECT_EQ(bob["upload"]["error"]["code"].asInt(), 407);
     EXPECT_EQ(bob["upload"]["error"]["key"].asString(), "error:error_privilege_not_enough");
+    EXPECT_FALSE(RunJson({"privilege", "--user", "bob", "/secret"})["data"]["download"]["allowed"].asBool());
 
-    Json::Value denied = RunJson({"privilege", "--user", "bob", "/secret"})["data"];
-    EXPECT_EQ(denied["privilege"].asInt(), 0);
-    EXPECT_FALSE(denied["list"]["allowed"].asBool());
-    EXPECT_FALSE(denied["download"]["allowed"].asBool());
+    Add("share locked rw=alice restrict=nomodify,nodownload");
+    const Json::Value locked = RunJson({"privilege", "--user", "alice", "/locked"})["data"];
+    EXPECT_EQ(Items(locked["restrict"]["names"]), (Strings{"no-modify", "no-download"}));
+    EXPECT_EQ(locked["upload"]["type"].asInt(), 2);
+    const CliResult text = RunNorvo({"privilege", "--user", "alice", "/locked"});
+    EXPECT_NE(text.out.find("restrictions          0x6 (no-modify, no-download)\n"), std::string::npos)
+        << text.out;
 }
 
 TEST_F(NorvoCliTest, OnlyRootAsksForAnotherUser) {
@@ -120,168 +122,200 @@ TEST_F(NorvoCliTest, OnlyRootAsksForAnotherUser) {
     EXPECT_EQ(refused, 1);
 }
 
-TEST_F(NorvoCliTest, PrivilegeNamesRestrictionsAndTextIsAligned) {
-    Add("share locked rw=alice restrict=nomodify,nodownload");
-    const Json::Value data = RunJson({"privilege", "--user", "alice", "/locked"})["data"];
-    EXPECT_EQ(data["restrict"]["value"].asUInt(), 6u);
-    EXPECT_EQ(Strings(data["restrict"]["names"]), (std::vector<std::string>{"no-modify", "no-download"}));
-    EXPECT_FALSE(data["download"]["allowed"].asBool());
-    EXPECT_TRUE(data["upload"]["allowed"].asBool());
-    EXPECT_EQ(data["upload"]["type"].asInt(), 2);
+TEST_F(NorvoCliTest, SharesCheckPathAndFailures) {
+    EXPECT_EQ(Items(RunJson({"shares", "--user", "alice", "--sort"})["data"]["shares"]),
+              (Strings{"photo", "public", "secret"}));
+    EXPECT_EQ(Items(RunJson({"shares", "--user", "bob", "--writable"})["data"]["shares"]), (Strings{"public"}));
+    EXPECT_EQ(RunJson({"check-path", "--find-existing", "/volume1/photo/new/deeper"})["data"]["existing"].asString(),
+              "/volume1/photo");
 
-    const CliResult text = RunNorvo({"privilege", "--user", "alice", "/locked"});
-    EXPECT_EQ(text.exitStatus, 0) << text.err;
-    EXPECT_NE(text.out.find("share privilege       read-write\n"), std::string::npos) << text.out;
-    EXPECT_NE(text.out.find("restrictions          0x6 (no-modify, no-download)\n"), std::string::npos)
-        << text.out;
-}
-
-TEST_F(NorvoCliTest, SharesListsAreTheLibrarys) {
-    EXPECT_EQ(Strings(RunJson({"shares", "--user", "alice"})["data"]["shares"]),
-              (std::vector<std::string>{"public", "photo", "secret"}));
-    EXPECT_EQ(Strings(RunJson({"shares", "--user", "alice", "--sort"})["data"]["shares"]),
-              (std::vector<std::string>{"photo", "public", "secret"}));
-    EXPECT_EQ(Strings(RunJson({"shares", "--user", "bob"})["data"]["shares"]),
-              (std::vector<std::string>{"public", "photo"}));
-    EXPECT_EQ(Strings(RunJson({"shares", "--user", "bob", "--writable"})["data"]["shares"]),
-              (std::vector<std::string>{"public"}));
-}
-
-TEST_F(NorvoCliTest, FailureGivesCodeKeyAndStatusOne) {
-    const Json::Value root = RunJson({"resolve", "--user", "alice", "/nowhere/x"}, 1);
-    EXPECT_FALSE(root["success"].asBool());
-    EXPECT_EQ(root["error"]["code"].asInt(), 408);
-    EXPECT_EQ(root["error"]["key"].asString(), "error:error_no_path");
-    EXPECT_FALSE(root.isMember("data"));
-
-    const CliResult text = RunNorvo({"resolve", "--user", "alice", "/nowhere/x"});
+    const Json::Value failed = RunJson({"resolve", "--user", "alice", "/nowhere/x"}, 1);
+    EXPECT_EQ(failed["error"]["key"].asString(), "error:error_no_path");
+    EXPECT_FALSE(failed.isMember("data"));
+    EXPECT_EQ(RunJson({"check-path", "/volume1/photo/new"}, 1)["error"]["code"].asInt(), 408);
+    EXPECT_EQ(RunJson({"privilege", "--user", "nobody-here", "/photo"}, 1)["error"]["code"].asInt(), 403);
+    const CliResult text = RunNorvo({"check-name", "/volume1/photo", "._secret"});
     EXPECT_EQ(text.exitStatus, 1);
     EXPECT_EQ(text.out, "");
-    EXPECT_EQ(text.err, "error 408 (error:error_no_path)\n");
-
-    const CliResult reserved = RunNorvo({"check-name", "/volume1/photo", "._secret"});
-    EXPECT_EQ(reserved.exitStatus, 1);
-    EXPECT_EQ(reserved.err, "error 418 (error:error_reserved_name)\n");
-
-    const Json::Value unknown = RunJson({"privilege", "--user", "nobody-here", "/photo"}, 1);
-    EXPECT_EQ(unknown["error"]["code"].asInt(), 403);
-}
-
-TEST_F(NorvoCliTest, CheckPathShowsTheExistingPart) {
-    const Json::Value data =
-        RunJson({"check-path", "--find-existing", "/volume1/photo/new/deeper/file"})["data"];
-    EXPECT_TRUE(data["acceptable"].asBool());
-    EXPECT_EQ(data["existing"].asString(), "/volume1/photo");
-
-    const Json::Value missing = RunJson({"check-path", "/volume1/photo/new"}, 1);
-    EXPECT_EQ(missing["error"]["code"].asInt(), 408);
+    EXPECT_EQ(text.err, "error 418 (error:error_reserved_name)\n");
 }
 
 TEST_F(NorvoCliTest, LoginGivesASidThatDomainPrivilegesAccept) {
     Add("domain CORP\n"
         "user CORP\\dave password=pw-dave\n"
         "share team rw=CORP\\dave\n");
-
     const CliResult login = RunNorvo({"login", "--user", "CORP\\dave", "--password-stdin"}, "pw-dave\n");
     ASSERT_EQ(login.exitStatus, 0) << login.err;
-    ASSERT_FALSE(login.out.empty());
     const std::string sid = login.out.substr(0, login.out.find('\n'));
     EXPECT_EQ(login.out, sid + "\n");
-
-    const Json::Value data = RunJson({"privilege", "--user", "CORP\\dave", "--sid", sid, "/team"})["data"];
-    EXPECT_EQ(data["privilege"].asInt(), 2);
-    EXPECT_EQ(data["sid"].asString(), sid);
-
-    const Json::Value forged = RunJson({"privilege", "--user", "CORP\\dave", "--sid", "forged", "/team"}, 1);
-    EXPECT_EQ(forged["error"]["code"].asInt(), 402);
-
-    const Json::Value wrong = RunJson({"login", "--user", "alice", "--password", "wrong"}, 1);
-    EXPECT_FALSE(wrong["success"].asBool());
-    const Json::Value stranger = RunJson({"login", "--user", "stranger", "--password", "x"}, 1);
-    EXPECT_EQ(stranger["error"]["code"].asInt(), 403);
+    EXPECT_EQ(RunJson({"privilege", "--user", "CORP\\dave", "--sid", sid, "/team"})["data"]["privilege"].asInt(), 2);
+    EXPECT_EQ(RunJson({"privilege", "--user", "CORP\\dave", "--sid", "forged", "/team"}, 1)["error"]["code"].asInt(),
+              402);
+    EXPECT_FALSE(RunJson({"login", "--user", "alice", "--password", "wrong"}, 1)["success"].asBool());
 }
 
 TEST_F(NorvoCliTest, UsageErrorsExitTwoAndSayWhy) {
-    struct Case {
-        std::vector<std::string> args;
-        std::string message;
-    };
-    const std::vector<Case> cases = {
+    const std::vector<std::pair<Strings, std::string>> cases = {
         {{}, "norvo: no command given"},
         {{"frobnicate"}, "norvo: unknown command frobnicate"},
         {{"--verbose", "shares"}, "norvo: unknown option --verbose"},
         {{"resolve", "/photo"}, "norvo resolve: option --user is required"},
-        {{"resolve", "/photo", "--user"}, "norvo resolve: option --user needs a value (USER)"},
         {{"resolve", "--user", "--json", "/photo"}, "norvo resolve: option --user needs a value (USER)"},
         {{"resolve", "--user=", "/photo"}, "norvo resolve: option --user needs a non-empty value"},
         {{"resolve", "--user", "alice"}, "norvo resolve: missing argument PATH"},
         {{"resolve", "--user", "alice", "/a", "/b"}, "norvo resolve: unexpected argument /b"},
         {{"resolve", "--user", "alice", "--user", "bob", "/a"}, "norvo resolve: option --user given twice"},
-        {{"resolve", "--owner", "alice", "/a"}, "norvo resolve: unknown option --owner"},
         {{"resolve", "-u", "alice", "/a"}, "norvo resolve: unknown option -u"},
         {{"shares", "--user", "alice", "--sort=yes"}, "norvo shares: option --sort takes no value"},
+        {{"shares", "--user", "alice", "--escaped"}, "norvo shares: unknown option --escaped"},
         {{"check-path", "--mode", "0x40", "/volume1"}, "norvo check-path: --mode wants a number from 1 to 63"},
-        {{"check-path", "--mode", "-1", "/volume1"}, "norvo check-path: --mode wants a number from 1 to 63"},
-        {{"check-path", "--mode", "--find-existing", "/volume1"}, "norvo check-path: option --mode needs a value"},
         {{"check-name", "/volume1", ""}, "norvo check-name: argument NAME is empty"},
         {{"login", "--user", "alice"}, "norvo login: give exactly one of --password and --password-stdin"},
         {{"login", "--user", "alice", "--password-stdin"}, "norvo login: no password on stdin"},
+        {{"ls", "--user", "alice", "--info", "size,colour", "/photo"}, "norvo ls: --info does not know \"colour\""},
+        {{"ls", "--user", "alice", "--type", "link", "/photo"}, "norvo ls: --type wants dir, file or all"},
+        {{"ls", "--user", "alice", "--limit", "99999999999", "/photo"}, "norvo ls: --limit wants a number"},
+        {{"ls", "--user", "alice", "--name", "x", "/"}, "norvo ls: --type and --name filter a directory"},
+        {{"ls", "--user", "bob", "/photo/../secret"}, "norvo ls: PATH may not hold . or .. components"},
+        {{"ls", "--escaped", "--user", "bob", "/photo/\\x2E\\x2E/secret"}, "norvo ls: PATH may not hold . or"},
+        {{"ls", "--escaped", "--user", "bob", "/photo\\x00/x"}, "norvo ls: argument PATH is not in the escaped"},
+        {{"mounts", "--escaped", "--path", "/\\xq1"}, "norvo mounts: option --path is not in the escaped form"},
+        {{"whois", "--uid", "1", "--gid", "1"}, "norvo whois: give exactly one of --uid, --gid and --user"},
+        {{"whois", "--uid", "4294967296"}, "norvo whois: --uid takes a decimal id up to 4294967295"},
     };
-    for (const Case &c : cases) {
-        std::vector<std::string> args = c.args;
-        args.push_back("--json");  // usage errors stay text on stderr even then
-        const CliResult result = RunNorvo(args);
-        SCOPED_TRACE(c.message);
+    for (const auto &[args, message] : cases) {
+        Strings withJson = args;
+        withJson.push_back("--json");  // usage errors stay text on stderr even then
+        const CliResult result = RunNorvo(withJson);
+        SCOPED_TRACE(message);
         EXPECT_EQ(result.exitStatus, 2);
         EXPECT_EQ(result.out, "");
-        EXPECT_EQ(result.err.rfind(c.message, 0), 0u) << result.err;
+        EXPECT_EQ(result.err.rfind(message, 0), 0u) << result.err;
     }
 }
 
-TEST_F(NorvoCliTest, HostileArgumentsKeepJsonValidAndTextInert) {
-    const std::string broken = "/photo/a\xC3/b\xFF\xED\xA0\x80";
-    const Json::Value data = RunJson({"resolve", "--user", "alice", broken})["data"];
-    EXPECT_EQ(data["path"].asString(), "/photo/a\xEF\xBF\xBD/b\xEF\xBF\xBD\xEF\xBF\xBD\xEF\xBF\xBD\xEF\xBF\xBD");
-    EXPECT_EQ(data["real_path"].asString().rfind("/volume1/photo/a\xEF\xBF\xBD/b", 0), 0u);
+TEST_F(NorvoCliTest, HostileArgumentsKeepJsonValidAndLossless) {
+    const Json::Value data = RunJson({"resolve", "--user", "alice", "/photo/a\xC3/b\xFF"})["data"];
+    EXPECT_EQ(data["path"].asString(), "/photo/a\xEF\xBF\xBD/b\xEF\xBF\xBD");
+    EXPECT_EQ(data["real_path_escaped"].asString(), "/volume1/photo/a\\xC3/b\\xFF");
+    EXPECT_EQ(RunJson({"resolve", "--escaped", "--user", "alice", "/photo/a\\xc3/b\\xFF"})["data"], data);
 
     const std::string longPath = "/photo/" + std::string(20000, 'x') + "/y";
-    for (const std::vector<std::string> &args :
-         {std::vector<std::string>{"resolve", "--user", "alice", longPath},
-          std::vector<std::string>{"privilege", "--user", "alice", longPath},
-          std::vector<std::string>{"check-path", "--find-existing", "/volume1" + longPath},
-          std::vector<std::string>{"check-name", "/volume1/photo", std::string(5000, 'n')},
-          std::vector<std::string>{"shares", "--user", std::string(5000, 'u')}}) {
-        const CliResult result = RunNorvo([&] {
-            std::vector<std::string> withJson = args;
-            withJson.insert(withJson.begin(), "--json");
-            return withJson;
-        }());
-        SCOPED_TRACE(args[0]);
-        EXPECT_EQ(result.signal, 0);
-        EXPECT_TRUE(result.exitStatus == 0 || result.exitStatus == 1) << result.exitStatus;
-        Json::Value root;
-        std::string errors;
-        std::istringstream in(result.out);
-        EXPECT_TRUE(Json::parseFromStream(Json::CharReaderBuilder(), in, &root, &errors)) << errors;
-        EXPECT_TRUE(root.isMember("success"));
+    for (const Strings &args : {Strings{"--json", "resolve", "--user", "alice", longPath},
+                                Strings{"--json", "privilege", "--user", "alice", longPath},
+                                Strings{"--json", "ls", "--user", "alice", longPath},
+                                Strings{"--json", "check-path", "--find-existing", "/volume1" + longPath},
+                                Strings{"--json", "check-name", "/volume1/photo", std::string(5000, 'n')},
+                                Strings{"--json", "shares", "--user", std::string(5000, 'u')}}) {
+        const CliResult result = RunNorvo(args);
+        EXPECT_TRUE(result.exitStatus == 0 || result.exitStatus == 1) << args[1] << result.signal;
+        EXPECT_EQ(result.out.rfind("{\"", 0), 0u) << args[1] << result.out.substr(0, 80);
     }
-
-    const CliResult text = RunNorvo({"resolve", "--user", "alice", "/photo/\x1B[2Jname\x07"});
-    EXPECT_EQ(text.exitStatus, 0) << text.err;
-    EXPECT_EQ(text.out.find('\x1B'), std::string::npos);
-    EXPECT_NE(text.out.find("/volume1/photo/\\x1B[2Jname\\x07"), std::string::npos) << text.out;
 }
 
-TEST_F(NorvoCliTest, HelpListsEveryCommand) {
-    const CliResult overview = RunNorvo({"--help"});
-    EXPECT_EQ(overview.exitStatus, 0);
-    for (const char *name : {"resolve", "privilege", "shares", "check-name", "check-path", "login"}) {
+TEST_F(NorvoCliTest, HelpCoversEveryCommandOfTheTable) {
+    const std::string overview = RunNorvo({"--help"}).out;
+    for (const cli::CommandDef &command : cli::Commands()) {
+        const std::string name = command.name;
         SCOPED_TRACE(name);
-        EXPECT_NE(overview.out.find(std::string("  ") + name + " "), std::string::npos);
+        EXPECT_NE(overview.find("\n  " + name + "  "), std::string::npos) << overview;
         const CliResult help = RunNorvo({name, "--help"});
         EXPECT_EQ(help.exitStatus, 0);
-        EXPECT_EQ(help.out.rfind(std::string("usage: norvo ") + name + " ", 0), 0u) << help.out;
+        EXPECT_EQ(help.out.rfind("usage: norvo " + name + " ", 0), 0u) << help.out;
+        EXPECT_NE(help.out.find(std::string("\n") + command.summary + "\n\n" + command.details), std::string::npos);
+        EXPECT_GT(std::string(command.details).size(), 40u);
+        for (const cli::OptionDef &option : command.options) {
+            EXPECT_GT(std::string(option.help).size(), 3u) << option.name;
+            EXPECT_NE(help.out.find(std::string("  --") + option.name), std::string::npos) << option.name;
+        }
         EXPECT_EQ(RunNorvo({"help", name}).out, help.out);
+    }
+}
+
+// Generated byte strings, rich in what must be escaped, against a reference that decodes with
+// ICU: the form is lossless, holds no character that moves or reorders the line, and leaves an
+// ordinary name as it is.
+TEST(EscapedForm, IsLosslessInertAndLeavesOrdinaryNames) {
+    const Strings pieces = {"a", " ", "\\", "x", "F", "\\x41", "\n", "\x1B", "\x7F", "\xC2\x85", "\xC3\xA9",
+                            "\xE2\x80\xAE", "\xE2\x81\xA6", "\xE2\x80\x8B", "\xEF\xBB\xBF", "\xE2\x80\xA8",
+                            "\xF0\x9F\x98\x80", "\xF3\xA0\x80\x81", "\xFF", "\xC3", "\xED\xA0\x80", "\xE2\x80"};
+    const auto hidden = [](UChar32 c) {
+        const int type = u_charType(c);
+        return type == U_CONTROL_CHAR || type == U_FORMAT_CHAR || type == U_LINE_SEPARATOR ||
+               type == U_PARAGRAPH_SEPARATOR;
+    };
+    // Valid UTF-8 of visible characters, and no backslash: what must print unchanged.
+    const auto ordinary = [&](const std::string &text) {
+        for (int32_t i = 0; i < static_cast<int32_t>(text.size());) {
+            UChar32 c;
+            U8_NEXT(text.data(), i, static_cast<int32_t>(text.size()), c);
+            if (c < 0 || c == '\\' || hidden(c)) return false;
+        }
+        return true;
+    };
+    std::mt19937 random(20261123);
+    for (int n = 0; n < 20000; ++n) {
+        std::string bytes;
+        for (int k = static_cast<int>(random() % 6); k > 0; --k) bytes += pieces[random() % pieces.size()];
+        const std::string form = cli::TerminalSafe(bytes);
+        std::string back;
+        ASSERT_TRUE(cli::Unescape(form, &back)) << form;
+        ASSERT_EQ(back, bytes) << form;
+        std::string unslashed = form;
+        unslashed.erase(std::remove(unslashed.begin(), unslashed.end(), '\\'), unslashed.end());
+        ASSERT_TRUE(ordinary(unslashed)) << form;
+        if (ordinary(bytes)) {
+            ASSERT_EQ(form, bytes);
+        }
+    }
+    std::string out;
+    for (const char *bad : {"a\\x4", "\\xG1", "\\x00"}) {
+        EXPECT_FALSE(cli::Unescape(bad, &out)) << bad;
+    }
+    const std::vector<std::pair<std::string, std::string>> forms = {
+        {"CORP\\dave", "CORP\\dave"}, {"C:\\", "C:\\"}, {"\\x41", "\\\\x41"}, {"a\\\x1B", "a\\\\\\x1B"}};
+    for (const auto &[bytes, form] : forms) {
+        EXPECT_EQ(cli::TerminalSafe(bytes), form);
+    }
+}
+
+// Random trees against jsoncpp's own writer: the fast one must write the same bytes.
+TEST(JsonText, MatchesJsoncppByteForByte) {
+    std::mt19937_64 random(1123);
+    const Strings strings = {"", "a/b", "\"q\"", "back\\slash", "\x01\x1F\x7F\b\f\n\r\t", "\xC3\xA9", "\xE2\x80\xAE",
+                             "\xF0\x9F\x98\x80"};
+    const auto pick = [&] { return strings[random() % strings.size()] + strings[random() % strings.size()]; };
+    std::function<Json::Value(int)> make = [&](int depth) {
+        uint64_t bits = random();
+        double real;
+        memcpy(&real, &bits, sizeof real);  // NaN, infinities and subnormals included
+        switch (random() % (depth > 3 ? 6 : 8)) {
+        case 0: return Json::Value();
+        case 1: return Json::Value(static_cast<Json::Int64>(bits));
+        case 2: return Json::Value(static_cast<Json::UInt64>(bits));
+        case 3: return Json::Value(bits % 2 ? real : static_cast<double>(bits % 100000) / (bits % 7 + 1));
+        case 4: return Json::Value(bits % 2 == 0);
+        case 5: return Json::Value(pick());
+        case 6: {
+            Json::Value array(Json::arrayValue);
+            for (uint64_t n = bits % 4; n > 0; --n) array.append(make(depth + 1));
+            return array;
+        }
+        default: {
+            Json::Value object(Json::objectValue);
+            for (uint64_t n = bits % 4; n > 0; --n) object[pick()] = make(depth + 1);
+            return object;
+        }
+        }
+    };
+    Json::StreamWriterBuilder builder;
+    builder["indentation"] = "";
+    builder["emitUTF8"] = false;
+    for (int n = 0; n < 5000; ++n) {
+        const Json::Value value = make(0);
+        std::string fast;
+        cli::AppendJson(fast, value);
+        ASSERT_EQ(fast, Json::writeString(builder, value));
     }
 }
 

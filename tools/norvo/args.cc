@@ -4,6 +4,8 @@
 
 #include <algorithm>
 
+#include "text_safe.h"
+
 namespace norvo::cli {
 namespace {
 
@@ -21,6 +23,9 @@ ParseOutcome Help(const CommandDef *command) {
     outcome.topic = command;
     return outcome;
 }
+
+constexpr char kNotEscaped[] =
+    " is not in the escaped form: an escape is a backslash, x and two hex digits other than 00";
 
 bool IsHelp(const std::string &arg) {
     return arg == "--help" || arg == "-h";
@@ -43,6 +48,7 @@ ParseOutcome ParseCommandArgs(const CommandDef &command, bool json, int argc, co
     inv.command = &command;
     inv.json = json;
     bool optionsEnded = false;
+    bool escaped = false;
     for (int i = first; i < argc; ++i) {
         const std::string arg = argv[i];
         if (optionsEnded || arg == "-" || arg.empty() || arg[0] != '-') {
@@ -61,6 +67,13 @@ ParseOutcome ParseCommandArgs(const CommandDef &command, bool json, int argc, co
         }
         const size_t equals = arg.find('=');
         const std::string name = arg.substr(2, equals == std::string::npos ? std::string::npos : equals - 2);
+        if (name == "escaped" && TakesPaths(command)) {
+            if (equals != std::string::npos) {
+                return UsageError(&command, "option --escaped takes no value");
+            }
+            escaped = true;
+            continue;
+        }
         if (name == "json") {
             if (equals != std::string::npos) {
                 return UsageError(&command, "option --json takes no value");
@@ -114,10 +127,34 @@ ParseOutcome ParseCommandArgs(const CommandDef &command, bool json, int argc, co
             return UsageError(&command, std::string("argument ") + def.name + " is empty");
         }
     }
+    if (escaped) {
+        // Decoded before anything looks at them, so every check sees the real bytes.
+        for (size_t i = 0; i < inv.arguments.size(); ++i) {
+            const ArgumentDef &def = command.arguments[std::min(i, command.arguments.size() - 1)];
+            const std::string given = inv.arguments[i];
+            if (!Unescape(given, &inv.arguments[i])) {
+                return UsageError(&command, std::string("argument ") + def.name + kNotEscaped);
+            }
+        }
+        for (const OptionDef &option : command.options) {
+            std::string *value = IsPath(option) && inv.Has(option.name) ? &inv.options[option.name] : nullptr;
+            if (value != nullptr && !Unescape(std::string(*value), value)) {
+                return UsageError(&command, std::string("option --") + option.name + kNotEscaped);
+            }
+        }
+    }
     return outcome;
 }
 
 }  // namespace
+
+bool IsPath(const OptionDef &option) {
+    return option.valueName != nullptr && strcmp(option.valueName, "PATH") == 0;
+}
+
+bool TakesPaths(const CommandDef &command) {
+    return !command.arguments.empty() || std::any_of(command.options.begin(), command.options.end(), IsPath);
+}
 
 ParseOutcome ParseCommandLine(int argc, const char *const *argv) {
     bool json = false;

@@ -18,6 +18,12 @@ struct ParseOutcome {
 // Options may be written "--name VALUE" or "--name=VALUE". A separate value may not begin with
 // "--" (write "--user=--odd" for that), so a forgotten value never swallows the next option.
 // "--" ends the options; --json and -h/--help are accepted before and after the command.
+// --escaped, after a command that takes paths, says that its arguments and PATH options are in
+// the escaped form norvo prints (see TerminalSafe); they are decoded here.
 ParseOutcome ParseCommandLine(int argc, const char *const *argv);
+
+// Whether the option's value is a path, and whether the command takes any (and so --escaped).
+bool IsPath(const OptionDef &option);
+bool TakesPaths(const CommandDef &command);
 
 }  // namespace norvo::cli

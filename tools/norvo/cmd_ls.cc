@@ -2,6 +2,7 @@
 #include <time.h>
 
 #include <algorithm>
+#include <iostream>
 #include <list>
 #include <memory>
 #include <string>
@@ -114,55 +115,77 @@ std::string Date(int32_t seconds) {
     return buf;
 }
 
-// One aligned line per entry, the name last (it may be long or odd); columns only for the
-// groups info asked for.
-void AddTable(const std::list<DIRENTRY_INFO> &files, int info, bool shares, TextTable *text) {
-    std::vector<std::vector<std::string>> rows;
-    std::vector<bool> rightAligned;
-    std::vector<std::string> header;
-    auto column = [&](const char *name, bool right) {
-        header.push_back(name);
-        rightAligned.push_back(right);
-    };
-    if (info & NVO_INFO_PERM) column("posix", false);
-    if (info & NVO_INFO_OWNER) column("owner", false);
-    if (info & NVO_INFO_SIZE) column("size", true);
-    if (info & NVO_INFO_TIME) column("modified", false);
-    const bool volume = shares && (info & NVO_INFO_VOLUME_STATUS);
-    if (volume) column("volume", false);
-    column("name", false);
-    rows.push_back(header);
-    for (const DIRENTRY_INFO &entry : files) {
-        std::vector<std::string> row;
-        if (info & NVO_INFO_PERM) row.push_back(GetPrivilegeStr(entry.mode));
-        if (info & NVO_INFO_OWNER) row.push_back(TerminalSafe(entry.user.empty() ? std::to_string(entry.uid) : entry.user));
-        if (info & NVO_INFO_SIZE) row.push_back(entry.isdir ? "-" : HumanSize(entry.size));
-        if (info & NVO_INFO_TIME) row.push_back(Date(entry.mtime));
-        if (volume) {
-            row.push_back(entry.mount_point_type == "remotefail"
-                              ? std::string("unreachable")
-                              : std::string(entry.readonly ? "read-only" : "read-write") + ", " +
-                                    HumanSize(entry.freespace) + " free");
-        }
-        row.push_back(TerminalSafe(entry.name) + (entry.isdir ? "/" : ""));
-        rows.push_back(std::move(row));
+// The cells of one line, escaped for the terminal; the name last (it may be long or odd).
+class Table {
+public:
+    Table(int info, bool shares) : info_(info), volume_(shares && (info & NVO_INFO_VOLUME_STATUS)) {}
+
+    std::vector<std::string> Header() const {
+        std::vector<std::string> cells;
+        if (info_ & NVO_INFO_PERM) cells.push_back("posix");
+        if (info_ & NVO_INFO_OWNER) cells.push_back("owner");
+        if (info_ & NVO_INFO_SIZE) cells.push_back("size");
+        if (info_ & NVO_INFO_TIME) cells.push_back("modified");
+        if (volume_) cells.push_back("volume");
+        cells.push_back("name");
+        return cells;
     }
+
+    std::vector<std::string> Cells(const DIRENTRY_INFO &entry) const {
+        std::vector<std::string> cells;
+        if (info_ & NVO_INFO_PERM) cells.push_back(GetPrivilegeStr(entry.mode));
+        if (info_ & NVO_INFO_OWNER) {
+            cells.push_back(TerminalSafe(entry.user.empty() ? std::to_string(entry.uid) : entry.user));
+        }
+        if (info_ & NVO_INFO_SIZE) cells.push_back(entry.isdir ? "-" : HumanSize(entry.size));
+        if (info_ & NVO_INFO_TIME) cells.push_back(Date(entry.mtime));
+        if (volume_) {
+            cells.push_back(entry.mount_point_type == "remotefail"
+                                ? std::string("unreachable")
+                                : std::string(entry.readonly ? "read-only" : "read-write") + ", " +
+                                      HumanSize(entry.freespace) + " free");
+        }
+        cells.push_back(TerminalSafe(entry.name) + (entry.isdir ? "/" : ""));
+        return cells;
+    }
+
+    // The size column reads best aligned right.
+    bool RightAligned(size_t column) const { return Header()[column] == "size"; }
+
+private:
+    int info_;
+    bool volume_;
+};
+
+// Aligned lines, printed as they are made: the widths come from a first pass over the
+// entries, so the table costs no memory per entry.
+void PrintTable(std::ostream &out, const std::list<DIRENTRY_INFO> &files, int info, bool shares) {
+    const Table table(info, shares);
+    const std::vector<std::string> header = table.Header();
     std::vector<size_t> widths(header.size(), 0);
-    for (const auto &row : rows) {
-        for (size_t i = 0; i + 1 < row.size(); ++i) {
-            widths[i] = std::max(widths[i], Width(row[i]));
+    const auto measure = [&](const std::vector<std::string> &cells) {
+        for (size_t i = 0; i + 1 < cells.size(); ++i) {
+            widths[i] = std::max(widths[i], Width(cells[i]));
         }
+    };
+    std::vector<bool> right(header.size());
+    for (size_t i = 0; i < header.size(); ++i) {
+        right[i] = table.RightAligned(i);
     }
-    for (const auto &row : rows) {
-        std::string line;
-        for (size_t i = 0; i < row.size(); ++i) {
-            const std::string pad(i + 1 < row.size() ? widths[i] - Width(row[i]) : 0, ' ');
-            line += rightAligned[i] ? pad + row[i] : row[i] + (i + 1 < row.size() ? pad : "");
-            if (i + 1 < row.size()) {
-                line += "  ";
-            }
+    const auto print = [&](const std::vector<std::string> &cells) {
+        for (size_t i = 0; i + 1 < cells.size(); ++i) {
+            const std::string pad(widths[i] - Width(cells[i]), ' ');
+            out << (right[i] ? pad + cells[i] : cells[i] + pad) << "  ";
         }
-        text->Line(line);
+        out << cells.back() << '\n';
+    };
+    measure(header);
+    for (const DIRENTRY_INFO &entry : files) {
+        measure(table.Cells(entry));
+    }
+    print(header);
+    for (const DIRENTRY_INFO &entry : files) {
+        print(table.Cells(entry));
     }
 }
 
@@ -297,23 +320,21 @@ int RunLs(const Invocation &inv) {
         files.clear();  // a page past the end is empty (the library leaves that case open)
     }
 
-    Json::Value data(Json::objectValue);
-    data["total"] = static_cast<Json::UInt64>(total);
-    data["offset"] = offset;
-    Json::Value &list = data["files"] = Json::Value(Json::arrayValue);
-    TextTable text;
     if (inv.json) {
+        JsonPageWriter page(std::cout, total, offset);
         for (const DIRENTRY_INFO &entry : files) {
-            Json::Value &item = list.append(Json::Value(Json::objectValue));
+            Json::Value item(Json::objectValue);
             DumpFileInfo(info, entry, item);
+            page.Entry(item);
         }
+        page.Finish();
     } else {
-        text.Line(PageText(total, static_cast<unsigned long>(offset), files.size()));
+        std::cout << PageText(total, static_cast<unsigned long>(offset), files.size()) << '\n';
         if (!files.empty()) {
-            AddTable(files, info, shares, &text);
+            PrintTable(std::cout, files, info, shares);
         }
     }
-    return ReportSuccess(inv, data, text);
+    return kExitOk;
 }
 
 }  // namespace norvo::cli

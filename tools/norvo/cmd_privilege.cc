@@ -1,9 +1,14 @@
 // privilege: everything the library says one user may do at one path.
+#include <errno.h>
+#include <fcntl.h>
+#include <limits.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <string>
 
 #include "accounts.h"
+#include "common/beneath.h"
 #include "bit_names.h"
 #include "exit_status.h"
 #include "handlers.h"
@@ -12,6 +17,7 @@
 #include "norvo/norvodir.h"
 #include "norvo/norvomisc.h"
 #include "output.h"
+#include "text_safe.h"
 
 namespace norvo::cli {
 namespace {
@@ -50,6 +56,33 @@ std::string VerdictText(const Verdict &verdict) {
     return verdict.code == NVO_ERR_NONE ? "refused" : "refused: " + ErrorText(verdict.code);
 }
 
+// What the real path is, seen from the share's folder as the file manager sees it: links are
+// never followed, so a path through one reaches nothing, and one that ends in a link names the
+// link itself.
+enum class Reach { kPlain, kLink, kThroughLink };
+
+Reach ReachOf(const std::string &path, const std::string &realPath, std::string *target) {
+    std::string top;
+    if (!TopOf(path, realPath, &top)) {
+        return Reach::kPlain;  // the resolution's own answer stands
+    }
+    const OwnedFd opened = OpenBeneath(top, realPath, O_PATH);
+    if (opened.IsOpen() || errno != ELOOP) {
+        return Reach::kPlain;
+    }
+    const size_t slash = realPath.find_last_of('/');
+    const std::string parent = realPath.substr(0, slash);
+    const OwnedFd folder = OpenBeneath(top, parent, O_PATH | O_DIRECTORY);
+    char link[PATH_MAX];
+    const ssize_t size =
+        folder.IsOpen() ? readlinkat(folder.Get(), realPath.c_str() + slash + 1, link, sizeof link) : -1;
+    if (size < 0) {
+        return Reach::kThroughLink;
+    }
+    target->assign(link, static_cast<size_t>(size));
+    return Reach::kLink;
+}
+
 struct ShareAnswer {
     int privilege = 0;
     unsigned int flags = 0;
@@ -74,6 +107,11 @@ int RunPrivilege(const Invocation &inv) {
     NvoLibSetErr(NVO_ERR_NONE);
     if (!NvoFullPathGet(path.c_str(), realPath, share, volumePath, sharePath, userName)) {
         return ReportLibraryFailure(inv, "resolving " + path);
+    }
+    std::string linkTarget;
+    const Reach reach = ReachOf(path, realPath, &linkTarget);
+    if (reach == Reach::kThroughLink) {
+        return ReportFailure(inv, NVO_ERR_PRIVILEGE, path + " passes through a symbolic link, which is not followed");
     }
     // The checks below let home folders through without a share lookup; so does this.
     const bool home = IsDirUserHome(share, nullptr) == 1;
@@ -110,6 +148,7 @@ int RunPrivilege(const Invocation &inv) {
     data["path"] = path;
     data["real_path"] = realPath;
     data["real_path_exists"] = exists;
+    data["link"] = reach == Reach::kLink ? Json::Value(linkTarget) : Json::Value(Json::nullValue);
     data["share"] = share;
     data["home"] = home;
     data["privilege"] = home ? Json::Value(Json::nullValue) : Json::Value(answer.privilege);
@@ -124,6 +163,9 @@ int RunPrivilege(const Invocation &inv) {
     TextTable text;
     text.Row("user", userName + (sid != nullptr ? " (sid " + std::string(sid) + ")" : ""));
     text.Row("real path", realPath + (exists ? "" : " (does not exist)"));
+    if (reach == Reach::kLink) {
+        text.Row("type", "symbolic link to " + TerminalSafe(linkTarget) + " (not followed)");
+    }
     if (home) {
         text.Row("share", share + " (the user's home folder: no share privilege)");
     } else {

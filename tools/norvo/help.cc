@@ -3,6 +3,8 @@
 #include <algorithm>
 #include <string>
 
+#include "args.h"
+
 namespace norvo::cli {
 namespace {
 
@@ -11,8 +13,14 @@ constexpr char kOutputNote[] =
     "  Aligned text by default. With --json, one JSON object on stdout:\n"
     "    {\"success\":true,\"data\":{...}}\n"
     "    {\"success\":false,\"error\":{\"code\":408,\"key\":\"error:error_no_path\"}}\n"
-    "  In text, a failure prints \"error 408 (error:error_no_path)\" on stderr. Names that are not\n"
-    "  valid UTF-8 show each bad byte as U+FFFD in JSON and as \\xNN in text.\n"
+    "  In text, a failure prints \"error 408 (error:error_no_path)\" on stderr.\n"
+    "names:\n"
+    "  Text shows names and paths in the escaped form: \\xNN for each byte of malformed UTF-8\n"
+    "  and of control, format (bidi, zero-width) and line-separator characters, and \\\\ for a\n"
+    "  backslash that would otherwise begin an escape; ordinary names are unchanged. JSON\n"
+    "  strings are valid UTF-8 (a bad byte becomes U+FFFD); a member whose value was not gets a\n"
+    "  sibling \"<key>_escaped\" with the escaped form.\n"
+    "  --escaped makes a command read its paths in that form.\n"
     "exit status:\n"
     "  0 success; 1 the library (or the system) refused or failed, with its code and key;\n"
     "  2 wrong command line (message on stderr, nothing asked).\n";
@@ -38,7 +46,7 @@ void PrintRows(std::ostream &out, const std::vector<std::pair<std::string, std::
 }  // namespace
 
 void PrintUsageLine(std::ostream &out, const CommandDef &command) {
-    out << "usage: norvo " << command.name << " [--json]";
+    out << "usage: norvo " << command.name << " [--json]" << (TakesPaths(command) ? " [--escaped]" : "");
     for (const OptionDef &option : command.options) {
         out << ' ' << (option.required ? "" : "[") << OptionLabel(option) << (option.required ? "" : "]");
     }
@@ -64,6 +72,9 @@ void PrintCommandHelp(std::ostream &out, const CommandDef &command) {
         rows.emplace_back(OptionLabel(option), std::string(option.help) + (option.required ? " (required)" : ""));
     }
     rows.emplace_back("--json", "print one JSON object instead of text");
+    if (TakesPaths(command)) {
+        rows.emplace_back("--escaped", "paths are in the escaped form norvo prints (\\\\, \\xNN): see names");
+    }
     rows.emplace_back("-h, --help", "show this help");
     out << "\noptions:\n";
     PrintRows(out, rows);

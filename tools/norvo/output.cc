@@ -2,39 +2,56 @@
 
 #include <algorithm>
 #include <iostream>
+#include <string_view>
+#include <utility>
+#include <vector>
 
 #include "exit_status.h"
 #include "help.h"
+#include "json_text.h"
 #include "norvo/errors.h"
 #include "text_safe.h"
 
 namespace norvo::cli {
 namespace {
 
-Json::Value Utf8Clean(const Json::Value &value) {
-    switch (value.type()) {
-    case Json::stringValue:
-        return Json::Value(ValidUtf8(value.asString()));
-    case Json::arrayValue: {
-        Json::Value out(Json::arrayValue);
-        for (const Json::Value &item : value) {
-            out.append(Utf8Clean(item));
-        }
-        return out;
-    }
-    case Json::objectValue: {
-        Json::Value out(Json::objectValue);
-        for (const std::string &key : value.getMemberNames()) {
-            out[ValidUtf8(key)] = Utf8Clean(value[key]);
-        }
-        return out;
-    }
-    default:
-        return value;
-    }
-}
+constexpr char kEscapedSuffix[] = "_escaped";
 
 }  // namespace
+
+void MakeJsonSafe(Json::Value &value) {
+    if (value.isArray()) {
+        for (Json::Value &item : value) {
+            if (item.isString() && !IsValidUtf8(item.asString())) {
+                item = ValidUtf8(item.asString());
+            } else if (!item.isString()) {
+                MakeJsonSafe(item);
+            }
+        }
+        return;
+    }
+    if (!value.isObject()) {
+        return;
+    }
+    std::vector<std::pair<std::string, std::string>> siblings;  // added after the walk
+    for (auto member = value.begin(); member != value.end(); ++member) {
+        if (!member->isString()) {
+            MakeJsonSafe(*member);
+            continue;
+        }
+        const char *begin = nullptr;
+        const char *end = nullptr;
+        member->getString(&begin, &end);
+        const std::string_view text(begin, static_cast<size_t>(end - begin));
+        if (!IsValidUtf8(text)) {
+            siblings.emplace_back(member.name() + kEscapedSuffix, TerminalSafe(text));
+            *member = ValidUtf8(text);  // last: text points into the member
+        }
+    }
+    for (auto &[key, form] : siblings) {
+        value[key] = std::move(form);
+    }
+}
 
 TextTable &TextTable::Row(std::string label, std::string value) {
     entries_.push_back({true, std::move(label), std::move(value)});
@@ -62,12 +79,41 @@ void TextTable::Print(std::ostream &out) const {
 }
 
 std::string WriteJson(const Json::Value &value) {
-    Json::StreamWriterBuilder builder;
-    builder["indentation"] = "";  // one line: easy to grep and to split
-    // With the strings already valid, this escapes every non-ASCII character: the output is
-    // plain ASCII whatever the names hold.
-    builder["emitUTF8"] = false;
-    return Json::writeString(builder, Utf8Clean(value));
+    Json::Value safe = value;
+    MakeJsonSafe(safe);
+    std::string text;
+    AppendJson(text, safe);
+    return text;
+}
+
+JsonPageWriter::JsonPageWriter(std::ostream &out, Json::UInt64 total, int offset) : out_(out) {
+    // The frame is written around an empty list, so the page comes out in exactly the bytes
+    // of the whole tree written at once.
+    Json::Value root(Json::objectValue);
+    root["success"] = true;
+    root["data"]["total"] = total;
+    root["data"]["offset"] = offset;
+    root["data"]["files"] = Json::Value(Json::arrayValue);
+    const std::string frame = WriteJson(root);
+    static constexpr char kList[] = "\"files\":[]";
+    const size_t split = frame.find(kList) + sizeof kList - 2;
+    out_ << frame.substr(0, split);
+    tail_ = frame.substr(split);
+}
+
+void JsonPageWriter::Entry(Json::Value &entry) {
+    MakeJsonSafe(entry);
+    text_.clear();
+    if (!first_) {
+        text_ += ',';
+    }
+    first_ = false;
+    AppendJson(text_, entry);
+    out_.write(text_.data(), static_cast<std::streamsize>(text_.size()));
+}
+
+void JsonPageWriter::Finish() {
+    out_ << tail_ << '\n';
 }
 
 Json::Value ErrorJson(int code) {

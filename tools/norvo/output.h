@@ -45,7 +45,32 @@ int ReportLibraryFailure(const Invocation &inv, const std::string &message = std
 // The message and the usage line on stderr, in text whatever --json says; returns kExitUsage.
 int ReportUsageError(const CommandDef *command, const std::string &message);
 
-// The JSON text of value with every string made valid UTF-8, written as ASCII.
+// The JSON text of value, one line of plain ASCII (AppendJson), made safe by MakeJsonSafe.
 std::string WriteJson(const Json::Value &value);
+
+// Makes every string of value valid UTF-8 (malformed bytes become U+FFFD) and gives each
+// object member whose string was not valid UTF-8 a sibling "<key>_escaped" holding the exact
+// bytes in the escaped form (TerminalSafe), which the --escaped option of the subcommands
+// takes back. Strings inside arrays get no such sibling.
+void MakeJsonSafe(Json::Value &value);
+
+// Writes the answer {"success":true,"data":{"total":N,"offset":N,"files":[...]}} entry by
+// entry, in the same bytes as WriteJson of the whole tree: a long listing needs no tree.
+class JsonPageWriter {
+public:
+    JsonPageWriter(std::ostream &out, Json::UInt64 total, int offset);
+    JsonPageWriter(const JsonPageWriter &) = delete;
+    JsonPageWriter &operator=(const JsonPageWriter &) = delete;
+    // Writes entry (made safe in place) as the next element of "files".
+    void Entry(Json::Value &entry);
+    // Closes the list and the object and ends the line.
+    void Finish();
+
+private:
+    std::ostream &out_;
+    std::string tail_;
+    std::string text_;  // one entry's text, kept for its capacity
+    bool first_ = true;
+};
 
 }  // namespace norvo::cli

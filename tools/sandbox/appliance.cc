@@ -5,6 +5,7 @@
 #include <signal.h>
 #include <sys/wait.h>
 #include <syslog.h>
+#include <time.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -45,6 +46,25 @@ constexpr const char kNsswitch[] =
 
 const char *YesNo(bool value) { return value ? "yes" : "no"; }
 
+// How long the destructor waits for the process's other threads to let go of its file-system
+// context.
+constexpr int kReturnMilliseconds = 10000;
+
+// Whether an appliance is alive in this process: a second one would be built inside it.
+bool g_applianceAlive = false;
+
+// setns refuses (EINVAL) while another thread shares the file-system context, and a thread
+// just joined may still hold it: the kernel wakes the joiner before the thread has let go.
+void ReturnToNamespace(int ns, const std::string &cwd) {
+    for (int waited = 0; setns(ns, CLONE_NEWNS) != 0; ++waited) {
+        if (errno != EINVAL || waited >= kReturnMilliseconds)
+            FailErrno("can't return to the host's mount namespace (is a thread still running?)");
+        timespec delay{0, 1000000L};
+        nanosleep(&delay, nullptr);
+    }
+    if (chdir(cwd.c_str()) != 0 && chdir("/") != 0) FailErrno("can't enter / on the host");
+}
+
 }  // namespace
 
 struct Appliance::Impl {
@@ -68,12 +88,14 @@ struct Appliance::Impl {
 };
 
 Appliance::Appliance() : impl_(new Impl) {
+    if (g_applianceAlive) Fail("one appliance at a time: the previous one is still alive");
+    g_applianceAlive = true;
     impl_->hostNamespace = UniqueFd(open("/proc/self/ns/mnt", O_RDONLY | O_CLOEXEC));
     if (!impl_->hostNamespace) FailErrno("can't open the current mount namespace");
     char cwd[PATH_MAX];
     impl_->hostCwd = getcwd(cwd, sizeof cwd) != nullptr ? cwd : "/";
 
-    EnterPrivateRoot();
+    EnterPrivateRoot({NORVO_SOURCE_DIR, NORVO_BINARY_DIR});
     WriteWholeFile("/etc/nsswitch.conf", kNsswitch, 0, 0, 0644);
     impl_->accounts.Write();
     for (KeyValueFile *file : {&impl_->settings, &impl_->defaults, &impl_->privileges}) file->Write();
@@ -87,10 +109,9 @@ Appliance::~Appliance() {
     impl_->servers.clear();
     impl_->capture.reset();
     closelog();
-    // setns needs the process's file-system context unshared: the capture's thread is gone.
-    if (setns(impl_->hostNamespace.get(), CLONE_NEWNS) != 0 || chdir(impl_->hostCwd.c_str()) != 0)
-        perror("norvo sandbox: can't return to the host's mount namespace");
+    ReturnToNamespace(impl_->hostNamespace.get(), impl_->hostCwd);
     delete impl_;
+    g_applianceAlive = false;
 }
 
 Appliance &Appliance::Basic() {

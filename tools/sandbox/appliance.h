@@ -1,7 +1,7 @@
 // A throwaway appliance for tests: a private mount namespace with tmpfs volumes, private
 // settings locations, private passwd/group/shadow, and a syslog socket that captures every
-// line the code under test logs. Nothing of the host changes; everything vanishes with the
-// process.
+// line the code under test logs. The host is read-only inside, but for the project's source and
+// build trees, which every appliance user can reach; everything else vanishes with the process.
 #pragma once
 
 #include <sys/types.h>
@@ -62,10 +62,12 @@ public:
     // Enters a private mount namespace and builds an empty appliance: tmpfs volumes /volume1 and
     // /volume2 (read-write), private /etc (users root and the "administrators" and "users"
     // groups), /etc.defaults, /usr/quib/etc, /tmp, and the syslog capture on /dev/log.
-    // One appliance at a time per process (each test runs in its own). Aborts on failure.
+    // One appliance at a time per process; several in turn are fine. Aborts on failure.
     Appliance();
-    // Stops the FUSE servers and returns the process to the mount namespace it came from; the
-    // appliance's namespace and everything in it vanish with its last process.
+    // Stops the FUSE servers and returns the process to the mount namespace and working
+    // directory it came from; the appliance's namespace and everything in it vanish with its
+    // last process. Threads the caller started must have ended (it waits up to 10 s for them to
+    // let go of the process's file-system context, then aborts).
     ~Appliance();
     Appliance(const Appliance &) = delete;
     Appliance &operator=(const Appliance &) = delete;

@@ -9,11 +9,14 @@
 #include <sys/syscall.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <climits>
+#include <cstdlib>
 #include <memory>
 #include <string>
 #include <utility>
+#include <vector>
 
 #include "fail.h"
 #include "fs_util.h"
@@ -64,15 +67,12 @@ void CopySymlink(const std::string &hostPath, const std::string &target) {
     if (symlink(link, target.c_str()) != 0) FailErrno("can't create the link %s", target.c_str());
 }
 
-// Files of the appliance's own that a host might happen to hold: the overlay hides them.
-const char *const kApplianceTmpFiles[] = {"quib_login.db", "quib_login.db-journal"};
-
-template <size_t N>
-void HideHostFiles(const std::string &dir, const char *const (&names)[N]) {
-    for (const char *name : names) {
-        const std::string path = dir + "/" + name;
-        if (unlink(path.c_str()) != 0 && errno != ENOENT) FailErrno("can't hide %s", path.c_str());
-    }
+// Recursively: mount_setattr reaches the mounts below path, which a bind remount would not.
+void MakeReadOnly(const std::string &path) {
+    mount_attr attr{};
+    attr.attr_set = MOUNT_ATTR_RDONLY;
+    if (mount_setattr(AT_FDCWD, path.c_str(), AT_RECURSIVE, &attr, sizeof attr) != 0)
+        FailErrno("can't make %s read-only", path.c_str());
 }
 
 // The host's directory seen through an overlay whose upper layer is on the private root, so
@@ -122,6 +122,55 @@ void BuildDev(const std::string &dev) {
     }
 }
 
+// A host tree kept reachable: its real path, and the directory opened before the new root
+// hides the host's paths.
+struct ReachableTree {
+    std::string path;
+    UniqueFd fd;
+};
+
+std::vector<ReachableTree> OpenReachableTrees(const std::vector<std::string> &paths) {
+    std::vector<ReachableTree> trees;
+    for (const std::string &path : paths) {
+        const std::unique_ptr<char, void (*)(void *)> real(realpath(path.c_str(), nullptr), free);
+        if (!real || std::string(real.get()) == "/") continue;  // a tree moved away stays out
+        ReachableTree tree{real.get(), UniqueFd(open(real.get(), O_PATH | O_DIRECTORY | O_CLOEXEC))};
+        if (!tree.fd) FailErrno("can't open %s", real.get());
+        trees.push_back(std::move(tree));
+    }
+    // A tree inside another one comes with it.
+    std::sort(trees.begin(), trees.end(),
+              [](const auto &a, const auto &b) { return a.path.size() < b.path.size(); });
+    std::vector<ReachableTree> outermost;
+    for (ReachableTree &tree : trees) {
+        const auto inside = [&tree](const ReachableTree &outer) {
+            return tree.path == outer.path || tree.path.rfind(outer.path + "/", 0) == 0;
+        };
+        if (std::none_of(outermost.begin(), outermost.end(), inside)) outermost.push_back(std::move(tree));
+    }
+    return outermost;
+}
+
+// Binds the host's tree, writable, at its own path under newRoot, and lets every user reach it:
+// a directory on the way that others can't search (a home such as /root, 0700) is covered by a
+// tmpfs holding only the way on, so the rest of it stays out of reach, root's included.
+void MountReachable(const std::string &newRoot, const ReachableTree &tree) {
+    for (size_t slash = tree.path.find('/', 1);; slash = tree.path.find('/', slash + 1)) {
+        const std::string target = newRoot + tree.path.substr(0, slash);
+        struct stat st {};
+        if (lstat(target.c_str(), &st) != 0) {
+            MakeDir(target, 0755);  // on a tmpfs of the appliance's (/tmp, or one made here)
+        } else if (!S_ISDIR(st.st_mode)) {
+            Fail("can't reach %s: %s is not a directory", tree.path.c_str(), target.c_str());
+        } else if ((st.st_mode & S_IXOTH) == 0 && slash != std::string::npos) {
+            Mount("tmpfs", target, "tmpfs", 0, "mode=0755");
+        }
+        if (slash == std::string::npos) break;
+    }
+    const std::string source = "/proc/self/fd/" + std::to_string(tree.fd.get());
+    Mount(source.c_str(), newRoot + tree.path, nullptr, MS_BIND | MS_REC, nullptr);
+}
+
 bool IsVolumeName(const std::string &name) { return name.rfind("volume", 0) == 0; }
 
 // Fills newRoot with the host's top-level entries, each in the form the appliance needs.
@@ -142,10 +191,7 @@ void PopulateRoot(const std::string &newRoot) {
         } else if (name == "etc" || name == "usr") {
             MountOverlay(host, newRoot);
         } else if (name == "tmp") {
-            // An overlay, not a fresh tmpfs: programs built under the host's /tmp (a CI clone)
-            // must stay reachable, while whatever the appliance writes there stays private.
-            MountOverlay(host, newRoot);
-            HideHostFiles(target, kApplianceTmpFiles);
+            MountTmpfs(target, "1777");
         } else if (name == "run" || name == "etc.defaults") {
             // /run fresh too: a host nscd or sssd socket there would answer for the host's users.
             MountTmpfs(target, "0755");
@@ -153,8 +199,13 @@ void PopulateRoot(const std::string &newRoot) {
             BuildDev(target);
         } else if (host == kNewRoot) {
             MakeDir(target, 0755);
-        } else if (S_ISDIR(st.st_mode) || S_ISREG(st.st_mode)) {
+        } else if (name == "proc") {
             BindInto(host, target);
+        } else if (S_ISDIR(st.st_mode) || S_ISREG(st.st_mode)) {
+            // Read-only: the appliance may read the host's programs and data (/var, /opt, a
+            // checkout...) but must not change them.
+            BindInto(host, target);
+            MakeReadOnly(target);
         }
     }
     struct stat st {};
@@ -170,7 +221,7 @@ void MountTmpfs(const std::string &path, const char *mode) {
     Mount("tmpfs", path, "tmpfs", 0, options.c_str());
 }
 
-void EnterPrivateRoot() {
+void EnterPrivateRoot(const std::vector<std::string> &reachable) {
     if (geteuid() != 0) Fail("the appliance needs root (it mounts file systems in a private namespace)");
     char cwd[PATH_MAX];
     const bool haveCwd = getcwd(cwd, sizeof cwd) != nullptr;
@@ -179,10 +230,12 @@ void EnterPrivateRoot() {
     // Private before anything else, so no mount below can propagate back to the host.
     Mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr);
 
+    const std::vector<ReachableTree> trees = OpenReachableTrees(reachable);
     const std::string newRoot = kNewRoot;
     Mount("tmpfs", newRoot, "tmpfs", 0, "mode=0755");
     MakeDir(newRoot + kStateDir, 0700);
     PopulateRoot(newRoot);
+    for (const ReachableTree &tree : trees) MountReachable(newRoot, tree);
 
     // pivot_root(".", ".") stacks the old root on the new one; detaching it leaves the new root.
     if (chdir(newRoot.c_str()) != 0) FailErrno("can't enter %s", newRoot.c_str());

@@ -1,0 +1,140 @@
+// The application privilege file fails closed: damage to the value of an intact line (a
+// control byte, a stray quote, a byte that breaks UTF-8) never grants a user a privilege the
+// intact line did not. The input builds the intact file and then chooses the damage; the raw
+// input is also decided on as a whole file, where only "no crash" is asked.
+#include <stddef.h>
+#include <stdint.h>
+#include <stdlib.h>
+
+#include <map>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "app_privilege.h"
+#include "name_list.h"
+#include "settings_format.h"
+
+namespace {
+
+using norvo::platform::ListMatcher;
+using norvo::platform::ParseSettings;
+using norvo::platform::PrivilegeVerdict;
+
+// Host accounts every Linux has ("root", group "root"), and names NSS does not know.
+const char *const kUsers[] = {"root", "alice", "carol"};
+const char *const kHolders[] = {"root", "alice", "carol", "@root", "!root", "!carol", "!@root", "\"@CORP\\domain users\""};
+const char *const kPrivileges[] = {"P.One", "P.Two"};
+
+class Input {
+public:
+    Input(const uint8_t *data, size_t size) : data_(data), size_(size) {}
+    uint8_t Byte() { return pos_ < size_ ? data_[pos_++] : 0; }
+    bool Empty() const { return pos_ >= size_; }
+
+private:
+    const uint8_t *data_;
+    size_t size_;
+    size_t pos_ = 0;
+};
+
+// A byte that damages: a control character (tab and line breaks aside), DEL, a double quote
+// (the quote of holder lists), or a lone byte above 0x7F. A single quote is not: inside a
+// holder it is an ordinary character.
+char DamageByte(uint8_t pick) {
+    static const std::string alphabet = [] {
+        std::string bytes;
+        for (int c = 0; c < 0x20; ++c) {
+            if (c != '\t' && c != '\n' && c != '\r') bytes += static_cast<char>(c);
+        }
+        bytes += "\x7f\"";
+        for (int c = 0x80; c <= 0xFF; c += 9) bytes += static_cast<char>(c);
+        return bytes;
+    }();
+    return alphabet[pick % alphabet.size()];
+}
+
+// The quoted form the writers produce, escaping quotes and backslashes.
+std::string Quoted(const std::string &holders) {
+    std::string out = "\"";
+    for (char c : holders) {
+        if (c == '"' || c == '\\') out += '\\';
+        out += c;
+    }
+    return out + "\"";
+}
+
+struct Text {
+    std::string text;
+    std::vector<std::pair<size_t, size_t>> values;  // where each value lies in text
+};
+
+Text IntactFile(Input *in) {
+    Text out;
+    out.text = "# application privileges\n";
+    for (const char *privilege : kPrivileges) {
+        const uint8_t pick = in->Byte();
+        const uint8_t form = in->Byte();
+        std::string holders;
+        for (size_t h = 0; h < sizeof kHolders / sizeof *kHolders; ++h) {
+            if (pick & (1u << h)) holders += (holders.empty() ? "" : ",") + std::string(kHolders[h]);
+        }
+        std::string value;
+        switch (form % 3) {
+        case 0: value = Quoted(holders); break;
+        case 1: value = holders; break;  // bare
+        default: value = "'" + holders + "'";
+        }
+        out.text += std::string(privilege) + (form & 4 ? " = " : "=");
+        out.values.emplace_back(out.text.size(), value.size());
+        out.text += value + (form & 8 ? " # note\n" : "\n");
+    }
+    return out;
+}
+
+// At most one damaged byte per value: two quotes, or two high bytes, could be an edit.
+std::string Damage(const Text &intact, Input *in) {
+    std::map<size_t, std::pair<size_t, std::string>> edits;  // by start, applied back to front
+    while (!in->Empty() && !intact.values.empty()) {
+        const auto &[start, length] = intact.values[in->Byte() % intact.values.size()];
+        const size_t at = in->Byte() % (length + 1);
+        const uint8_t how = in->Byte();
+        if (edits.count(start) != 0) continue;
+        std::string value = intact.text.substr(start, length);
+        if ((how & 1) != 0 && at < length) {
+            value[at] = DamageByte(how >> 1);
+        } else {
+            value.insert(at, 1, DamageByte(how >> 1));
+        }
+        edits[start] = {length, value};
+    }
+    std::string text = intact.text;
+    for (auto it = edits.rbegin(); it != edits.rend(); ++it) {
+        text.replace(it->first, it->second.first, it->second.second);
+    }
+    return text;
+}
+
+int Verdict(const std::string &text, const char *privilege, const char *user) {
+    ListMatcher matcher(user);
+    return PrivilegeVerdict(ParseSettings(text), privilege, &matcher);
+}
+
+}  // namespace
+
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size);
+
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
+    const std::string raw(reinterpret_cast<const char *>(data), size);
+    for (const char *privilege : kPrivileges) (void)Verdict(raw, privilege, "root");
+
+    Input in(data, size);
+    const Text intact = IntactFile(&in);
+    const std::string damaged = Damage(intact, &in);
+    for (const char *privilege : kPrivileges) {
+        for (const char *user : kUsers) {
+            if (Verdict(damaged, privilege, user) == 1 && Verdict(intact.text, privilege, user) != 1) abort();
+        }
+    }
+    return 0;
+}

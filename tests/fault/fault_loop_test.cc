@@ -1,0 +1,379 @@
+// The fault loop: every exported operation that takes platform resources runs with its Nth
+// platform or system call failing (tools/faults), for N = 1, 2, ... until it runs through
+// untouched. After every run nothing it took is left (descriptors, platform records; memory is
+// LeakSanitizer's in the sanitized build), a reported failure has a code in the error slot, and
+// no file is left half-written; the untouched run must give the right answer.
+#include <dirent.h>
+#include <errno.h>
+#include <limits.h>
+#include <pwd.h>
+#include <string.h>
+#include <sys/stat.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <fstream>
+#include <functional>
+#include <map>
+#include <sstream>
+
+#include <gtest/gtest.h>
+
+#include "appliance.h"
+#include "faults.h"
+#include "norvo/norvo.h"
+#include "quib_fs.h"
+#include "quib_login.h"
+#include "quib_paths.h"
+#include "quib_user.h"
+#include "vlibc_err.h"
+#include "vlibc_file.h"
+
+namespace {
+
+using norvo::testing::Appliance;
+namespace fs = std::filesystem;
+
+// What one run of an operation gave.
+enum Outcome {
+    kRight,   // succeeded with the expected answer
+    kFailed,  // reported failure: the error slot must say why
+    kOther,   // succeeded with another answer (acceptable only while a call was made to fail)
+};
+
+Outcome Expect(bool ok, bool right) {
+    return !ok ? kFailed : right ? kRight : kOther;
+}
+
+// Where an operation says why it failed. ACLAccess (and so NvoCheckPath) leaves a platform
+// failure it has no code for in the platform's slot only, intended; some answer 0 without a slot.
+enum Slot { kLibrarySlot, kPlatformSlot, kEitherSlot, kNoSlot };
+
+struct Op {
+    Op(const char *n, std::function<Outcome()> r, Slot s = kLibrarySlot, std::function<void()> p = nullptr,
+       std::function<std::string()> t = nullptr)
+        : name(n), run(std::move(r)), slot(s), prepare(std::move(p)), torn(std::move(t)) {}
+    const char *name;
+    std::function<Outcome()> run;  // the call is made before its answer is looked at
+    Slot slot;
+    std::function<void()> prepare;      // before each run: the state the run starts from
+    std::function<std::string()> torn;  // after each run: what is left half-written, or ""
+};
+
+void PrintTo(const Op &op, std::ostream *out) {
+    *out << op.name;
+}
+
+// Open descriptors with what they name, without the one reading the list.
+std::map<int, std::string> OpenDescriptors() {
+    std::map<int, std::string> open;
+    DIR *dir = opendir("/proc/self/fd");
+    while (const dirent *entry = readdir(dir)) {
+        const int fd = atoi(entry->d_name);
+        char target[PATH_MAX] = "";
+        if (entry->d_name[0] != '.' && fd != dirfd(dir) &&
+            readlink(("/proc/self/fd/" + std::string(entry->d_name)).c_str(), target, sizeof target - 1) >= 0) {
+            open[fd] = target;
+        }
+    }
+    closedir(dir);
+    return open;
+}
+
+std::string Read(const std::string &path) {
+    std::ifstream in(path, std::ios::binary);
+    std::stringstream text;
+    text << in.rdbuf();
+    return text.str();
+}
+
+void Write(const std::string &path, const std::string &text) {
+    std::ofstream(path, std::ios::binary | std::ios::trunc) << text;
+}
+
+// Temporaries a settings writer left beside file.
+std::string Leftovers(const std::string &file) {
+    const fs::path path(file);
+    std::string left;
+    for (const auto &entry : fs::directory_iterator(path.parent_path())) {
+        if (entry.path().filename().string().rfind("." + path.filename().string() + ".", 0) == 0) {
+            left += entry.path().string() + " ";
+        }
+    }
+    return left;
+}
+
+// A settings file must be the old or the new version, whole, with no temporary beside it.
+// The versions are the appliance's settings with or without a line of ours.
+std::string g_settings;
+std::function<std::string()> OldOrNew(std::string before, std::string after) {
+    return [=] {
+        const std::string text = Read(QUIB_INFO_CONF);
+        return (text == g_settings + before || text == g_settings + after ? "" : "torn text: " + text) +
+               Leftovers(QUIB_INFO_CONF);
+    };
+}
+
+const std::string kDir = "/volume1/public/dir";
+char g_sid[64];
+bool g_created;
+
+void Login(const char *user) {
+    ASSERT_EQ(QUIBLoginCreate(user, "secret", "192.0.2.1", g_sid, sizeof g_sid), 0);
+}
+
+std::string Names(const std::list<DIRENTRY_INFO> &entries) {
+    std::string names;
+    for (const DIRENTRY_INFO &entry : entries) {
+        names += entry.name + " ";
+    }
+    return names;
+}
+
+const Op kOps[] = {
+    {"DirListing",
+     [] {
+         NvoEnum enumeration;
+         std::list<DIRENTRY_INFO> out;
+         unsigned long total = 0;
+         const int rc = enumeration.NvoLibDirEntryListEnum("/public/dir", kDir.c_str(), "name", 0xFF, 0, 0, true,
+                                                           DIR_ENTRY_TYPE_ALL, {}, out, &total);
+         return Expect(rc == 1, total == 2 && Names(out) == "sub a.txt ");
+     }},
+    {"ShareListing",
+     [] {
+         NvoEnum enumeration;
+         std::list<DIRENTRY_INFO> out;
+         unsigned long total = 0;
+         const int rc = enumeration.NvoLibShareEntryListEnum("alice", nullptr, false, "name", 0x1FF, 0, 0, true, out,
+                                                             &total);
+         return Expect(rc == 1, Names(out) == "home photo public secret ");
+     }},
+    {"Privilege",
+     [] {
+         int priv = -1;
+         unsigned flags = 99;
+         const bool ok = NvoLibGetPrivilege("/photo/a", "bob", nullptr, &priv, &flags) == 0;
+         return Expect(ok, priv == 1 && flags == 0);
+     }},
+    {"DomainPrivilege",  // asked through the platform with the login's sid
+     [] {
+         int priv = -1;
+         unsigned flags = 99;
+         const bool ok = NvoLibGetPrivilege("/public/a", "CORP\\dave", g_sid, &priv, &flags) == 0;
+         return Expect(ok, priv == 2 && flags == 0);
+     },
+     kLibrarySlot, [] { g_sid[0] == '\0' ? Login("CORP\\dave") : void(); }},
+    {"ValidShares",
+     [] {
+         PSZLIST list = NvoLibValidShareGen("alice", 1, 0);
+         const bool right = VLIBCSzListCount(list) == 3;
+         VLIBCSzListFree(list);
+         return Expect(list != nullptr, right);
+     }},
+    {"ShareChecks",
+     [] {
+         int type = 1;
+         const bool ok = CheckShareListPrivilege("bob", nullptr, "/photo/a") == 1 &&
+                         CheckShareDownloadPrivilege("bob", nullptr, "/photo/a") == 1 &&
+                         CheckShareUploadPrivilege("alice", nullptr, "/photo/a", &type) == 1;
+         return Expect(ok, type == 1);
+     },
+     kNoSlot},
+    {"EncryptedShare",
+     [] {
+         bool encrypted = false;
+         const bool ok = NvoLibCheckEncryptShare("secret", &encrypted) == 1;
+         return Expect(ok, encrypted);
+     }},
+    {"AclChecks",
+     [] {
+         const bool ok = ACLAccess((kDir + "/a.txt").c_str(), 0x1 | 0x2) == 0 && CheckDirListPrivilege(kDir.c_str()) == 1;
+         const unsigned rootOnFile = ACL_PERM_ALL & ~(ACL_PERM_EXECUTE | ACL_PERM_DELETE_CHILD);
+         return Expect(ok, GetACLPrivilege((kDir + "/a.txt").c_str()) == rootOnFile &&
+                               NvoLibFileSystemSupported(kDir.c_str()) == 1);
+     },
+     kEitherSlot},
+    {"FullPath",
+     [] {
+         std::string full, share, volume, sharePath;
+         const bool ok = NvoFullPathGet("/photo/a", full, share, volume, sharePath, "alice") == 1;
+         return Expect(ok, full == "/volume1/photo/a" && share == "photo" && sharePath == "/volume1/photo");
+     }},
+    {"HomePath",
+     [] {
+         std::string full, share, volume, sharePath;
+         const bool ok = NvoFullPathGet("/home/a", full, share, volume, sharePath, "alice") == 1;
+         return Expect(ok, full == "/volume1/homes/alice/a" && fs::is_directory("/volume1/homes/alice"));
+     },
+     kLibrarySlot, [] { fs::remove_all("/volume1/homes/alice"); },
+     [] {
+         // A home is never left behind with another owner or mode.
+         struct stat st;
+         if (stat("/volume1/homes/alice", &st) != 0 ||
+             (st.st_uid == getpwnam("alice")->pw_uid && (st.st_mode & 07777) == 0755)) {
+             return std::string();
+         }
+         return "home of uid " + std::to_string(st.st_uid) + ", mode " + std::to_string(st.st_mode & 07777);
+     }},
+    {"PathInfo",
+     [] {
+         PathInfo info;
+         const bool ok = PathInfoFactory::create("alice", "/public/dir", info) == 1;
+         return Expect(ok, info.fullPath == kDir);
+     }},
+    {"TransFullPath",
+     [] {
+         char out[256] = "";
+         const bool ok = NvoLibTransFullPath("/photo/a", out, sizeof out) == 0;
+         return Expect(ok, std::string(out) == "/volume1/photo/a");
+     },
+     kPlatformSlot},
+    {"CheckPath",
+     [] {
+         std::string existing;
+         const bool ok = NvoCheckPath((kDir + "/new/deeper").c_str(), true, 0x2, &existing) == 0;
+         return Expect(ok, existing == kDir);
+     },
+     kEitherSlot},
+    {"TmpDir",
+     [] {
+         const bool ok = NvoCreateTmpDir("/volume1") == 0;
+         return Expect(ok, fs::is_directory("/volume1/@tmp/norvo"));
+     },
+     kNoSlot, [] { fs::remove_all("/volume1/@tmp"); }},
+    {"SettingsSet",
+     [] { return Expect(VLIBCFileSetKeyValue(QUIB_INFO_CONF, "fault", "new", 0) == 0, true); }, kPlatformSlot,
+     [] { Write(QUIB_INFO_CONF, g_settings); }, OldOrNew("", "fault=\"new\"\n")},
+    {"SettingsRemove", [] { return Expect(VLIBCFileRemoveKey(QUIB_INFO_CONF, "fault") == 0, true); }, kPlatformSlot,
+     [] { Write(QUIB_INFO_CONF, g_settings + "fault=\"old\"\n"); }, OldOrNew("fault=\"old\"\n", "")},
+    {"SettingsRead",
+     [] {
+         char value[8] = "";
+         const bool ok = VLIBCFileGetKeyValue(QUIB_INFO_CONF, "userHomeEnable", value, sizeof value, 0) > 0 &&
+                         VLIBCFileCheckKeyValue(QUIB_INFO_CONF, "userHomeEnable", "yes", 0) == 1 &&
+                         VLIBUserPrivilegeHas("alice", "QUIB.Fault.Loop") == 1;
+         return Expect(ok, std::string(value) == "yes");
+     },
+     kPlatformSlot},
+    {"LoginCreate",
+     [] {
+         g_sid[0] = '\0';
+         g_created = QUIBLoginCreate("alice", "secret", "192.0.2.1", g_sid, sizeof g_sid) == 0;
+         return Expect(g_created, true);
+     },
+     kPlatformSlot, nullptr,
+     [] {
+         // A login that was made is whole; one that failed left nothing.
+         char user[64] = "";
+         const bool found = g_sid[0] != '\0' && QUIBLoginGet(g_sid, user, sizeof user) == 0;
+         return found == g_created && (!found || std::string(user) == "alice") ? "" : "login: '" + std::string(user) + "'";
+     }},
+    {"LoginLookup",
+     [] {
+         char user[64] = "";
+         const bool ok = QUIBLoginGet(g_sid, user, sizeof user) == 0 && QUIBLoginRemove(g_sid) == 0;
+         return Expect(ok, std::string(user) == "alice");
+     },
+     kPlatformSlot, [] { Login("alice"); }},
+    {"Conditions",
+     [] {
+         std::vector<FileSearch::FindComp *> out;
+         bool ok = true;
+         for (auto [field, value] : {std::pair{FileSearch::FindFactory::FIND_FIELD_USER, "alice"},
+                                     {FileSearch::FindFactory::FIND_FIELD_GROUP, "staff"},
+                                     {FileSearch::FindFactory::FIND_FIELD_NAME, "a*,\"b\",c"}}) {
+             ok = ok && FileSearch::FindFactory::createFindOp(field, nullptr, value, out);
+         }
+         const size_t made = out.size();
+         for (FileSearch::FindComp *condition : out) {
+             delete condition;
+         }
+         return Expect(ok, made == 3);
+     }},
+    {"Accounts",
+     [] {
+         NvoEnum enumeration;
+         std::map<unsigned, _tag_USER_INFO_> users;
+         std::map<unsigned, _tag_GROUP_INFO_> groups;
+         std::list<unsigned> gids;
+         const bool ok = enumeration.EnumAllUsers(users, AUTH_ALL) == 1 &&
+                         enumeration.EnumAllGroups(groups, AUTH_ALL) == 1 &&
+                         enumeration.EnumUserGroups(gids, "alice") == 1;
+         const bool named = enumeration.UserEnum().GetUserNameByUID(0) == "root" &&
+                            enumeration.UserEnum().GetGroupNameByGID(0) == "root";
+         return Expect(ok, named && users.size() == 6 && groups.size() > 3 && gids.size() == 2);
+     },
+     kNoSlot},
+    {"MountStatus",
+     [] {
+         NorvoMountStatus mounts;
+         const bool ok = mounts.GetMountStatus() == 1;
+         return Expect(ok, mounts.getFSTYPE("/volume1") == FSTYPE_TMPFS);
+     },
+     kPlatformSlot},
+};
+
+// Runs op with call n failing with err for n = 1, 2, ... until a run gets through.
+void FaultLoop(const Op &op, int err) {
+    constexpr long kMaxCalls = 5000;
+    for (long n = 1; n <= kMaxCalls; ++n) {
+        if (op.prepare) {
+            op.prepare();
+        }
+        NvoLibSetErr(0);
+        VLIBCErrSetEx(0, nullptr, 0);
+        const auto fds = OpenDescriptors();
+        const auto records = norvo::faults::LiveRecords();
+        norvo::faults::Arm(n, err);
+        const Outcome outcome = op.run();
+        norvo::faults::Disarm();
+        const std::string failed = norvo::faults::Fired();
+        const int slot = op.slot == kPlatformSlot ? VLIBCErrGet()
+                         : op.slot == kEitherSlot ? NvoLibGetErr() | VLIBCErrGet()
+                                                  : NvoLibGetErr();
+        const std::string where =
+            "failing call " + std::to_string(n) + " (" + failed + ") with " + strerrorname_np(err);
+        ASSERT_EQ(OpenDescriptors(), fds) << where;
+        ASSERT_EQ(norvo::faults::LiveRecords(), records) << where;
+        if (op.torn) {
+            ASSERT_EQ(op.torn(), "") << where;
+        }
+        if (failed.empty()) {
+            ASSERT_EQ(outcome, kRight) << "the run without a failure (" << n - 1 << " calls)";
+            return;
+        }
+        if (outcome == kFailed && op.slot != kNoSlot) {
+            ASSERT_NE(slot, 0) << where << " left the error slot empty";
+        }
+    }
+    FAIL() << "still failing calls after " << kMaxCalls;
+}
+
+class Faults : public ::testing::TestWithParam<Op> {
+protected:
+    Appliance app_;
+};
+
+// ENOMEM stands for every failure; EACCES takes the branches where a refusal is an answer. (With
+// EIO a listing deliberately ends without a library code.)
+TEST_P(Faults, ReleaseEverythingAndSayWhy) {
+    app_.Basic().WriteFile(kDir + "/a.txt", "hello", "alice").MakeDir(kDir + "/sub");
+    app_.MakeDir("/volume1/homes/alice", "alice").SetDomain("CORP").AddUser("CORP\\dave");
+    app_.SetAppPrivilege("QUIB.Fault.Loop", "@staff");
+    g_settings = Read(QUIB_INFO_CONF);
+    g_sid[0] = '\0';
+    openlog(nullptr, LOG_NDELAY, LOG_USER);  // the log connection is the process's, not a run's
+    for (const int err : {ENOMEM, EACCES}) {
+        FaultLoop(GetParam(), err);
+        if (HasFatalFailure()) {
+            return;
+        }
+    }
+}
+
+INSTANTIATE_TEST_SUITE_P(Ops, Faults, ::testing::ValuesIn(kOps),
+                         [](const ::testing::TestParamInfo<Op> &param) { return std::string(param.param.name); });
+
+}  // namespace
