@@ -4,7 +4,6 @@
 //
 // Input: the Cookie header, a newline, the query string. The parsers see views of exactly the
 // input bytes, so a read past either end is an ASan report.
-// fuzz-sources: linux/cgi_request.cc
 #include <stddef.h>
 #include <stdint.h>
 #include <stdlib.h>

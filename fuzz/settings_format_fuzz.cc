@@ -6,7 +6,6 @@
 //
 // Input: the format digit ('0' quoted, '1' bare), the key, a newline, the value, a newline,
 // the file's text.
-// fuzz-sources: linux/settings_format.cc linux/text_util.cc
 #include <fcntl.h>
 #include <stddef.h>
 #include <stdint.h>
