@@ -31,8 +31,24 @@ std::string UnquoteSingle(std::string_view rest) {
                                                                         : close - 1));
 }
 
+// The keys a reader may ask for (VLIBCFileGetKeyValue and the others refuse the rest).
+bool IsAskableKey(std::string_view key) {
+    if (key.empty() || key.size() > kMaxSettingsKeyLength || !IsValidUtf8(key)) {
+        return false;
+    }
+    for (char c : key) {
+        if (static_cast<unsigned char>(c) < 0x20) {
+            return false;
+        }
+    }
+    return true;
+}
+
+// A line is read up to its first NUL, as a C reader of the file would read it, so every caller
+// (those handing keys and values on as C strings included) sees the same key and value.
 void ParseEntry(SettingsLine *line) {
-    std::string_view body = TrimSpace(line->text);
+    std::string_view body = line->text;
+    body = TrimSpace(body.substr(0, body.find('\0')));
     if (body.empty() || body.front() == '#') {
         return;
     }
@@ -41,8 +57,8 @@ void ParseEntry(SettingsLine *line) {
         return;  // malformed: kept as it is, never read as a key
     }
     std::string_view key = TrimSpace(body.substr(0, eq));
-    if (key.empty()) {
-        return;
+    if (!IsAskableKey(key)) {
+        return;  // no reader could ask for it, so no listing offers it either
     }
     std::string_view rest = TrimSpace(body.substr(eq + 1));
     line->isEntry = true;
