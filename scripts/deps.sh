@@ -3,7 +3,7 @@
 set -euo pipefail
 
 packages=(
-  cmake g++ clang make pkg-config binutils
+  cmake g++ clang clang-format make pkg-config binutils
   libjsoncpp-dev libicu-dev libsqlite3-dev libcrypt-dev libacl1-dev acl
   libfuse3-dev fuse3 fusefat dosfstools fuseiso genisoimage
   googletest libgtest-dev libgmock-dev libbenchmark-dev

@@ -13,6 +13,9 @@ if [ "$(id -u)" -ne 0 ]; then
 fi
 
 status=0
+echo "== formatting"
+bash scripts/format.sh --check || status=1
+
 echo "== plain build (gcc)"
 bash scripts/build.sh build -DNORVO_WERROR=ON -DCMAKE_BUILD_TYPE=RelWithDebInfo
 (cd build && ctest -j"$(nproc)" --output-on-failure) || status=1
