@@ -65,8 +65,8 @@ void OwnerNamesCached(benchmark::State &state) {
     }
     state.counters["nss_user_lookups"] = static_cast<double>(users);
     state.counters["nss_group_lookups"] = static_cast<double>(groups);
-    state.counters["per_lookup"] = benchmark::Counter(2.0 * kEntries, benchmark::Counter::kIsIterationInvariantRate |
-                                                                          benchmark::Counter::kInvert);
+    state.counters["per_lookup"] = benchmark::Counter(
+        2.0 * kEntries, benchmark::Counter::kIsIterationInvariantRate | benchmark::Counter::kInvert);
 }
 
 void OwnerNamesUncachedReference(benchmark::State &state) {
@@ -84,9 +84,8 @@ void OwnerNamesUncachedReference(benchmark::State &state) {
         lookups = g_userLookups.load() + g_groupLookups.load() - before;
     }
     state.counters["nss_lookups"] = static_cast<double>(lookups);
-    state.counters["per_lookup"] = benchmark::Counter(2.0 * kReferenceEntries,
-                                                      benchmark::Counter::kIsIterationInvariantRate |
-                                                          benchmark::Counter::kInvert);
+    state.counters["per_lookup"] = benchmark::Counter(
+        2.0 * kReferenceEntries, benchmark::Counter::kIsIterationInvariantRate | benchmark::Counter::kInvert);
 }
 
 BENCHMARK(OwnerNamesCached)->Unit(benchmark::kMillisecond);
@@ -95,14 +94,16 @@ BENCHMARK(OwnerNamesUncachedReference)->Unit(benchmark::kMillisecond);
 }  // namespace
 
 // Default visibility: the build hides symbols unless told, and a hidden one interposes nothing.
-extern "C" __attribute__((visibility("default"))) int getpwuid_r(uid_t uid, passwd *record, char *buffer, size_t size, passwd **result) {
+extern "C" __attribute__((visibility("default"))) int getpwuid_r(uid_t uid, passwd *record, char *buffer,
+                                                                 size_t size, passwd **result) {
     using Fn = int (*)(uid_t, passwd *, char *, size_t, passwd **);
     static const Fn next = Next<Fn>("getpwuid_r");
     g_userLookups.fetch_add(1);
     return next(uid, record, buffer, size, result);
 }
 
-extern "C" __attribute__((visibility("default"))) int getgrgid_r(gid_t gid, group *record, char *buffer, size_t size, group **result) {
+extern "C" __attribute__((visibility("default"))) int getgrgid_r(gid_t gid, group *record, char *buffer,
+                                                                 size_t size, group **result) {
     using Fn = int (*)(gid_t, group *, char *, size_t, group **);
     static const Fn next = Next<Fn>("getgrgid_r");
     g_groupLookups.fetch_add(1);

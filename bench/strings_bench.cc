@@ -24,13 +24,17 @@ std::vector<std::string> g_names;
 // Names as a photo and office share holds them: a word, a number, maybe a second word, and an
 // extension in either case; about one in six has multi-byte characters.
 std::vector<std::string> MakeNames() {
-    const std::vector<std::string> words = {
-        "IMG", "DSC", "Report", "report", "REPORT", "invoice", "Invoice", "budget", "Urlaub", "holiday",
-        "backup", "notes", "Meeting", "draft", "final", "scan", "photo", "video", "Screenshot", "summary"};
-    const std::vector<std::string> wide = {"r\xC3\xA9sum\xC3\xA9", "\xC3\x9C" "bersicht", "\xE5\x86\x99\xE7\x9C\x9F",
+    const std::vector<std::string> words = {"IMG",     "DSC",     "Report",  "report",     "REPORT",
+                                            "invoice", "Invoice", "budget",  "Urlaub",     "holiday",
+                                            "backup",  "notes",   "Meeting", "draft",      "final",
+                                            "scan",    "photo",   "video",   "Screenshot", "summary"};
+    const std::vector<std::string> wide = {"r\xC3\xA9sum\xC3\xA9",
+                                           "\xC3\x9C"
+                                           "bersicht",
+                                           "\xE5\x86\x99\xE7\x9C\x9F",
                                            "\xD0\x9E\xD1\x82\xD1\x87\xD1\x91\xD1\x82", "caf\xC3\xA9"};
-    const std::vector<std::string> exts = {"jpg", "JPG", "png", "pdf", "PDF", "docx", "xlsx", "mp4", "MOV", "txt",
-                                           "zip", "tar.gz", "heic"};
+    const std::vector<std::string> exts = {"jpg", "JPG", "png", "pdf", "PDF",    "docx", "xlsx",
+                                           "mp4", "MOV", "txt", "zip", "tar.gz", "heic"};
     const char separators[] = {'_', '-', ' ', '.'};
     std::mt19937 rng(42);
     const auto pick = [&rng](const auto &list) { return list[rng() % list.size()]; };
@@ -61,7 +65,9 @@ const Kind kKinds[] = {
     {"extension", "*.jpg"},
     {"mixed_case", "*InVoice*2021*"},
     {"question_marks", "IMG_????????.JPG"},
-    {"multi_byte", "*\xC3\xBC" "bersicht*"},
+    {"multi_byte",
+     "*\xC3\xBC"
+     "bersicht*"},
 };
 
 void Ours(benchmark::State &state, const char *pattern) {
@@ -73,8 +79,8 @@ void Ours(benchmark::State &state, const char *pattern) {
         }
     }
     state.counters["matched"] = static_cast<double>(matched);
-    state.counters["per_name"] =
-        benchmark::Counter(kNames, benchmark::Counter::kIsIterationInvariantRate | benchmark::Counter::kInvert);
+    state.counters["per_name"] = benchmark::Counter(
+        kNames, benchmark::Counter::kIsIterationInvariantRate | benchmark::Counter::kInvert);
 }
 
 void Fnmatch(benchmark::State &state, const char *pattern, const char *locale) {
@@ -91,8 +97,8 @@ void Fnmatch(benchmark::State &state, const char *pattern, const char *locale) {
     }
     setlocale(LC_ALL, "C");
     state.counters["matched"] = static_cast<double>(matched);
-    state.counters["per_name"] =
-        benchmark::Counter(kNames, benchmark::Counter::kIsIterationInvariantRate | benchmark::Counter::kInvert);
+    state.counters["per_name"] = benchmark::Counter(
+        kNames, benchmark::Counter::kIsIterationInvariantRate | benchmark::Counter::kInvert);
 }
 
 void Pathological(benchmark::State &state) {
@@ -120,8 +126,8 @@ public:
             const double ours = Time(std::string("Ours/") + kind.name);
             const double utf8 = Time(std::string("Fnmatch_UTF8/") + kind.name);
             const double c = Time(std::string("Fnmatch_C/") + kind.name);
-            printf("  %-15s %-22s UTF-8 locale %5.2f   C locale %5.2f\n", kind.name, kind.pattern, ours / utf8,
-                   ours / c);
+            printf("  %-15s %-22s UTF-8 locale %5.2f   C locale %5.2f\n", kind.name, kind.pattern,
+                   ours / utf8, ours / c);
         }
     }
 
@@ -141,10 +147,11 @@ int main(int argc, char **argv) {
     for (const Kind &kind : kKinds) {
         benchmark::RegisterBenchmark((std::string("Ours/") + kind.name).c_str(), Ours, kind.pattern)
             ->Unit(benchmark::kMillisecond);
-        benchmark::RegisterBenchmark((std::string("Fnmatch_UTF8/") + kind.name).c_str(), Fnmatch, kind.pattern,
-                                     "C.UTF-8")
+        benchmark::RegisterBenchmark((std::string("Fnmatch_UTF8/") + kind.name).c_str(), Fnmatch,
+                                     kind.pattern, "C.UTF-8")
             ->Unit(benchmark::kMillisecond);
-        benchmark::RegisterBenchmark((std::string("Fnmatch_C/") + kind.name).c_str(), Fnmatch, kind.pattern, "C")
+        benchmark::RegisterBenchmark((std::string("Fnmatch_C/") + kind.name).c_str(), Fnmatch, kind.pattern,
+                                     "C")
             ->Unit(benchmark::kMillisecond);
     }
     benchmark::RegisterBenchmark("Pathological/*a*a*a*a*a*a*a*b", Pathological)

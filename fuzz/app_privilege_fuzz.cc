@@ -23,7 +23,8 @@ using norvo::platform::PrivilegeVerdict;
 
 // Host accounts every Linux has ("root", group "root"), and names NSS does not know.
 const char *const kUsers[] = {"root", "alice", "carol"};
-const char *const kHolders[] = {"root", "alice", "carol", "@root", "!root", "!carol", "!@root", "\"@CORP\\domain users\""};
+const char *const kHolders[] = {"root",  "alice",  "carol",  "@root",
+                                "!root", "!carol", "!@root", "\"@CORP\\domain users\""};
 const char *const kPrivileges[] = {"P.One", "P.Two"};
 
 class Input {
@@ -45,10 +46,12 @@ char DamageByte(uint8_t pick) {
     static const std::string alphabet = [] {
         std::string bytes;
         for (int c = 0; c < 0x20; ++c) {
-            if (c != '\t' && c != '\n' && c != '\r') bytes += static_cast<char>(c);
+            if (c != '\t' && c != '\n' && c != '\r')
+                bytes += static_cast<char>(c);
         }
         bytes += "\x7f\"";
-        for (int c = 0x80; c <= 0xFF; c += 9) bytes += static_cast<char>(c);
+        for (int c = 0x80; c <= 0xFF; c += 9)
+            bytes += static_cast<char>(c);
         return bytes;
     }();
     return alphabet[pick % alphabet.size()];
@@ -58,7 +61,8 @@ char DamageByte(uint8_t pick) {
 std::string Quoted(const std::string &holders) {
     std::string out = "\"";
     for (char c : holders) {
-        if (c == '"' || c == '\\') out += '\\';
+        if (c == '"' || c == '\\')
+            out += '\\';
         out += c;
     }
     return out + "\"";
@@ -77,13 +81,19 @@ Text IntactFile(Input *in) {
         const uint8_t form = in->Byte();
         std::string holders;
         for (size_t h = 0; h < sizeof kHolders / sizeof *kHolders; ++h) {
-            if (pick & (1u << h)) holders += (holders.empty() ? "" : ",") + std::string(kHolders[h]);
+            if (pick & (1u << h))
+                holders += (holders.empty() ? "" : ",") + std::string(kHolders[h]);
         }
         std::string value;
         switch (form % 3) {
-        case 0: value = Quoted(holders); break;
-        case 1: value = holders; break;  // bare
-        default: value = "'" + holders + "'";
+            case 0:
+                value = Quoted(holders);
+                break;
+            case 1:
+                value = holders;
+                break;  // bare
+            default:
+                value = "'" + holders + "'";
         }
         out.text += std::string(privilege) + (form & 4 ? " = " : "=");
         out.values.emplace_back(out.text.size(), value.size());
@@ -99,7 +109,8 @@ std::string Damage(const Text &intact, Input *in) {
         const auto &[start, length] = intact.values[in->Byte() % intact.values.size()];
         const size_t at = in->Byte() % (length + 1);
         const uint8_t how = in->Byte();
-        if (edits.count(start) != 0) continue;
+        if (edits.count(start) != 0)
+            continue;
         std::string value = intact.text.substr(start, length);
         if ((how & 1) != 0 && at < length) {
             value[at] = DamageByte(how >> 1);
@@ -126,14 +137,16 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size);
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     const std::string raw(reinterpret_cast<const char *>(data), size);
-    for (const char *privilege : kPrivileges) (void)Verdict(raw, privilege, "root");
+    for (const char *privilege : kPrivileges)
+        (void)Verdict(raw, privilege, "root");
 
     Input in(data, size);
     const Text intact = IntactFile(&in);
     const std::string damaged = Damage(intact, &in);
     for (const char *privilege : kPrivileges) {
         for (const char *user : kUsers) {
-            if (Verdict(damaged, privilege, user) == 1 && Verdict(intact.text, privilege, user) != 1) abort();
+            if (Verdict(damaged, privilege, user) == 1 && Verdict(intact.text, privilege, user) != 1)
+                abort();
         }
     }
     return 0;

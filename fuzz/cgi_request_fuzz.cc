@@ -141,7 +141,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     const std::string_view input(reinterpret_cast<const char *>(data), size);
     const size_t newline = input.find('\n');
     const std::string_view header = input.substr(0, newline);
-    const std::string_view query = newline == std::string_view::npos ? std::string_view() : input.substr(newline + 1);
+    const std::string_view query =
+        newline == std::string_view::npos ? std::string_view() : input.substr(newline + 1);
 
     CheckCookie(header, "id");
     CheckCookie(input, "a b");

@@ -89,8 +89,10 @@ std::vector<std::string> Split(const std::string &value) {
 std::string Trimmed(const std::string &text) {
     size_t begin = 0;
     size_t end = text.size();
-    while (begin < end && isspace(static_cast<unsigned char>(text[begin]))) ++begin;
-    while (end > begin && isspace(static_cast<unsigned char>(text[end - 1]))) --end;
+    while (begin < end && isspace(static_cast<unsigned char>(text[begin])))
+        ++begin;
+    while (end > begin && isspace(static_cast<unsigned char>(text[end - 1])))
+        --end;
     return text.substr(begin, end - begin);
 }
 
@@ -127,113 +129,115 @@ void ExpectNames(const std::string &value, std::vector<Expected> &out) {
 
 // 0 and the expected conditions when the call must succeed, else the error code it must set.
 int ExpectField(int field, const char *op, const char *value, std::vector<Expected> &out) {
-    const bool needsOp = field == FindFactory::FIND_FIELD_TYPE || (field >= FindFactory::FIND_FIELD_MTIME &&
-                                                                   field <= FindFactory::FIND_FIELD_SIZE);
+    const bool needsOp = field == FindFactory::FIND_FIELD_TYPE ||
+                         (field >= FindFactory::FIND_FIELD_MTIME && field <= FindFactory::FIND_FIELD_SIZE);
     if ((field != FindFactory::FIND_FIELD_TYPE && value == nullptr) || (needsOp && op == nullptr)) {
         return NVO_ERR_GENERAL;
     }
     switch (field) {
-    case FindFactory::FIND_FIELD_NAME:
-        ExpectNames(value, out);
-        break;
-    case FindFactory::FIND_FIELD_TYPE:
-        if (strcasecmp(op, "dir") == 0 || strcasecmp(op, "file") == 0) {
-            Expected e{Expected::kType};
-            e.dir = strcasecmp(op, "dir") == 0;
+        case FindFactory::FIND_FIELD_NAME:
+            ExpectNames(value, out);
+            break;
+        case FindFactory::FIND_FIELD_TYPE:
+            if (strcasecmp(op, "dir") == 0 || strcasecmp(op, "file") == 0) {
+                Expected e{Expected::kType};
+                e.dir = strcasecmp(op, "dir") == 0;
+                out.push_back(e);
+            }
+            break;
+        case FindFactory::FIND_FIELD_EXT: {
+            Expected type{Expected::kType};
+            out.push_back(type);
+            std::vector<std::string> patterns;
+            for (const std::string &piece : Split(value)) {
+                patterns.push_back(PatternOf("*." + piece));
+            }
+            out.push_back(NameOf(patterns));
+            break;
+        }
+        case FindFactory::FIND_FIELD_USER:
+        case FindFactory::FIND_FIELD_GROUP: {
+            const bool user = field == FindFactory::FIND_FIELD_USER;
+            uid_t uid = 0;
+            gid_t gid = 0;
+            if (user ? QUIBUserGetUGID(value, &uid, &gid) < 0 : QUIBGroupGetGID(value, &gid) != 0) {
+                return user ? NVO_ERR_NO_USER : NVO_ERR_NO_GROUP;
+            }
+            Expected e{user ? Expected::kUser : Expected::kGroup};
+            e.id = user ? uid : gid;
+            e.records = 2;
             out.push_back(e);
+            break;
         }
-        break;
-    case FindFactory::FIND_FIELD_EXT: {
-        Expected type{Expected::kType};
-        out.push_back(type);
-        std::vector<std::string> patterns;
-        for (const std::string &piece : Split(value)) {
-            patterns.push_back(PatternOf("*." + piece));
+        case FindFactory::FIND_FIELD_MTIME:
+        case FindFactory::FIND_FIELD_CRTIME:
+        case FindFactory::FIND_FIELD_ATIME: {
+            Expected e{Expected::kTime};
+            e.timeField = field;
+            e.before = strcasecmp(op, "before") == 0;
+            e.when = static_cast<long>(strtoull(value, nullptr, 10));
+            out.push_back(e);
+            break;
         }
-        out.push_back(NameOf(patterns));
-        break;
-    }
-    case FindFactory::FIND_FIELD_USER:
-    case FindFactory::FIND_FIELD_GROUP: {
-        const bool user = field == FindFactory::FIND_FIELD_USER;
-        uid_t uid = 0;
-        gid_t gid = 0;
-        if (user ? QUIBUserGetUGID(value, &uid, &gid) < 0 : QUIBGroupGetGID(value, &gid) != 0) {
-            return user ? NVO_ERR_NO_USER : NVO_ERR_NO_GROUP;
+        case FindFactory::FIND_FIELD_SIZE: {
+            Expected e{Expected::kSize};
+            e.sizeMode = strcmp(op, "equal") == 0 ? 1 : strcmp(op, "less") == 0 ? 3 : 2;
+            e.bytes = static_cast<long long>(strtoull(value, nullptr, 10));
+            e.records = e.sizeMode == 1 ? 2 : 1;
+            out.push_back(e);
+            break;
         }
-        Expected e{user ? Expected::kUser : Expected::kGroup};
-        e.id = user ? uid : gid;
-        e.records = 2;
-        out.push_back(e);
-        break;
-    }
-    case FindFactory::FIND_FIELD_MTIME:
-    case FindFactory::FIND_FIELD_CRTIME:
-    case FindFactory::FIND_FIELD_ATIME: {
-        Expected e{Expected::kTime};
-        e.timeField = field;
-        e.before = strcasecmp(op, "before") == 0;
-        e.when = static_cast<long>(strtoull(value, nullptr, 10));
-        out.push_back(e);
-        break;
-    }
-    case FindFactory::FIND_FIELD_SIZE: {
-        Expected e{Expected::kSize};
-        e.sizeMode = strcmp(op, "equal") == 0 ? 1 : strcmp(op, "less") == 0 ? 3 : 2;
-        e.bytes = static_cast<long long>(strtoull(value, nullptr, 10));
-        e.records = e.sizeMode == 1 ? 2 : 1;
-        out.push_back(e);
-        break;
-    }
-    default:
-        break;
+        default:
+            break;
     }
     return 0;
 }
 
 std::string BaseName(const std::string &path) {
     size_t end = path.size();
-    while (end > 0 && path[end - 1] == '/') --end;
+    while (end > 0 && path[end - 1] == '/')
+        --end;
     size_t start = end;
-    while (start > 0 && path[start - 1] != '/') --start;
+    while (start > 0 && path[start - 1] != '/')
+        --start;
     return path.substr(start, end - start);
 }
 
 bool Decide(const Expected &e, const std::string &path, const QUIBSTAT &st) {
     const unsigned type = st.st_mode & 0xF000;
     switch (e.kind) {
-    case Expected::kName:
-        for (const std::string &pattern : e.patterns) {
-            if (NvoLibStrLikeCompare(pattern.c_str(), BaseName(path).c_str(), '\\') == 1) {
-                return true;
+        case Expected::kName:
+            for (const std::string &pattern : e.patterns) {
+                if (NvoLibStrLikeCompare(pattern.c_str(), BaseName(path).c_str(), '\\') == 1) {
+                    return true;
+                }
             }
+            return false;
+        case Expected::kType:
+            return type == (e.dir ? 0x4000u : 0x8000u);
+        case Expected::kUser:
+            return e.id != 0xFFFFFFFFu && st.st_uid == e.id;
+        case Expected::kGroup:
+            return e.id != 0xFFFFFFFFu && st.st_gid == e.id;
+        case Expected::kTime: {
+            const long t = e.timeField == FindFactory::FIND_FIELD_MTIME    ? st.st_mtim.tv_sec
+                           : e.timeField == FindFactory::FIND_FIELD_CRTIME ? st.st_crtim.tv_sec
+                                                                           : st.st_atim.tv_sec;
+            return e.before ? t < e.when : t >= e.when;
         }
-        return false;
-    case Expected::kType:
-        return type == (e.dir ? 0x4000u : 0x8000u);
-    case Expected::kUser:
-        return e.id != 0xFFFFFFFFu && st.st_uid == e.id;
-    case Expected::kGroup:
-        return e.id != 0xFFFFFFFFu && st.st_gid == e.id;
-    case Expected::kTime: {
-        const long t = e.timeField == FindFactory::FIND_FIELD_MTIME    ? st.st_mtim.tv_sec
-                       : e.timeField == FindFactory::FIND_FIELD_CRTIME ? st.st_crtim.tv_sec
-                                                                       : st.st_atim.tv_sec;
-        return e.before ? t < e.when : t >= e.when;
-    }
-    case Expected::kSize: {
-        const __int128 size = type == 0x4000 ? 0 : st.st_size;
-        const __int128 bytes = e.bytes;
-        if (e.sizeMode == 1) {
-            // About that size: within a twentieth (at least 1) below and above, bounded by
-            // 0 and the largest size.
-            const __int128 d = std::max<long long>((e.bytes >> 2) / 5, 1);
-            const __int128 low = std::max<__int128>(bytes - d, 0);
-            const __int128 high = std::min<__int128>(bytes + d, LLONG_MAX);
-            return low <= size && size < high;
+        case Expected::kSize: {
+            const __int128 size = type == 0x4000 ? 0 : st.st_size;
+            const __int128 bytes = e.bytes;
+            if (e.sizeMode == 1) {
+                // About that size: within a twentieth (at least 1) below and above, bounded by
+                // 0 and the largest size.
+                const __int128 d = std::max<long long>((e.bytes >> 2) / 5, 1);
+                const __int128 low = std::max<__int128>(bytes - d, 0);
+                const __int128 high = std::min<__int128>(bytes + d, LLONG_MAX);
+                return low <= size && size < high;
+            }
+            return e.sizeMode == 3 ? size < bytes : size > bytes;
         }
-        return e.sizeMode == 3 ? size < bytes : size > bytes;
-    }
     }
     return false;
 }
@@ -260,7 +264,8 @@ std::vector<Probe> ProbesFor(const std::vector<Expected> &expected, std::mt19937
         }
         // Wrapping around is fine here: any number makes a probe.
         const auto plus = [](long long a, long long b) {
-            return static_cast<long long>(static_cast<unsigned long long>(a) + static_cast<unsigned long long>(b));
+            return static_cast<long long>(static_cast<unsigned long long>(a) +
+                                          static_cast<unsigned long long>(b));
         };
         for (long long n : {e.bytes, static_cast<long long>(e.when)}) {
             for (long long delta : {-6LL, -5LL, -1LL, 0LL, 1LL, 4LL, 5LL, -n / 20, n / 20}) {
@@ -335,7 +340,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
         const auto head = static_cast<unsigned char>(record[0]);
         const int field = static_cast<int>(head & 0x7F) - '0';
         const size_t newline = record.find('\n');
-        const std::string op = record.substr(1, newline == std::string::npos ? std::string::npos : newline - 1);
+        const std::string op =
+            record.substr(1, newline == std::string::npos ? std::string::npos : newline - 1);
         const std::string value = newline == std::string::npos ? "" : record.substr(newline + 1);
         const char *opArg = (head & 0x80) != 0 ? nullptr : op.c_str();
         const char *valueArg = newline == std::string::npos ? nullptr : value.c_str();
@@ -344,8 +350,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
         std::vector<Expected> want;
         const int code = ExpectField(field, opArg, valueArg, want);
         NvoLibSetErr(0);
-        const bool ok = FindFactory::createFindOp(static_cast<FindFactory::_tag_FIND_FIELD_>(field), opArg, valueArg,
-                                                  made);
+        const bool ok = FindFactory::createFindOp(static_cast<FindFactory::_tag_FIND_FIELD_>(field), opArg,
+                                                  valueArg, made);
         Check(ok == (code == 0) && NvoLibGetErr() == code);
         Check(made.size() - before == want.size());
         expected.insert(expected.end(), want.begin(), want.end());

@@ -10,7 +10,8 @@ namespace norvo::fuzz {
 
 // Builds the appliance, lets setup configure it, and drops its syslog lines as they arrive
 // (a long run logs millions). Call once.
-inline norvo::testing::Appliance &BuildAppliance(const std::function<void(norvo::testing::Appliance &)> &setup) {
+inline norvo::testing::Appliance &BuildAppliance(
+    const std::function<void(norvo::testing::Appliance &)> &setup) {
     static auto *appliance = new norvo::testing::Appliance();
     setup(*appliance);
     appliance->ForwardLogs([](const norvo::testing::LogLine &) {});

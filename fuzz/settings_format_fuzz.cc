@@ -90,8 +90,9 @@ std::vector<std::string> OtherLines(const std::string &text, const std::string &
 }
 
 // Entries as they are after setting key to value: key's first place keeps it, or it comes last.
-std::vector<std::pair<std::string, std::string>> WithKey(std::vector<std::pair<std::string, std::string>> entries,
-                                                         const std::string &key, const std::string &value) {
+std::vector<std::pair<std::string, std::string>> WithKey(
+    std::vector<std::pair<std::string, std::string>> entries, const std::string &key,
+    const std::string &value) {
     for (auto &entry : entries) {
         if (entry.first == key) {
             entry.second = value;
@@ -113,8 +114,10 @@ void CheckInMemory(const std::string &text) {
             if (!np::IsWritableValue(line.value, format)) {
                 continue;
             }
-            const std::vector<np::SettingsLine> again = np::ParseSettings(np::FormatEntry(line.key, line.value, format));
-            Check(again.size() == 1 && again[0].isEntry && again[0].key == line.key && again[0].value == line.value);
+            const std::vector<np::SettingsLine> again =
+                np::ParseSettings(np::FormatEntry(line.key, line.value, format));
+            Check(again.size() == 1 && again[0].isEntry && again[0].key == line.key &&
+                  again[0].value == line.value);
         }
     }
 }
@@ -151,8 +154,10 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     // Every reader sees the same value for each key the file lists.
     for (const auto &[k, v] : before) {
         std::string got(v.size() + 1, 'x');
-        Check(VLIBCFileGetKeyValue(kFile, k.c_str(), got.data(), got.size(), 0) == static_cast<int>(v.size() + 1));
-        Check(got.compare(0, v.size(), v) == 0 && VLIBCFileCheckKeyValue(kFile, k.c_str(), v.c_str(), 0) == 1);
+        Check(VLIBCFileGetKeyValue(kFile, k.c_str(), got.data(), got.size(), 0) ==
+              static_cast<int>(v.size() + 1));
+        Check(got.compare(0, v.size(), v) == 0 &&
+              VLIBCFileCheckKeyValue(kFile, k.c_str(), v.c_str(), 0) == 1);
     }
     const bool writable = np::IsWritableKey(key) && np::IsWritableValue(value, format);
     const int set = VLIBCFileSetKeyValue(kFile, key.c_str(), value.c_str(), format);
@@ -166,7 +171,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     Check(OtherLines(written, key) == OtherLines(text, key));
     Check(Entries() == WithKey(before, key, value));
     std::string buf(value.size() + 1, 'x');
-    Check(VLIBCFileGetKeyValue(kFile, key.c_str(), buf.data(), buf.size(), 0) == static_cast<int>(value.size() + 1));
+    Check(VLIBCFileGetKeyValue(kFile, key.c_str(), buf.data(), buf.size(), 0) ==
+          static_cast<int>(value.size() + 1));
     Check(memcmp(buf.data(), value.data(), value.size()) == 0 && buf[value.size()] == '\0');
     Check(VLIBCFileCheckKeyValue(kFile, key.c_str(), value.c_str(), 0) == 1);
 
@@ -176,7 +182,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
 
     Check(VLIBCFileRemoveKey(kFile, key.c_str()) == 0);
     auto expected = before;
-    expected.erase(std::remove_if(expected.begin(), expected.end(), [&key](const auto &entry) { return entry.first == key; }),
+    expected.erase(std::remove_if(expected.begin(), expected.end(),
+                                  [&key](const auto &entry) { return entry.first == key; }),
                    expected.end());
     Check(Entries() == expected);
     Check(OtherLines(ReadText(), key) == OtherLines(text, key));

@@ -46,10 +46,12 @@ char DamageByte(uint8_t pick) {
     static const std::string alphabet = [] {
         std::string bytes;
         for (int c = 0; c < 0x20; ++c) {
-            if (c != '\t' && c != '\n' && c != '\r') bytes += static_cast<char>(c);
+            if (c != '\t' && c != '\n' && c != '\r')
+                bytes += static_cast<char>(c);
         }
         bytes += "\x7f\"";
-        for (int c = 0x80; c <= 0xFF; c += 9) bytes += static_cast<char>(c);
+        for (int c = 0x80; c <= 0xFF; c += 9)
+            bytes += static_cast<char>(c);
         return bytes;
     }();
     return alphabet[pick % alphabet.size()];
@@ -76,14 +78,19 @@ Text IntactConfiguration(Input *in) {
             const uint8_t pick = in->Byte();
             std::string list;
             for (size_t e = 0; e < sizeof kEntries / sizeof *kEntries; ++e) {
-                if (pick & (1u << e)) list += (list.empty() ? "" : (pick & 0x80 ? ", " : " ")) + std::string(kEntries[e]);
+                if (pick & (1u << e))
+                    list += (list.empty() ? "" : (pick & 0x80 ? ", " : " ")) + std::string(kEntries[e]);
             }
-            if (!list.empty()) out.Line(key, list);
+            if (!list.empty())
+                out.Line(key, list);
         }
         const uint8_t flags = in->Byte();
-        if (flags & 1) out.Line("browseable", "no");
-        if (flags & 2) out.Line("disable modify", "yes");
-        if (flags & 4) out.Line("comment", "the \"best\" share");
+        if (flags & 1)
+            out.Line("browseable", "no");
+        if (flags & 2)
+            out.Line("disable modify", "yes");
+        if (flags & 4)
+            out.Line("comment", "the \"best\" share");
     }
     return out;
 }
@@ -97,7 +104,8 @@ std::string Damage(const Text &intact, Input *in) {
         const auto &[start, length] = intact.values[index];
         const size_t at = in->Byte() % (length + 1);
         const uint8_t how = in->Byte();
-        if (values.count(start) != 0) continue;
+        if (values.count(start) != 0)
+            continue;
         std::string value = intact.text.substr(start, length);
         if ((how & 1) != 0 && at < length) {
             value[at] = DamageByte(how >> 1);
@@ -122,19 +130,24 @@ int Privilege(const ShareEntry &share, const char *user) {
         int result = 0;
         for (const std::string &entry : norvo::platform::SplitNameList(list)) {
             const int match = matcher.Matches(entry);
-            if (match != 0) result = match;
-            if (match == 1) break;
+            if (match != 0)
+                result = match;
+            if (match == 1)
+                break;
         }
         return result;
     };
-    if (in(share.noAccess) != 0) return 0;
-    if (in(share.readWrite) == 1) return 2;
+    if (in(share.noAccess) != 0)
+        return 0;
+    if (in(share.readWrite) == 1)
+        return 2;
     return in(share.readOnly) == 1 ? 1 : 0;
 }
 
 const ShareEntry *Named(const std::vector<ShareEntry> &shares, const std::string &name) {
     for (const ShareEntry &share : shares) {
-        if (share.name == name) return &share;
+        if (share.name == name)
+            return &share;
     }
     return nullptr;
 }
@@ -142,8 +155,10 @@ const ShareEntry *Named(const std::vector<ShareEntry> &shares, const std::string
 void CheckSound(const std::vector<ShareEntry> &shares) {
     std::set<std::string> names;
     for (const ShareEntry &share : shares) {
-        if (share.path.size() < 2 || share.path[0] != '/' || !names.insert(norvo::platform::ToLowerAscii(share.name)).second ||
-            !norvo::platform::IsCleanConfigText(share.path) || !norvo::platform::IsCleanConfigText(share.noAccess)) {
+        if (share.path.size() < 2 || share.path[0] != '/' ||
+            !names.insert(norvo::platform::ToLowerAscii(share.name)).second ||
+            !norvo::platform::IsCleanConfigText(share.path) ||
+            !norvo::platform::IsCleanConfigText(share.noAccess)) {
             abort();
         }
     }
@@ -154,7 +169,8 @@ void CheckSound(const std::vector<ShareEntry> &shares) {
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size);
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
-    CheckSound(norvo::platform::ParseShareConfig(std::string_view(reinterpret_cast<const char *>(data), size)));
+    CheckSound(
+        norvo::platform::ParseShareConfig(std::string_view(reinterpret_cast<const char *>(data), size)));
 
     Input in(data, size);
     const Text intact = IntactConfiguration(&in);
@@ -168,7 +184,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
             abort();
         }
         for (const char *user : kUsers) {
-            if (Privilege(share, user) > Privilege(*was, user)) abort();
+            if (Privilege(share, user) > Privilege(*was, user))
+                abort();
         }
     }
     return 0;

@@ -91,8 +91,8 @@ QUIB_API int QUIBEAIsHiddenFile(const char *name);
 // existing directories, and links to them, are left untouched. 0 on success. -1 on failure
 // with errno and the error slot set; stopAt (if not null, stopAtSize bytes) receives the path
 // of the component that could not be created (EEXIST: it is not a directory).
-QUIB_API int QUIBFSMkdirP(const char *path, char *stopAt, int stopAtSize, int recursive, uid_t uid,
-                          gid_t gid, mode_t mode);
+QUIB_API int QUIBFSMkdirP(const char *path, char *stopAt, int stopAtSize, int recursive, uid_t uid, gid_t gid,
+                          mode_t mode);
 
 // The ACL_PERM_* mask the effective identity holds on path (a final link is not followed),
 // judged as the kernel judges (POSIX ACLs and modes count). 0 and *mask on success; -1 with

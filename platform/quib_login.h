@@ -1,8 +1,8 @@
 // Login records of the web interface, and the domain and directory privilege lookups that
 // are valid only for a logged-in sid.
 #pragma once
-#include <string>
 #include <sys/types.h>
+#include <string>
 #include "platform_export.h"
 
 QUIB_BEGIN_C
@@ -11,8 +11,8 @@ QUIB_BEGIN_C
 // remoteAddr (may be null). 0 and the new sid (32 URL-safe characters) in sidBuf (sidSize
 // bytes, at least 33); -1 with 0x1D00 unknown user, 0x0300 wrong password, locked or expired
 // account, 0x0D00 bad argument, 0x8100 on failure.
-QUIB_API int QUIBLoginCreate(const char *user, const char *password, const char *remoteAddr,
-                             char *sidBuf, int sidSize);
+QUIB_API int QUIBLoginCreate(const char *user, const char *password, const char *remoteAddr, char *sidBuf,
+                             int sidSize);
 // Looks the sid up and moves its expiry on: 0 with the user name (userBuf, userSize bytes);
 // -1 with 0x0300 when the sid is unknown or expired, 0x0D00 when it is malformed or the name
 // does not fit, 0x8100 when the records can't be read.

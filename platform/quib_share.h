@@ -20,7 +20,7 @@ enum {
 // entry holding a separator keeps its double quotes ("@CORP\domain users").
 typedef struct _tag_QUIBSHARE_ {
     char *szName;
-    char *szPath;          // the share's real path, e.g. /volume1/photo
+    char *szPath;  // the share's real path, e.g. /volume1/photo
     char *szComment;
     char *szNoAccessList;  // comma-separated users and @groups
     char *szRWList;

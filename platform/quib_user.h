@@ -17,9 +17,9 @@ typedef enum _tag_AUTH_TYPE_ {
 typedef struct _tag_QUIBUSER_ {
     char *szName;
     uid_t nUID;
-    gid_t nGID;     // primary group
+    gid_t nGID;  // primary group
     char *szGecos;
-    char *szHome;   // home directory as NSS gives it
+    char *szHome;  // home directory as NSS gives it
     char *szShell;
     AUTH_TYPE authType;
 } QUIBUSER, *PQUIBUSER;

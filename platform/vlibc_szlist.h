@@ -4,8 +4,8 @@
 #include "platform_export.h"
 
 typedef struct _tag_SZLIST_ {
-    int nAlloc;    // slots allocated
-    int nItem;     // slots in use
+    int nAlloc;  // slots allocated
+    int nItem;   // slots in use
     char **pszItem;
 } SZLIST, *PSZLIST;
 

@@ -47,18 +47,18 @@ typedef enum _tag_dir_entry_type_ : int {
 // privilege 4; the info flags say which fields a listing filled.
 struct DIRENTRY_INFO {
     std::string name;
-    std::string path;       // user-visible: /share/folders/name
-    std::string real_path;  // NVO_INFO_REAL_PATH
-    std::string type;       // NVO_INFO_TYPE: lower-case extension, "" for folders
-    uint64_t size = 0;      // NVO_INFO_SIZE
-    uint32_t mode = 0;      // NVO_INFO_PERM: the stat mode word
+    std::string path;            // user-visible: /share/folders/name
+    std::string real_path;       // NVO_INFO_REAL_PATH
+    std::string type;            // NVO_INFO_TYPE: lower-case extension, "" for folders
+    uint64_t size = 0;           // NVO_INFO_SIZE
+    uint32_t mode = 0;           // NVO_INFO_PERM: the stat mode word
     uint32_t acl_privilege = 0;  // NVO_INFO_PERM: the ACL permission mask of the caller
     bool is_acl_mode = false;    // NVO_INFO_PERM
-    int32_t mtime = 0;      // NVO_INFO_TIME, seconds
+    int32_t mtime = 0;           // NVO_INFO_TIME, seconds
     int32_t ctime = 0;
     int32_t crtime = 0;
     int32_t atime = 0;
-    uint32_t uid = 0;       // NVO_INFO_OWNER
+    uint32_t uid = 0;  // NVO_INFO_OWNER
     std::string user;
     uint32_t gid = 0;
     std::string group;
@@ -196,9 +196,9 @@ public:
     // 1 on success; 0 with the error slot set (400, 401, 402, 407 (also for the user path "/"),
     // 408, 410). Records appended before a failure stay in out.
     int NvoLibDirEntryListEnum(const char *userPath, const char *realPath, const char *sortKey, int info,
-                               unsigned long offset, unsigned long limit, bool ascending, _tag_dir_entry_type_ type,
-                               std::vector<FileSearch::FindComp *> conditions, std::list<DIRENTRY_INFO> &out,
-                               unsigned long *total);
+                               unsigned long offset, unsigned long limit, bool ascending,
+                               _tag_dir_entry_type_ type, std::vector<FileSearch::FindComp *> conditions,
+                               std::list<DIRENTRY_INFO> &out, unsigned long *total);
     // Fills one record. dtype is the directory reader's type byte (0 unknown, 4 folder, 8 file).
     // 0 keep, 1 skip, -1 failure (error slot set except for an I/O error).
     int FillFileInfo(const char *userPath, const char *realPath, const char *name, _tag_dir_entry_type_ type,
@@ -207,8 +207,8 @@ public:
     // with share privileges and volume figures; sorted, ordered and paged as a directory listing.
     // context and flag are handed to the domain and directory share-list generators. 1 on
     // success; 0 with 403 (null user) or 401 (no share list).
-    int NvoLibShareEntryListEnum(const char *user, const char *context, bool flag, const char *sortKey, int info,
-                                 unsigned long offset, unsigned long limit, bool ascending,
+    int NvoLibShareEntryListEnum(const char *user, const char *context, bool flag, const char *sortKey,
+                                 int info, unsigned long offset, unsigned long limit, bool ascending,
                                  std::list<DIRENTRY_INFO> &out, unsigned long *total);
     // Sorts in place with EnumCompare(key); stable.
     void EntryListSort(std::list<DIRENTRY_INFO> &list, std::string key);

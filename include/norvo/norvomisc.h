@@ -102,8 +102,8 @@ NORVO_API std::string NvoLibHex2Bin(const char *hex);
 // appended (text whole when it has none). An empty or null delim does nothing.
 NORVO_API void StringExplode(std::vector<std::string> &out, const std::string &text, const char *delim);
 // The same pieces, each passed to callback with user instead; nothing for a null callback.
-NORVO_API void StringExplode(const std::string &text, const char *delim, void (*callback)(const std::string &, void *),
-                             void *user);
+NORVO_API void StringExplode(const std::string &text, const char *delim,
+                             void (*callback)(const std::string &, void *), void *user);
 // The longest common parent directory of paths (each taken with a trailing "/"), ending in "/";
 // "" for no paths or only empty ones. Paths without a common leading directory give their
 // common prefix as it is ("ab" and "ac" give "a").

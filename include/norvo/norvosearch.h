@@ -23,12 +23,12 @@ enum __tag_FI_SQL_COND_TYPE : unsigned int {
     FI_COND_PATH = 5,         // path below the share, without a leading slash
     FI_COND_IS_DIR = 6,       // "1" directory, "0" anything else
     FI_COND_SIZE = 7,
-    FI_COND_TYPE = 8,         // the file type used for sorting by "type"
+    FI_COND_TYPE = 8,  // the file type used for sorting by "type"
     FI_COND_CRTIME = 9,
     FI_COND_CTIME = 10,
     FI_COND_ATIME = 11,
     FI_COND_MTIME = 12,
-    FI_COND_POSIX = 13,       // permission text
+    FI_COND_POSIX = 13,  // permission text
     FI_COND_MODE = 14,
     FI_COND_UID = 15,
     FI_COND_GID = 16,
@@ -234,15 +234,15 @@ class NORVO_API FindFactory {
 public:
     // The request fields. Any int is a valid value: those not listed are unknown fields.
     enum _tag_FIND_FIELD_ : int {
-        FIND_FIELD_NAME = 0,    // value: comma-separated name terms
-        FIND_FIELD_TYPE = 1,    // op: "dir" or "file"
-        FIND_FIELD_EXT = 2,     // value: comma-separated extensions
-        FIND_FIELD_USER = 3,    // value: user name
-        FIND_FIELD_GROUP = 4,   // value: group name
-        FIND_FIELD_MTIME = 5,   // op: "before" or anything else; value: decimal seconds
+        FIND_FIELD_NAME = 0,   // value: comma-separated name terms
+        FIND_FIELD_TYPE = 1,   // op: "dir" or "file"
+        FIND_FIELD_EXT = 2,    // value: comma-separated extensions
+        FIND_FIELD_USER = 3,   // value: user name
+        FIND_FIELD_GROUP = 4,  // value: group name
+        FIND_FIELD_MTIME = 5,  // op: "before" or anything else; value: decimal seconds
         FIND_FIELD_CRTIME = 6,
         FIND_FIELD_ATIME = 7,
-        FIND_FIELD_SIZE = 8,    // op: "equal", "less" or anything else; value: decimal bytes
+        FIND_FIELD_SIZE = 8,  // op: "equal", "less" or anything else; value: decimal bytes
     };
 
     // Appends the conditions of one request field to out (the caller deletes them).

@@ -5,8 +5,8 @@
 #include "norvo/export.h"
 
 struct NORVO_API PathInfo {
-    std::string userPath;   // without trailing slashes
-    std::string fullPath;   // the real path
+    std::string userPath;  // without trailing slashes
+    std::string fullPath;  // the real path
     std::string shareName;
     std::string volumePath;
     std::string sharePath;  // the share's real path

@@ -21,8 +21,8 @@ UserRecord MakeUserRecord(const NssUser &entry, AUTH_TYPE kind) {
         record->szShell = DupCString(entry.shell);
         record->authType = kind;
     }
-    if (!record || record->szName == nullptr || record->szGecos == nullptr ||
-        record->szHome == nullptr || record->szShell == nullptr) {
+    if (!record || record->szName == nullptr || record->szGecos == nullptr || record->szHome == nullptr ||
+        record->szShell == nullptr) {
         QUIB_SET_ERR(QUIB_ERR_NO_MEMORY);
         return UserRecord();
     }
@@ -50,13 +50,13 @@ GroupRecord MakeGroupRecord(const NssGroup &entry) {
 
 bool Found(NssStatus status, int err, int notFoundCode) {
     switch (status) {
-    case NssStatus::kFound:
-        return true;
-    case NssStatus::kNotFound:
-        QUIB_SET_ERR(notFoundCode);
-        return false;
-    case NssStatus::kFailed:
-        break;
+        case NssStatus::kFound:
+            return true;
+        case NssStatus::kNotFound:
+            QUIB_SET_ERR(notFoundCode);
+            return false;
+        case NssStatus::kFailed:
+            break;
     }
     QUIB_SET_ERR(NssFailureCode(err));
     return false;

@@ -33,10 +33,10 @@ enum : unsigned { kMayExec = 1, kMayWrite = 2, kMayRead = 4 };
 struct Identity {
     uid_t fsuid = 0;
     gid_t fsgid = 0;
-    std::vector<gid_t> groups;  // supplementary groups, sorted
-    bool dacOverride = false;   // CAP_DAC_OVERRIDE
-    bool dacReadSearch = false; // CAP_DAC_READ_SEARCH
-    bool fowner = false;        // CAP_FOWNER
+    std::vector<gid_t> groups;   // supplementary groups, sorted
+    bool dacOverride = false;    // CAP_DAC_OVERRIDE
+    bool dacReadSearch = false;  // CAP_DAC_READ_SEARCH
+    bool fowner = false;         // CAP_FOWNER
     bool operator==(const Identity &other) const;
 };
 

@@ -98,8 +98,7 @@ bool MayDelete(const char *path, const struct statx &entry) {
     }
     struct statx dir;
     if (statx(AT_FDCWD, parent.c_str(), 0, STATX_MODE | STATX_UID, &dir) != 0 ||
-        HasAttribute(dir, STATX_ATTR_APPEND) ||
-        Check(parent.c_str(), W_OK | X_OK, 0) != Access::kGranted) {
+        HasAttribute(dir, STATX_ATTR_APPEND) || Check(parent.c_str(), W_OK | X_OK, 0) != Access::kGranted) {
         return false;
     }
     if ((dir.stx_mode & S_ISVTX) == 0) {
@@ -108,7 +107,6 @@ bool MayDelete(const char *path, const struct statx &entry) {
     const uid_t self = geteuid();
     return entry.stx_uid == self || dir.stx_uid == self || HasEffectiveCapability(CAP_FOWNER);
 }
-
 
 // The kernel's answer: faccessat for each bit (the reference for the evaluation below). The
 // probe has already established ACL support. Inside a pass the entry is named in the pass's
@@ -119,8 +117,10 @@ int KernelMask(const char *path, const struct statx &info, const acl::MountFacts
     const char *entry = pass != nullptr ? name : path;
     int failure = 0;  // the errno of the first check that failed
     const Access read = Check(dir, entry, R_OK, AT_SYMLINK_NOFOLLOW, &failure);
-    const Access write = read == Access::kFailed ? read : Check(dir, entry, W_OK, AT_SYMLINK_NOFOLLOW, &failure);
-    const Access exec = write == Access::kFailed ? write : Check(dir, entry, X_OK, AT_SYMLINK_NOFOLLOW, &failure);
+    const Access write =
+        read == Access::kFailed ? read : Check(dir, entry, W_OK, AT_SYMLINK_NOFOLLOW, &failure);
+    const Access exec =
+        write == Access::kFailed ? write : Check(dir, entry, X_OK, AT_SYMLINK_NOFOLLOW, &failure);
     if (exec == Access::kFailed) {
         return NORVO_FAIL_ERRNO(failure);
     }
@@ -131,7 +131,8 @@ int KernelMask(const char *path, const struct statx &info, const acl::MountFacts
     }
     if (write == Access::kGranted) {
         // An append-only file takes appends but refuses any other write.
-        result |= ACL_PERM_APPEND | ACL_PERM_WRITE_XATTR | (appendOnly ? 0u : static_cast<unsigned int>(ACL_PERM_WRITE));
+        result |= ACL_PERM_APPEND | ACL_PERM_WRITE_XATTR |
+                  (appendOnly ? 0u : static_cast<unsigned int>(ACL_PERM_WRITE));
         // One request for both: an ACL grants only what a single matching group entry
         // holds, so write and search may each pass alone and fail together.
         if (S_ISDIR(info.stx_mode) && exec == Access::kGranted && !appendOnly &&
@@ -143,7 +144,8 @@ int KernelMask(const char *path, const struct statx &info, const acl::MountFacts
         result |= ACL_PERM_EXECUTE;
     }
     if (!mount.readOnly && !HasAttribute(info, STATX_ATTR_IMMUTABLE) && !appendOnly &&
-        (info.stx_uid == static_cast<uid_t>(setfsuid(static_cast<uid_t>(-1))) || HasEffectiveCapability(CAP_FOWNER))) {
+        (info.stx_uid == static_cast<uid_t>(setfsuid(static_cast<uid_t>(-1))) ||
+         HasEffectiveCapability(CAP_FOWNER))) {
         result |= ACL_PERM_WRITE_ATTR | ACL_PERM_WRITE_ACL | ACL_PERM_CHANGE_OWNER;
     }
     if (MayDelete(path, info)) {
@@ -157,7 +159,8 @@ enum class AclRead { kNone, kFound, kUnsupported, kMalformed, kFailed };
 
 // Reads the access ACL of path (follow: through a final link) into *acl; inside a pass, of the
 // pass's entry name (never followed).
-AclRead ReadAcl(const char *path, bool follow, acl::Acl *acl, QUIBDirPass *pass = nullptr, const char *name = nullptr) {
+AclRead ReadAcl(const char *path, bool follow, acl::Acl *acl, QUIBDirPass *pass = nullptr,
+                const char *name = nullptr) {
     char buffer[512];
     const auto get = [&](void *value, size_t size) {
         if (pass != nullptr) {
@@ -170,12 +173,15 @@ AclRead ReadAcl(const char *path, bool follow, acl::Acl *acl, QUIBDirPass *pass 
     std::vector<char> large;
     while (size < 0 && errno == ERANGE) {  // a long ACL: ask its size, then read it
         size = get(nullptr, 0);
-        if (size < 0) break;
+        if (size < 0)
+            break;
         large.resize(static_cast<size_t>(size) + 64);
         size = get(large.data(), large.size());
     }
     if (size < 0) {
-        return errno == ENODATA ? AclRead::kNone : errno == EOPNOTSUPP ? AclRead::kUnsupported : AclRead::kFailed;
+        return errno == ENODATA      ? AclRead::kNone
+               : errno == EOPNOTSUPP ? AclRead::kUnsupported
+                                     : AclRead::kFailed;
     }
     const void *value = large.empty() ? static_cast<const void *>(buffer) : large.data();
     return acl::ParseAcl(value, static_cast<size_t>(size), acl) ? AclRead::kFound : AclRead::kMalformed;
@@ -207,18 +213,20 @@ struct ParentFacts {
 
 bool SameState(const ParentFacts &facts, const struct statx &dir) {
     return facts.valid && facts.devMajor == dir.stx_dev_major && facts.devMinor == dir.stx_dev_minor &&
-           facts.ino == dir.stx_ino && facts.mountId == dir.stx_mnt_id && facts.ctimeSec == dir.stx_ctime.tv_sec &&
-           facts.ctimeNsec == dir.stx_ctime.tv_nsec;
+           facts.ino == dir.stx_ino && facts.mountId == dir.stx_mnt_id &&
+           facts.ctimeSec == dir.stx_ctime.tv_sec && facts.ctimeNsec == dir.stx_ctime.tv_nsec;
 }
 
 // Whether who may write and search the directory parent (through links, as unlink resolves it).
 bool ParentWriteSearch(const char *parent, const struct statx &dir, const acl::Identity &who) {
     acl::MountFacts mount;
     acl::Acl entries;
-    if (acl::LookupMount(dir, parent, &mount) && mount.kind == acl::MountFacts::Kind::kGeneric && !acl::NeedsKernel(dir)) {
+    if (acl::LookupMount(dir, parent, &mount) && mount.kind == acl::MountFacts::Kind::kGeneric &&
+        !acl::NeedsKernel(dir)) {
         const AclRead read = ReadAcl(parent, true, &entries);
         if (read == AclRead::kNone || read == AclRead::kFound || read == AclRead::kUnsupported) {
-            const acl::Inode inode{dir.stx_mode, dir.stx_uid, dir.stx_gid, HasAttribute(dir, STATX_ATTR_IMMUTABLE),
+            const acl::Inode inode{dir.stx_mode, dir.stx_uid, dir.stx_gid,
+                                   HasAttribute(dir, STATX_ATTR_IMMUTABLE),
                                    read == AclRead::kFound ? &entries : nullptr};
             return acl::MayAccess(who, inode, mount, acl::kMayWrite | acl::kMayExec);
         }
@@ -228,7 +236,8 @@ bool ParentWriteSearch(const char *parent, const struct statx &dir, const acl::I
 
 // The sticky directory's last word (check_sticky).
 bool StickyAllows(const struct statx &dir, const struct statx &entry, const acl::Identity &who) {
-    return (dir.stx_mode & S_ISVTX) == 0 || entry.stx_uid == who.fsuid || dir.stx_uid == who.fsuid || who.fowner;
+    return (dir.stx_mode & S_ISVTX) == 0 || entry.stx_uid == who.fsuid || dir.stx_uid == who.fsuid ||
+           who.fowner;
 }
 
 // MayDelete for an entry of a pass: the directory's facts are the pass's, judged once.
@@ -253,7 +262,8 @@ bool FastMayDelete(const char *path, const struct statx &entry, const acl::Ident
         return false;
     }
     struct statx dir;
-    if (statx(AT_FDCWD, parent.c_str(), 0, kInodeMask | STATX_INO | STATX_CTIME | acl::MountIdMask(), &dir) != 0 ||
+    if (statx(AT_FDCWD, parent.c_str(), 0, kInodeMask | STATX_INO | STATX_CTIME | acl::MountIdMask(), &dir) !=
+            0 ||
         HasAttribute(dir, STATX_ATTR_APPEND)) {
         return false;
     }
@@ -277,8 +287,8 @@ bool FastMayDelete(const char *path, const struct statx &entry, const acl::Ident
 
 // The mask from the evaluation: the same bits, in the same way, as KernelMask.
 // Inside a pass (pass and name set) the identity and the directory's facts are the pass's.
-int EvaluatedMask(const char *path, const struct statx &info, const acl::MountFacts &mount, const acl::Acl *entries,
-                  unsigned int *mask, QUIBDirPass *pass, const char *name) {
+int EvaluatedMask(const char *path, const struct statx &info, const acl::MountFacts &mount,
+                  const acl::Acl *entries, unsigned int *mask, QUIBDirPass *pass, const char *name) {
     acl::Identity own;
     const acl::Identity *identity = &own;
     if (pass != nullptr) {
@@ -301,7 +311,8 @@ int EvaluatedMask(const char *path, const struct statx &info, const acl::MountFa
         result |= ACL_PERM_READ | ACL_PERM_READ_XATTR;
     }
     if (write) {
-        result |= ACL_PERM_APPEND | ACL_PERM_WRITE_XATTR | (appendOnly ? 0u : static_cast<unsigned int>(ACL_PERM_WRITE));
+        result |= ACL_PERM_APPEND | ACL_PERM_WRITE_XATTR |
+                  (appendOnly ? 0u : static_cast<unsigned int>(ACL_PERM_WRITE));
         if (S_ISDIR(info.stx_mode) && exec && !appendOnly && may(acl::kMayWrite | acl::kMayExec)) {
             result |= ACL_PERM_DELETE_CHILD;
         }
@@ -321,7 +332,8 @@ int EvaluatedMask(const char *path, const struct statx &info, const acl::MountFa
 
 // A link is no file to read, write or run, and its own mode (0777) grants nothing: it has
 // attributes to look at and a name that may go.
-int LinkMask(const char *path, const struct statx &info, unsigned int *mask, QUIBDirPass *pass, const char *name) {
+int LinkMask(const char *path, const struct statx &info, unsigned int *mask, QUIBDirPass *pass,
+             const char *name) {
     acl::Identity own;
     const acl::Identity *who = &own;
     if (pass != nullptr) {
@@ -402,28 +414,28 @@ int QUIBACLPermGet(const char *path, unsigned int *mask) {
         if (link || !generic) {
             // A link carries no ACL; the kernel's path only needs the support answer.
             switch (AclSupportOf(info, probe, &mount)) {
-            case 1:
-                break;
-            case 0:
-                QUIB_SET_ERR(QUIB_ERR_ACL_NOT_SUPPORTED);
-                return -1;
-            default:
-                return NORVO_FAIL_ERRNO(errno);
+                case 1:
+                    break;
+                case 0:
+                    QUIB_SET_ERR(QUIB_ERR_ACL_NOT_SUPPORTED);
+                    return -1;
+                default:
+                    return NORVO_FAIL_ERRNO(errno);
             }
         } else {
             read = ReadAcl(path, false, &entries, pass, name);
             switch (read) {
-            case AclRead::kNone:
-            case AclRead::kFound:
-            case AclRead::kMalformed:
-                acl::RememberAclSupport(info, true);
-                break;
-            case AclRead::kUnsupported:
-                acl::RememberAclSupport(info, false);
-                QUIB_SET_ERR(QUIB_ERR_ACL_NOT_SUPPORTED);
-                return -1;
-            case AclRead::kFailed:
-                return NORVO_FAIL_ERRNO(errno);
+                case AclRead::kNone:
+                case AclRead::kFound:
+                case AclRead::kMalformed:
+                    acl::RememberAclSupport(info, true);
+                    break;
+                case AclRead::kUnsupported:
+                    acl::RememberAclSupport(info, false);
+                    QUIB_SET_ERR(QUIB_ERR_ACL_NOT_SUPPORTED);
+                    return -1;
+                case AclRead::kFailed:
+                    return NORVO_FAIL_ERRNO(errno);
             }
         }
         if (link) {
@@ -432,7 +444,8 @@ int QUIBACLPermGet(const char *path, unsigned int *mask) {
         if (!generic || read == AclRead::kMalformed) {
             return KernelMask(path, info, mount, mask, pass, name);
         }
-        return EvaluatedMask(path, info, mount, read == AclRead::kFound ? &entries : nullptr, mask, pass, name);
+        return EvaluatedMask(path, info, mount, read == AclRead::kFound ? &entries : nullptr, mask, pass,
+                             name);
     });
 }
 
@@ -452,7 +465,8 @@ int QUIBACLIsSupport(const char *path, int fd, int flags) {
         } else {
             const char *name = nullptr;
             QUIBDirPass *pass = PassOf(path, &name);
-            if (const int err = StatEntry(path, pass, name, STATX_TYPE | acl::MountIdMask(), &info); err != 0) {
+            if (const int err = StatEntry(path, pass, name, STATX_TYPE | acl::MountIdMask(), &info);
+                err != 0) {
                 return NORVO_FAIL_ERRNO(err);
             }
         }

@@ -13,9 +13,9 @@
 #include "app_privilege.h"
 
 #include "api_guard.h"
-#include "parsed_file.h"
 #include "name_list.h"
 #include "nss.h"
+#include "parsed_file.h"
 #include "quib_paths.h"
 #include "quib_user.h"
 #include "settings_format.h"
@@ -58,13 +58,13 @@ int HasPrivilege(const char *userName, const char *priv) {
     NssUser user;
     int err = 0;
     switch (FindUserByName(userName, &user, &err)) {
-    case NssStatus::kFound:
-        break;
-    case NssStatus::kNotFound:
-        return 0;
-    case NssStatus::kFailed:
-        QUIB_SET_ERR(NssFailureCode(err));
-        return 0;
+        case NssStatus::kFound:
+            break;
+        case NssStatus::kNotFound:
+            return 0;
+        case NssStatus::kFailed:
+            QUIB_SET_ERR(NssFailureCode(err));
+            return 0;
     }
     ListMatcher matcher(userName);
     std::string adminEntry = std::string("@") + QUIB_ADMIN_GROUP;

@@ -104,7 +104,8 @@ std::vector<std::string> RequestSids() {
     if (const char *cookie = getenv("HTTP_COOKIE"); cookie != nullptr && FindCookie(cookie, "id", &value)) {
         sids.push_back(value);
     }
-    if (const char *query = getenv("QUERY_STRING"); query != nullptr && FindQueryParameter(query, "_sid", &value)) {
+    if (const char *query = getenv("QUERY_STRING");
+        query != nullptr && FindQueryParameter(query, "_sid", &value)) {
         sids.push_back(value);
     }
     return sids;

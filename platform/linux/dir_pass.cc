@@ -25,8 +25,8 @@ thread_local QUIBDirPass *t_current = nullptr;
 
 // Every field that VLIBCFileLStat, QUIBACLPermGet or QUIBACLIsSupport asks for.
 unsigned EntryFields() {
-    return STATX_TYPE | STATX_MODE | STATX_UID | STATX_GID | STATX_SIZE | STATX_ATIME | STATX_MTIME | STATX_CTIME |
-           STATX_BTIME | acl::MountIdMask();
+    return STATX_TYPE | STATX_MODE | STATX_UID | STATX_GID | STATX_SIZE | STATX_ATIME | STATX_MTIME |
+           STATX_CTIME | STATX_BTIME | acl::MountIdMask();
 }
 
 // getxattrat's argument block (include/uapi/linux/xattr.h).
@@ -85,10 +85,11 @@ int PassEntryStat(QUIBDirPass *pass, const char *name, struct statx *info) {
 
 int PassDirStat(QUIBDirPass *pass, struct statx *info) {
     if (!pass->dirKnown) {
-        pass->dirError = statx(pass->dir.Get(), "", AT_EMPTY_PATH,
-                               STATX_TYPE | STATX_MODE | STATX_UID | STATX_GID | acl::MountIdMask(), &pass->dirInfo) == 0
-                             ? 0
-                             : errno;
+        pass->dirError =
+            statx(pass->dir.Get(), "", AT_EMPTY_PATH,
+                  STATX_TYPE | STATX_MODE | STATX_UID | STATX_GID | acl::MountIdMask(), &pass->dirInfo) == 0
+                ? 0
+                : errno;
         pass->dirKnown = true;
     }
     if (pass->dirError == 0) {
@@ -107,8 +108,8 @@ const acl::Identity *PassIdentity(QUIBDirPass *pass) {
     return &pass->identity;
 }
 
-ssize_t PassGetXattr(QUIBDirPass *pass, const char *name, const char *path, const char *attribute, void *value,
-                     size_t size) {
+ssize_t PassGetXattr(QUIBDirPass *pass, const char *name, const char *path, const char *attribute,
+                     void *value, size_t size) {
     if (!g_noGetxattrat.load(std::memory_order_relaxed) && size <= UINT32_MAX) {
         XattrArgs args{reinterpret_cast<uintptr_t>(value), static_cast<uint32_t>(size), 0};
         const long got = syscall(SYS_getxattrat, pass->dir.Get(), name, AT_SYMLINK_NOFOLLOW, attribute, &args,

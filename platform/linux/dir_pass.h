@@ -51,7 +51,7 @@ const acl::Identity *PassIdentity(QUIBDirPass *pass);
 
 // lgetxattr of the entry, resolved in the pass's directory; path (the entry's whole path) is
 // used instead on kernels without getxattrat.
-ssize_t PassGetXattr(QUIBDirPass *pass, const char *name, const char *path, const char *attribute, void *value,
-                     size_t size);
+ssize_t PassGetXattr(QUIBDirPass *pass, const char *name, const char *path, const char *attribute,
+                     void *value, size_t size);
 
 }  // namespace norvo::platform

@@ -34,27 +34,27 @@ int VLIBCErrorGetLine(void) {
 
 int VLIBCErrFromErrno(int err) {
     switch (err) {
-    case EACCES:
-    case EPERM:
-        return QUIB_ERR_ACCESS_DENIED;
-    case ENOENT:
-        return QUIB_ERR_NO_SUCH_FILE;
-    case ENOTDIR:
-        return QUIB_ERR_NO_SUCH_PATH;
-    case EDQUOT:
-        return QUIB_ERR_QUOTA;
-    case ENOSPC:
-        return QUIB_ERR_NO_SPACE;
-    case EROFS:
-        return QUIB_ERR_READ_ONLY_FS;
-    case ENAMETOOLONG:
-        return QUIB_ERR_NAME_TOO_LONG;
-    case ENOMEM:
-        return QUIB_ERR_NO_MEMORY;
-    case EINVAL:
-        return QUIB_ERR_BAD_PARAMETER;
-    default:
-        return QUIB_ERR_FAILED;
+        case EACCES:
+        case EPERM:
+            return QUIB_ERR_ACCESS_DENIED;
+        case ENOENT:
+            return QUIB_ERR_NO_SUCH_FILE;
+        case ENOTDIR:
+            return QUIB_ERR_NO_SUCH_PATH;
+        case EDQUOT:
+            return QUIB_ERR_QUOTA;
+        case ENOSPC:
+            return QUIB_ERR_NO_SPACE;
+        case EROFS:
+            return QUIB_ERR_READ_ONLY_FS;
+        case ENAMETOOLONG:
+            return QUIB_ERR_NAME_TOO_LONG;
+        case ENOMEM:
+            return QUIB_ERR_NO_MEMORY;
+        case EINVAL:
+            return QUIB_ERR_BAD_PARAMETER;
+        default:
+            return QUIB_ERR_FAILED;
     }
 }
 

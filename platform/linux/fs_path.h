@@ -30,6 +30,4 @@ int FailWithErrno(int err, const char *file, int line);
 // Fails the current call with err, recording the caller's place.
 #define NORVO_FAIL_ERRNO(err) ::norvo::platform::FailWithErrno((err), QUIB_SOURCE_NAME, __LINE__)
 
-namespace norvo::platform {
-
-}  // namespace norvo::platform
+namespace norvo::platform {}  // namespace norvo::platform

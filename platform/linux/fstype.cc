@@ -108,31 +108,31 @@ int FsTypeIndexOf(std::string_view type, std::string_view source) {
 
 int FsTypeIndexOfMagic(long magic) {
     switch (static_cast<unsigned long>(magic) & 0xFFFFFFFFul) {
-    case EXT4_SUPER_MAGIC:  // ext2, ext3 and ext4 share it; ext4 is the appliance's own
-        return FSTYPE_EXT4;
-    case MSDOS_SUPER_MAGIC:
-        return FSTYPE_FAT;
-    case BTRFS_SUPER_MAGIC:
-        return FSTYPE_BTRFS;
-    case TMPFS_MAGIC:
-        return FSTYPE_TMPFS;
-    case XFS_SUPER_MAGIC:
-        return FSTYPE_XFS;
-    case EXFAT_SUPER_MAGIC:
-        return FSTYPE_EXFAT;
-    case ISOFS_SUPER_MAGIC:
-    case UDF_SUPER_MAGIC:
-    case SQUASHFS_MAGIC:
-        return FSTYPE_ISO;
-    case SMB_SUPER_MAGIC:
-    case SMB2_SUPER_MAGIC:
-    case CIFS_SUPER_MAGIC:
-    case NFS_SUPER_MAGIC:
-    case CEPH_SUPER_MAGIC:
-    case V9FS_MAGIC:
-        return FSTYPE_REMOTE;
-    default:
-        return FSTYPE_UNKNOWN;
+        case EXT4_SUPER_MAGIC:  // ext2, ext3 and ext4 share it; ext4 is the appliance's own
+            return FSTYPE_EXT4;
+        case MSDOS_SUPER_MAGIC:
+            return FSTYPE_FAT;
+        case BTRFS_SUPER_MAGIC:
+            return FSTYPE_BTRFS;
+        case TMPFS_MAGIC:
+            return FSTYPE_TMPFS;
+        case XFS_SUPER_MAGIC:
+            return FSTYPE_XFS;
+        case EXFAT_SUPER_MAGIC:
+            return FSTYPE_EXFAT;
+        case ISOFS_SUPER_MAGIC:
+        case UDF_SUPER_MAGIC:
+        case SQUASHFS_MAGIC:
+            return FSTYPE_ISO;
+        case SMB_SUPER_MAGIC:
+        case SMB2_SUPER_MAGIC:
+        case CIFS_SUPER_MAGIC:
+        case NFS_SUPER_MAGIC:
+        case CEPH_SUPER_MAGIC:
+        case V9FS_MAGIC:
+            return FSTYPE_REMOTE;
+        default:
+            return FSTYPE_UNKNOWN;
     }
 }
 

@@ -70,8 +70,8 @@ int QUIBGroupGet(const char *name, PQUIBGROUP *pgroup) {
         QUIB_SET_ERR(QUIB_ERR_BAD_PARAMETER);
         return -1;
     }
-    return np::GetGroup([name](np::NssGroup *entry, int *err) { return np::FindGroupByName(name, entry, err); },
-                        pgroup);
+    return np::GetGroup(
+        [name](np::NssGroup *entry, int *err) { return np::FindGroupByName(name, entry, err); }, pgroup);
 }
 
 int QUIBGroupGetByGID(gid_t gid, PQUIBGROUP *pgroup, int blNoCache) {

@@ -7,8 +7,7 @@ namespace {
 
 // "." and ".." are here because walkers rely on this test alone to avoid looping.
 constexpr const char *kHiddenNames[] = {
-    ".",
-    "..",
+    ".",         "..",
     "@eaDir",     // extended attributes and thumbnails kept beside files
     "@tmp",       // a volume's scratch space
     "@sharebin",  // recycle bins kept by the platform outside the share tree

@@ -63,12 +63,12 @@ struct UserFree {
 
 bool EnabledFor(const HomeSettings &settings, AUTH_TYPE kind) {
     switch (kind) {
-    case AUTH_DOMAIN:
-        return settings.domain;
-    case AUTH_LDAP:
-        return settings.directory;
-    default:
-        return settings.local;
+        case AUTH_DOMAIN:
+            return settings.domain;
+        case AUTH_LDAP:
+            return settings.directory;
+        default:
+            return settings.local;
     }
 }
 
@@ -90,7 +90,8 @@ Home HomeOf(const QUIBUSER &user, std::string *home) {
         return Home::kNo;
     }
     *home = NormalizePath(user.szHome);
-    return !home->empty() && *home != settings.root && PathIsWithin(settings.root, *home) ? Home::kYes : Home::kNo;
+    return !home->empty() && *home != settings.root && PathIsWithin(settings.root, *home) ? Home::kYes
+                                                                                          : Home::kNo;
 }
 
 }  // namespace
@@ -124,13 +125,13 @@ int QUIBServiceHomePathGet(const char *user, char *buf, int size) {
         const std::unique_ptr<QUIBUSER, np::UserFree> record(raw);
         std::string home;
         switch (np::HomeOf(*record, &home)) {
-        case np::Home::kFailed:
-            return -1;
-        case np::Home::kNo:
-            QUIB_SET_ERR(QUIB_ERR_NO_PATH);
-            return -1;
-        case np::Home::kYes:
-            break;
+            case np::Home::kFailed:
+                return -1;
+            case np::Home::kNo:
+                QUIB_SET_ERR(QUIB_ERR_NO_PATH);
+                return -1;
+            case np::Home::kYes:
+                break;
         }
         if (home.size() + 1 > static_cast<size_t>(size)) {
             QUIB_SET_ERR(QUIB_ERR_NAME_TOO_LONG);

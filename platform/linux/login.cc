@@ -113,14 +113,14 @@ int QUIBLoginCreate(const char *user, const char *password, const char *remoteAd
         const UserRecord record(raw);
         int err = 0;
         switch (CheckPassword(record->szName, password, &err)) {
-        case PasswordCheck::kMatch:
-            break;
-        case PasswordCheck::kRefused:
-            QUIB_SET_ERR(QUIB_ERR_ACCESS_DENIED);
-            return -1;
-        case PasswordCheck::kFailed:
-            QUIB_SET_ERRNO(err);
-            return -1;
+            case PasswordCheck::kMatch:
+                break;
+            case PasswordCheck::kRefused:
+                QUIB_SET_ERR(QUIB_ERR_ACCESS_DENIED);
+                return -1;
+            case PasswordCheck::kFailed:
+                QUIB_SET_ERRNO(err);
+                return -1;
         }
         const int expired = QUIBUserIsExpired(record->szName);
         if (expired != 0) {

@@ -25,21 +25,21 @@ using Statement = std::unique_ptr<sqlite3_stmt, StatementFinalizer>;
 // The one translation of SQLite result codes into platform codes.
 int CodeOfSqlite(int rc) {
     switch (rc & 0xFF) {
-    case SQLITE_OK:
-    case SQLITE_DONE:
-    case SQLITE_ROW:
-        return QUIB_ERR_NONE;
-    case SQLITE_NOMEM:
-        return QUIB_ERR_NO_MEMORY;
-    case SQLITE_FULL:
-        return QUIB_ERR_NO_SPACE;
-    case SQLITE_READONLY:
-        return QUIB_ERR_READ_ONLY_FS;
-    case SQLITE_PERM:
-    case SQLITE_AUTH:
-        return QUIB_ERR_ACCESS_DENIED;
-    default:
-        return QUIB_ERR_FAILED;
+        case SQLITE_OK:
+        case SQLITE_DONE:
+        case SQLITE_ROW:
+            return QUIB_ERR_NONE;
+        case SQLITE_NOMEM:
+            return QUIB_ERR_NO_MEMORY;
+        case SQLITE_FULL:
+            return QUIB_ERR_NO_SPACE;
+        case SQLITE_READONLY:
+            return QUIB_ERR_READ_ONLY_FS;
+        case SQLITE_PERM:
+        case SQLITE_AUTH:
+            return QUIB_ERR_ACCESS_DENIED;
+        default:
+            return QUIB_ERR_FAILED;
     }
 }
 
@@ -51,8 +51,8 @@ int Prepare(sqlite3 *db, const char *sql, Statement *out) {
 }
 
 int BindText(sqlite3_stmt *statement, int index, const std::string &text) {
-    return CodeOfSqlite(sqlite3_bind_text(statement, index, text.c_str(),
-                                          static_cast<int>(text.size()), SQLITE_TRANSIENT));
+    return CodeOfSqlite(
+        sqlite3_bind_text(statement, index, text.c_str(), static_cast<int>(text.size()), SQLITE_TRANSIENT));
 }
 
 // Runs a statement that returns no rows.
@@ -117,7 +117,8 @@ int OpenLoginDb(bool create, LoginDb *db) {
         return code;
     }
     sqlite3 *raw = nullptr;
-    const int rc = sqlite3_open_v2(QUIB_LOGIN_DB, &raw, SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOFOLLOW, nullptr);
+    const int rc =
+        sqlite3_open_v2(QUIB_LOGIN_DB, &raw, SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOFOLLOW, nullptr);
     db->reset(raw);
     if (rc != SQLITE_OK) {
         return CodeOfSqlite(rc);

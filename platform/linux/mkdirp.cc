@@ -87,8 +87,8 @@ void ReportStop(char *stopAt, int stopAtSize, std::string_view where) {
 
 using namespace norvo::platform;
 
-extern "C" int QUIBFSMkdirP(const char *path, char *stopAt, int stopAtSize, int recursive,
-                            uid_t uid, gid_t gid, mode_t mode) {
+extern "C" int QUIBFSMkdirP(const char *path, char *stopAt, int stopAtSize, int recursive, uid_t uid,
+                            gid_t gid, mode_t mode) {
     if (const int err = CheckPathArgument(path)) {
         ReportStop(stopAt, stopAtSize, path != nullptr ? path : "");
         return NORVO_FAIL_ERRNO(err);
@@ -114,8 +114,8 @@ extern "C" int QUIBFSMkdirP(const char *path, char *stopAt, int stopAtSize, int 
         }
         for (size_t i = first; i < parts.size(); ++i) {
             FileDescriptor next;
-            const int err = MakeOne(parent, std::string(parts[i].name), i + 1 == parts.size(), uid,
-                                    gid, mode & 07777, &next);
+            const int err = MakeOne(parent, std::string(parts[i].name), i + 1 == parts.size(), uid, gid,
+                                    mode & 07777, &next);
             if (err != 0) {
                 ReportStop(stopAt, stopAtSize, whole.substr(0, parts[i].end));
                 return NORVO_FAIL_ERRNO(err);

@@ -77,12 +77,12 @@ int ListMatcher::Matches(std::string_view entry) {
     NssGroup group;
     int err = 0;
     switch (FindGroupByName(groupName, &group, &err)) {
-    case NssStatus::kFound:
-        return std::find(gids_.begin(), gids_.end(), group.gid) != gids_.end() ? 1 : 0;
-    case NssStatus::kNotFound:
-        return 0;
-    case NssStatus::kFailed:
-        break;
+        case NssStatus::kFound:
+            return std::find(gids_.begin(), gids_.end(), group.gid) != gids_.end() ? 1 : 0;
+        case NssStatus::kNotFound:
+            return 0;
+        case NssStatus::kFailed:
+            break;
     }
     QUIB_SET_ERR(NssFailureCode(err));
     return -1;
@@ -95,18 +95,18 @@ int ListMatcher::LoadGroups() {
     NssUser user;
     int err = 0;
     switch (FindUserByName(user_, &user, &err)) {
-    case NssStatus::kFound:
-        if (!GroupIdsOf(user, &gids_)) {
-            QUIB_SET_ERR(QUIB_ERR_FAILED);
+        case NssStatus::kFound:
+            if (!GroupIdsOf(user, &gids_)) {
+                QUIB_SET_ERR(QUIB_ERR_FAILED);
+                return -1;
+            }
+            break;
+        case NssStatus::kNotFound:
+            gids_.clear();
+            break;
+        case NssStatus::kFailed:
+            QUIB_SET_ERR(NssFailureCode(err));
             return -1;
-        }
-        break;
-    case NssStatus::kNotFound:
-        gids_.clear();
-        break;
-    case NssStatus::kFailed:
-        QUIB_SET_ERR(NssFailureCode(err));
-        return -1;
     }
     loaded_ = true;
     return 0;

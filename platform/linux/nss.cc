@@ -75,11 +75,10 @@ void CopyGroup(const group &gr, NssGroup *out) {
 NssStatus FindUserByName(const std::string &name, NssUser *user, int *err) {
     passwd pw{};
     std::vector<char> buffer;
-    NssStatus status = Lookup(
-        [&name](passwd *rec, char *buf, size_t size, passwd **result) {
-            return getpwnam_r(name.c_str(), rec, buf, size, result);
-        },
-        &pw, &buffer, _SC_GETPW_R_SIZE_MAX, err);
+    NssStatus status =
+        Lookup([&name](passwd *rec, char *buf, size_t size,
+                       passwd **result) { return getpwnam_r(name.c_str(), rec, buf, size, result); },
+               &pw, &buffer, _SC_GETPW_R_SIZE_MAX, err);
     if (status == NssStatus::kFound) {
         CopyUser(pw, user);
     }
@@ -89,11 +88,9 @@ NssStatus FindUserByName(const std::string &name, NssUser *user, int *err) {
 NssStatus FindUserById(uid_t uid, NssUser *user, int *err) {
     passwd pw{};
     std::vector<char> buffer;
-    NssStatus status = Lookup(
-        [uid](passwd *rec, char *buf, size_t size, passwd **result) {
-            return getpwuid_r(uid, rec, buf, size, result);
-        },
-        &pw, &buffer, _SC_GETPW_R_SIZE_MAX, err);
+    NssStatus status = Lookup([uid](passwd *rec, char *buf, size_t size,
+                                    passwd **result) { return getpwuid_r(uid, rec, buf, size, result); },
+                              &pw, &buffer, _SC_GETPW_R_SIZE_MAX, err);
     if (status == NssStatus::kFound) {
         CopyUser(pw, user);
     }
@@ -103,11 +100,10 @@ NssStatus FindUserById(uid_t uid, NssUser *user, int *err) {
 NssStatus FindGroupByName(const std::string &name, NssGroup *out, int *err) {
     group gr{};
     std::vector<char> buffer;
-    NssStatus status = Lookup(
-        [&name](group *rec, char *buf, size_t size, group **result) {
-            return getgrnam_r(name.c_str(), rec, buf, size, result);
-        },
-        &gr, &buffer, _SC_GETGR_R_SIZE_MAX, err);
+    NssStatus status =
+        Lookup([&name](group *rec, char *buf, size_t size,
+                       group **result) { return getgrnam_r(name.c_str(), rec, buf, size, result); },
+               &gr, &buffer, _SC_GETGR_R_SIZE_MAX, err);
     if (status == NssStatus::kFound) {
         CopyGroup(gr, out);
     }
@@ -117,11 +113,9 @@ NssStatus FindGroupByName(const std::string &name, NssGroup *out, int *err) {
 NssStatus FindGroupById(gid_t gid, NssGroup *out, int *err) {
     group gr{};
     std::vector<char> buffer;
-    NssStatus status = Lookup(
-        [gid](group *rec, char *buf, size_t size, group **result) {
-            return getgrgid_r(gid, rec, buf, size, result);
-        },
-        &gr, &buffer, _SC_GETGR_R_SIZE_MAX, err);
+    NssStatus status = Lookup([gid](group *rec, char *buf, size_t size,
+                                    group **result) { return getgrgid_r(gid, rec, buf, size, result); },
+                              &gr, &buffer, _SC_GETGR_R_SIZE_MAX, err);
     if (status == NssStatus::kFound) {
         CopyGroup(gr, out);
     }
@@ -131,11 +125,10 @@ NssStatus FindGroupById(gid_t gid, NssGroup *out, int *err) {
 NssStatus FindShadowExpiry(const std::string &name, long *expireDay, int *err) {
     spwd sp{};
     std::vector<char> buffer;
-    NssStatus status = Lookup(
-        [&name](spwd *rec, char *buf, size_t size, spwd **result) {
-            return getspnam_r(name.c_str(), rec, buf, size, result);
-        },
-        &sp, &buffer, _SC_GETPW_R_SIZE_MAX, err);
+    NssStatus status =
+        Lookup([&name](spwd *rec, char *buf, size_t size,
+                       spwd **result) { return getspnam_r(name.c_str(), rec, buf, size, result); },
+               &sp, &buffer, _SC_GETPW_R_SIZE_MAX, err);
     if (status == NssStatus::kFound) {
         *expireDay = sp.sp_expire;
     }

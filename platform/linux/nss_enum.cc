@@ -50,30 +50,36 @@ bool Enumerate(Next next, Keep keep, int *err) {
 bool EnumerateUsers(std::vector<NssUser> *users, int *err) {
     setpwent();
     ScopeExit end([] { endpwent(); });
-    return Enumerate<passwd>(getpwent_r, [users](const passwd &pw) {
-        NssUser user;
-        user.name = pw.pw_name != nullptr ? pw.pw_name : "";
-        user.uid = pw.pw_uid;
-        user.gid = pw.pw_gid;
-        user.gecos = pw.pw_gecos != nullptr ? pw.pw_gecos : "";
-        user.home = pw.pw_dir != nullptr ? pw.pw_dir : "";
-        user.shell = pw.pw_shell != nullptr ? pw.pw_shell : "";
-        users->push_back(std::move(user));
-    }, err);
+    return Enumerate<passwd>(
+        getpwent_r,
+        [users](const passwd &pw) {
+            NssUser user;
+            user.name = pw.pw_name != nullptr ? pw.pw_name : "";
+            user.uid = pw.pw_uid;
+            user.gid = pw.pw_gid;
+            user.gecos = pw.pw_gecos != nullptr ? pw.pw_gecos : "";
+            user.home = pw.pw_dir != nullptr ? pw.pw_dir : "";
+            user.shell = pw.pw_shell != nullptr ? pw.pw_shell : "";
+            users->push_back(std::move(user));
+        },
+        err);
 }
 
 bool EnumerateGroups(std::vector<NssGroup> *groups, int *err) {
     setgrent();
     ScopeExit end([] { endgrent(); });
-    return Enumerate<group>(getgrent_r, [groups](const group &gr) {
-        NssGroup entry;
-        entry.name = gr.gr_name != nullptr ? gr.gr_name : "";
-        entry.gid = gr.gr_gid;
-        for (char **member = gr.gr_mem; member != nullptr && *member != nullptr; ++member) {
-            entry.members.emplace_back(*member);
-        }
-        groups->push_back(std::move(entry));
-    }, err);
+    return Enumerate<group>(
+        getgrent_r,
+        [groups](const group &gr) {
+            NssGroup entry;
+            entry.name = gr.gr_name != nullptr ? gr.gr_name : "";
+            entry.gid = gr.gr_gid;
+            for (char **member = gr.gr_mem; member != nullptr && *member != nullptr; ++member) {
+                entry.members.emplace_back(*member);
+            }
+            groups->push_back(std::move(entry));
+        },
+        err);
 }
 
 }  // namespace norvo::platform

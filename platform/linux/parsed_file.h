@@ -62,7 +62,9 @@ public:
     [[nodiscard]] int Get(std::shared_ptr<const T> *out) {
         std::shared_ptr<const void> parsed;
         const int err = GetParsed(
-            [this](std::string_view text) { return std::shared_ptr<const void>(std::make_shared<const T>(parse_(text))); },
+            [this](std::string_view text) {
+                return std::shared_ptr<const void>(std::make_shared<const T>(parse_(text)));
+            },
             &parsed);
         if (err == 0) {
             *out = std::static_pointer_cast<const T>(parsed);

@@ -17,7 +17,7 @@ bool IsRootOnly(const struct stat &st, mode_t type, mode_t othersMay) {
 // A link or a non-directory where a directory must be is a refusal, not a system failure.
 int CodeOfOpen(int err) {
     return err == ELOOP || err == ENOTDIR || err == EISDIR || err == ENXIO ? QUIB_ERR_ACCESS_DENIED
-                                                                          : VLIBCErrFromErrno(err);
+                                                                           : VLIBCErrFromErrno(err);
 }
 
 int OpenComponent(int parent, const std::string &name, bool mayCreate, FileDescriptor *out) {

@@ -378,8 +378,7 @@ int VLIBCFileSetKeyValue(const char *file, const char *key, const char *value, i
     if (!np::CheckFileArg(file)) {
         return -1;
     }
-    if (key == nullptr || value == nullptr || (format != 0 && format != 1) ||
-        !np::IsWritableKey(key) ||
+    if (key == nullptr || value == nullptr || (format != 0 && format != 1) || !np::IsWritableKey(key) ||
         !np::IsWritableValue(std::string_view(value, strnlen(value, np::kMaxSettingsValueLength + 1)),
                              format)) {
         QUIB_SET_ERR(QUIB_ERR_BAD_PARAMETER);

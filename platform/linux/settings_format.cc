@@ -27,8 +27,7 @@ std::string UnquoteDouble(std::string_view rest) {
 // A single-quoted value is literal up to the next quote.
 std::string UnquoteSingle(std::string_view rest) {
     size_t close = rest.find('\'', 1);
-    return std::string(rest.substr(1, close == std::string_view::npos ? std::string_view::npos
-                                                                        : close - 1));
+    return std::string(rest.substr(1, close == std::string_view::npos ? std::string_view::npos : close - 1));
 }
 
 // The keys a reader may ask for (VLIBCFileGetKeyValue and the others refuse the rest).
@@ -118,9 +117,8 @@ std::string RenderSettings(const std::vector<SettingsLine> &lines) {
 }
 
 bool IsWritableKey(std::string_view key) {
-    if (key.empty() || key.size() > kMaxSettingsKeyLength || !IsValidUtf8(key) ||
-        HasControl(key, false) || key.front() == '#' || key.front() == '"' ||
-        key.front() == '\'') {
+    if (key.empty() || key.size() > kMaxSettingsKeyLength || !IsValidUtf8(key) || HasControl(key, false) ||
+        key.front() == '#' || key.front() == '"' || key.front() == '\'') {
         return false;
     }
     for (char c : key) {
@@ -136,8 +134,7 @@ bool IsWritableValue(std::string_view value, int format) {
         return false;
     }
     if (format == 1 && !value.empty()) {
-        return TrimSpace(value).size() == value.size() && value.front() != '"' &&
-               value.front() != '\'';
+        return TrimSpace(value).size() == value.size() && value.front() != '"' && value.front() != '\'';
     }
     return true;
 }

@@ -12,14 +12,14 @@ struct ShareEntry {
     std::string name;
     std::string path;  // normalised, absolute, never "/"
     std::string comment;
-    std::string noAccess;   // NormalizeNameList form
+    std::string noAccess;  // NormalizeNameList form
     std::string readWrite;
     std::string readOnly;
     unsigned status = 0;    // SHARE_STATUS_*
     unsigned restrict = 0;  // SHARE_RESTRICT_*
     int ftpPrivilege = 0;   // 0 none, 1 read-only, 2 read-write
     bool aclMode = true;
-    bool synced = false;    // "synced = yes": synchronised to another appliance
+    bool synced = false;  // "synced = yes": synchronised to another appliance
 };
 
 // The shares of text in file order. Sections that can't be trusted are skipped whole, so a

@@ -53,9 +53,8 @@ ShareRecord MakeRecord(const ShareEntry &entry) {
         record->ftpPrivilege = entry.ftpPrivilege;
         record->blAclMode = entry.aclMode ? 1 : 0;
     }
-    if (!record || record->szName == nullptr || record->szPath == nullptr ||
-        record->szComment == nullptr || record->szNoAccessList == nullptr ||
-        record->szRWList == nullptr || record->szROList == nullptr) {
+    if (!record || record->szName == nullptr || record->szPath == nullptr || record->szComment == nullptr ||
+        record->szNoAccessList == nullptr || record->szRWList == nullptr || record->szROList == nullptr) {
         QUIB_SET_ERR(QUIB_ERR_NO_MEMORY);
         return ShareRecord();
     }
@@ -93,9 +92,9 @@ int QUIBShareGet(const char *name, PQUIBSHARE *pshare) {
         return -1;
     }
     bool isPath = name[0] == '/';
-    bool acceptable = isPath ? strnlen(name, np::kMaxSharePathArg + 1) <= np::kMaxSharePathArg &&
-                                   np::IsValidUtf8(name)
-                             : np::IsAcceptableName(name);
+    bool acceptable =
+        isPath ? strnlen(name, np::kMaxSharePathArg + 1) <= np::kMaxSharePathArg && np::IsValidUtf8(name)
+               : np::IsAcceptableName(name);
     // No share can carry such a name: the answer is the ordinary "no such share".
     if (!acceptable) {
         QUIB_SET_ERR(name[0] == '\0' ? QUIB_ERR_BAD_PARAMETER : QUIB_ERR_NO_SUCH_SHARE);
@@ -197,4 +196,3 @@ int BlSDKUserIsInList(const char *user, const char *list) {
 }
 
 }  // extern "C"
-

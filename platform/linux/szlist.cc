@@ -13,8 +13,8 @@
 
 namespace {
 
-constexpr int kKnownSortFlags = SZLIST_SORT_DESC | SZLIST_SORT_NUMERIC |
-                                SZLIST_SORT_CASE_SENSITIVE | SZLIST_SORT_CASE_INSENSITIVE;
+constexpr int kKnownSortFlags =
+    SZLIST_SORT_DESC | SZLIST_SORT_NUMERIC | SZLIST_SORT_CASE_SENSITIVE | SZLIST_SORT_CASE_INSENSITIVE;
 
 bool IsUsable(const SZLIST *list) {
     return list != nullptr && list->nItem >= 0 && list->nAlloc >= list->nItem &&
@@ -137,8 +137,7 @@ void VLIBCSzListRemoveAll(PSZLIST list) {
 }
 
 int VLIBCSzListSortItems(PSZLIST list, int flags) {
-    bool bothCases = (flags & SZLIST_SORT_CASE_SENSITIVE) != 0 &&
-                     (flags & SZLIST_SORT_CASE_INSENSITIVE) != 0;
+    bool bothCases = (flags & SZLIST_SORT_CASE_SENSITIVE) != 0 && (flags & SZLIST_SORT_CASE_INSENSITIVE) != 0;
     if (!IsUsable(list) || (flags & ~kKnownSortFlags) != 0 || bothCases) {
         QUIB_SET_ERR(QUIB_ERR_BAD_PARAMETER);
         return -1;

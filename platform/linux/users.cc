@@ -71,7 +71,8 @@ int QUIBUserGetByUID(uid_t uid, PQUIBUSER *puser, int blNoCache) {
         QUIB_SET_ERR(QUIB_ERR_BAD_PARAMETER);
         return -1;
     }
-    return np::GetUser([uid](np::NssUser *entry, int *err) { return np::FindUserById(uid, entry, err); }, puser);
+    return np::GetUser([uid](np::NssUser *entry, int *err) { return np::FindUserById(uid, entry, err); },
+                       puser);
 }
 
 void QUIBUserFree(PQUIBUSER user) {
@@ -110,13 +111,13 @@ int QUIBUserIsExpired(const char *name) {
         int err = 0;
         long expireDay = -1;
         switch (np::FindShadowExpiry(entry.name, &expireDay, &err)) {
-        case np::NssStatus::kFound:
-            break;
-        case np::NssStatus::kNotFound:
-            return 0;  // domain and directory accounts have no shadow entry
-        case np::NssStatus::kFailed:
-            QUIB_SET_ERR(np::NssFailureCode(err));
-            return -1;
+            case np::NssStatus::kFound:
+                break;
+            case np::NssStatus::kNotFound:
+                return 0;  // domain and directory accounts have no shadow entry
+            case np::NssStatus::kFailed:
+                QUIB_SET_ERR(np::NssFailureCode(err));
+                return -1;
         }
         if (expireDay < 0) {
             return 0;

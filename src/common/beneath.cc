@@ -52,7 +52,8 @@ OwnedFd OpenComponentwise(int top, const std::string &below, int flags) {
             }
             continue;
         }
-        OwnedFd next(openat(at, name.c_str(), (last ? flags : O_PATH | O_DIRECTORY) | O_NOFOLLOW | O_CLOEXEC));
+        OwnedFd next(
+            openat(at, name.c_str(), (last ? flags : O_PATH | O_DIRECTORY) | O_NOFOLLOW | O_CLOEXEC));
         if (!next.IsOpen()) {
             // O_DIRECTORY answers ENOTDIR for a link to a folder: say it is a link.
             const int err = errno;
@@ -121,8 +122,8 @@ bool TopOf(const std::string &userPath, const std::string &realPath, std::string
     }
     const size_t slash = userPath.find('/', 1);
     const size_t restSize = slash == std::string::npos ? 0 : userPath.size() - slash;
-    if (realPath.size() <= restSize ||
-        realPath.compare(realPath.size() - restSize, restSize, userPath, userPath.size() - restSize, restSize) != 0) {
+    if (realPath.size() <= restSize || realPath.compare(realPath.size() - restSize, restSize, userPath,
+                                                        userPath.size() - restSize, restSize) != 0) {
         return false;
     }
     *top = realPath.substr(0, realPath.size() - restSize);

@@ -132,7 +132,9 @@ int NvoLibRealFullPathGet(const char *path, char *out, int size) {
         norvo::CString resolved(realpath(path, nullptr));
         if (!resolved) {
             const int err = errno;
-            NvoLibSetErr(err == ENOENT ? NVO_ERR_NO_PATH : err == EACCES ? NVO_ERR_PRIVILEGE : NVO_ERR_SYSTEM);
+            NvoLibSetErr(err == ENOENT   ? NVO_ERR_NO_PATH
+                         : err == EACCES ? NVO_ERR_PRIVILEGE
+                                         : NVO_ERR_SYSTEM);
             errno = err;
             NVO_LOG(kNorvoDir, "%s:%d readpath(%s) fail (%m)", path);
             return 0;

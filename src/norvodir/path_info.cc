@@ -26,19 +26,20 @@ int PathInfoFactory::create(const char *user, const std::string &path, PathInfo 
             VLIBCErrSetEx(QUIB_ERR_BAD_PARAMETER, kNorvoEnum, 767);
             return 0;
         }
-        if (NvoFullPathGet(out.userPath.c_str(), out.fullPath, out.shareName, out.volumePath, out.sharePath, user)) {
+        if (NvoFullPathGet(out.userPath.c_str(), out.fullPath, out.shareName, out.volumePath, out.sharePath,
+                           user)) {
             return 1;
         }
         switch (NvoLibGetErr()) {
-        case NVO_ERR_NO_PATH:
-            VLIBCErrSetEx(QUIB_ERR_NO_PATH, kNorvoEnum, 774);
-            break;
-        case NVO_ERR_GENERAL:
-            VLIBCErrSetEx(QUIB_ERR_BAD_PARAMETER, kNorvoEnum, 777);
-            break;
-        default:
-            VLIBCErrSetEx(QUIB_ERR_INTERNAL, kNorvoEnum, 781);
-            break;
+            case NVO_ERR_NO_PATH:
+                VLIBCErrSetEx(QUIB_ERR_NO_PATH, kNorvoEnum, 774);
+                break;
+            case NVO_ERR_GENERAL:
+                VLIBCErrSetEx(QUIB_ERR_BAD_PARAMETER, kNorvoEnum, 777);
+                break;
+            default:
+                VLIBCErrSetEx(QUIB_ERR_INTERNAL, kNorvoEnum, 781);
+                break;
         }
         NVO_LOG_AT(kNorvoEnum, 784, "%s:%d Fail to get the Full Path, %s", path.c_str());
         return 0;

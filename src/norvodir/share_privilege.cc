@@ -41,8 +41,8 @@ int NvoLibGetPrivilege(const char *path, const char *user, const char *sid, int 
         const int admin = QUIBGroupIsAdminGroupMem(user);
         if (admin == -1) {
             NvoLibSetErr(NVO_ERR_SYSTEM);
-            NVO_LOG(kNorvoDir, "%s:%d QUIBGroupIsAdminGroupMem(%s) failed. [0x%04X %s:%d]", norvo::OrNull(user),
-                    VLIBCErrGet(), VLIBCErrorGetFile(), VLIBCErrorGetLine());
+            NVO_LOG(kNorvoDir, "%s:%d QUIBGroupIsAdminGroupMem(%s) failed. [0x%04X %s:%d]",
+                    norvo::OrNull(user), VLIBCErrGet(), VLIBCErrorGetFile(), VLIBCErrorGetLine());
             return -1;
         }
         // The privilege of a share is only ever judged on a path that resolves into that share.
@@ -90,7 +90,8 @@ int NvoLibHasPrivilege(const char *path, const char *user, const char *sid, int 
         NvoLibSetErr(NVO_ERR_NONE);
         if (path == nullptr || user == nullptr) {
             NvoLibSetErr(NVO_ERR_SYSTEM);
-            NVO_LOG(kNorvoDir, "%s(%d): bad parameter! username=%s, path=%s", norvo::OrNull(user), norvo::OrNull(path));
+            NVO_LOG(kNorvoDir, "%s(%d): bad parameter! username=%s, path=%s", norvo::OrNull(user),
+                    norvo::OrNull(path));
             return -1;
         }
         int priv = kNoAccess;

@@ -108,7 +108,8 @@ public:
     size_t Count() const { return earlier_.size() + kept_.Size(); }
 
     norvo::SortFacts FactsAt(size_t i) const {
-        return i < earlier_.size() ? norvo::SortFactsOf(rule_, *earlier_[i]) : kept_.FactsAt(i - earlier_.size());
+        return i < earlier_.size() ? norvo::SortFactsOf(rule_, *earlier_[i])
+                                   : kept_.FactsAt(i - earlier_.size());
     }
 
     // Makes out the records at order[first, last): earlier records are moved, kept entries
@@ -182,12 +183,12 @@ int NvoEnum::NvoLibDirEntryListEnum(const char *userPath, const char *realPath, 
         *total = 0;
         norvo::OwnedFd opened;
         switch (OpenListed(top, realPath, &opened)) {
-        case Opened::kFailed:
-            return 0;
-        case Opened::kUnreadable:
-            return 1;
-        case Opened::kReadable:
-            break;
+            case Opened::kFailed:
+                return 0;
+            case Opened::kUnreadable:
+                return 1;
+            case Opened::kReadable:
+                break;
         }
         // Entries are stat'ed and judged in the directory opened, never by walking the path
         // again (which a link swapped in meanwhile could redirect).
@@ -226,7 +227,8 @@ int NvoEnum::NvoLibDirEntryListEnum(const char *userPath, const char *realPath, 
         Positions positions(out, kept, rule);
         std::vector<size_t> order;
         if (sortKey != nullptr) {
-            order = norvo::SortedPositions(positions.Count(), rule, [&](size_t i) { return positions.FactsAt(i); });
+            order = norvo::SortedPositions(positions.Count(), rule,
+                                           [&](size_t i) { return positions.FactsAt(i); });
         } else {
             order.resize(positions.Count());
             std::iota(order.begin(), order.end(), size_t{0});

@@ -47,8 +47,9 @@ void Dump(int info, const DIRENTRY_INFO &entry, Json::Value &json) {
     json["name"] = entry.name;
     json["path"] = entry.path;
     json["isdir"] = entry.isdir;
-    constexpr int kPrinted = NVO_INFO_REAL_PATH | NVO_INFO_SIZE | NVO_INFO_OWNER | NVO_INFO_TIME | NVO_INFO_PERM |
-                             NVO_INFO_TYPE | NVO_INFO_MOUNT_POINT_TYPE | NVO_INFO_VOLUME_STATUS;
+    constexpr int kPrinted = NVO_INFO_REAL_PATH | NVO_INFO_SIZE | NVO_INFO_OWNER | NVO_INFO_TIME |
+                             NVO_INFO_PERM | NVO_INFO_TYPE | NVO_INFO_MOUNT_POINT_TYPE |
+                             NVO_INFO_VOLUME_STATUS;
     if ((info & kPrinted) == 0) {
         return;
     }

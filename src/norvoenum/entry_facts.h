@@ -13,13 +13,13 @@ namespace norvo {
 
 struct EntryFacts {
     bool isdir = false;
-    uint64_t size = 0;             // NVO_INFO_SIZE
-    uint32_t mode = 0;             // NVO_INFO_PERM
-    uint32_t aclPrivilege = 0;     // NVO_INFO_PERM
-    bool isAclMode = false;        // NVO_INFO_PERM
+    uint64_t size = 0;                                    // NVO_INFO_SIZE
+    uint32_t mode = 0;                                    // NVO_INFO_PERM
+    uint32_t aclPrivilege = 0;                            // NVO_INFO_PERM
+    bool isAclMode = false;                               // NVO_INFO_PERM
     int32_t mtime = 0, ctime = 0, crtime = 0, atime = 0;  // NVO_INFO_TIME
-    uint32_t uid = 0, gid = 0;     // NVO_INFO_OWNER
-    const char *mountPointType = "";  // a literal: "", "iso", "remote" or "remotefail"
+    uint32_t uid = 0, gid = 0;                            // NVO_INFO_OWNER
+    const char *mountPointType = "";                      // a literal: "", "iso", "remote" or "remotefail"
 };
 
 enum class EntryVerdict {

@@ -31,7 +31,8 @@ SortFacts SortFactsOf(SortRule rule, const DIRENTRY_INFO &entry);
 // The positions 0..count-1 in EnumCompare's order of the facts factsAt(i) returns: directories
 // first, then the rule's field, then the case-insensitive name; ties keep their positions'
 // order. Throws std::bad_alloc only.
-std::vector<size_t> SortedPositions(size_t count, SortRule rule, const std::function<SortFacts(size_t)> &factsAt);
+std::vector<size_t> SortedPositions(size_t count, SortRule rule,
+                                    const std::function<SortFacts(size_t)> &factsAt);
 
 // The records [*first, *last) of count that the page of offset and limit keeps (see
 // NvoEnum::NvoLibDirEntrySlice): all of them when count or limit is 0.

@@ -27,26 +27,26 @@ bool DecidedBeforeName(SortRule rule, const SortFacts &a, const SortFacts &b, bo
         return true;
     }
     switch (rule) {
-    case SortRule::kName:
-        return false;
-    case SortRule::kSize:
-        // Sizes are unsigned: compared as such (folders carry 0 and so stay in name order).
-        if (static_cast<uint64_t>(a.value) != static_cast<uint64_t>(b.value)) {
-            *before = static_cast<uint64_t>(a.value) < static_cast<uint64_t>(b.value);
-            return true;
+        case SortRule::kName:
+            return false;
+        case SortRule::kSize:
+            // Sizes are unsigned: compared as such (folders carry 0 and so stay in name order).
+            if (static_cast<uint64_t>(a.value) != static_cast<uint64_t>(b.value)) {
+                *before = static_cast<uint64_t>(a.value) < static_cast<uint64_t>(b.value);
+                return true;
+            }
+            return false;
+        case SortRule::kType: {
+            const int order = VLIBCUnicodeUTF8StrCaseCmp(a.type, b.type);
+            *before = order < 0;
+            return order != 0;
         }
-        return false;
-    case SortRule::kType: {
-        const int order = VLIBCUnicodeUTF8StrCaseCmp(a.type, b.type);
-        *before = order < 0;
-        return order != 0;
-    }
-    default:
-        if (a.value != b.value) {
-            *before = a.value < b.value;
-            return true;
-        }
-        return false;
+        default:
+            if (a.value != b.value) {
+                *before = a.value < b.value;
+                return true;
+            }
+            return false;
     }
 }
 
@@ -70,7 +70,8 @@ SortRule SortRuleOf(const std::string &key) {
 
 }  // namespace norvo
 
-EnumCompare::EnumCompare(std::string key) : key_(std::move(key)), rule_(static_cast<int>(norvo::SortRuleOf(key_))) {}
+EnumCompare::EnumCompare(std::string key)
+    : key_(std::move(key)), rule_(static_cast<int>(norvo::SortRuleOf(key_))) {}
 
 bool EnumCompare::operator()(const DIRENTRY_INFO &a, const DIRENTRY_INFO &b) const {
     const auto rule = static_cast<SortRule>(rule_);
@@ -145,8 +146,8 @@ void SortByPositions(std::list<DIRENTRY_INFO> &list, SortRule rule) {
     for (auto it = list.begin(); it != list.end(); ++it) {
         nodes.push_back(it);
     }
-    const std::vector<size_t> order =
-        norvo::SortedPositions(nodes.size(), rule, [&](size_t i) { return norvo::SortFactsOf(rule, *nodes[i]); });
+    const std::vector<size_t> order = norvo::SortedPositions(
+        nodes.size(), rule, [&](size_t i) { return norvo::SortFactsOf(rule, *nodes[i]); });
     std::list<DIRENTRY_INFO> sorted;
     for (const size_t position : order) {
         sorted.splice(sorted.end(), list, nodes[position]);
@@ -161,38 +162,39 @@ namespace norvo {
 SortFacts SortFactsOf(SortRule rule, const DIRENTRY_INFO &entry) {
     SortFacts facts{entry.name.c_str(), entry.type.c_str(), 0, entry.isdir};
     switch (rule) {
-    case SortRule::kSize:
-        facts.value = entry.isdir ? 0 : static_cast<int64_t>(entry.size);
-        break;
-    case SortRule::kMtime:
-        facts.value = entry.mtime;
-        break;
-    case SortRule::kCrtime:
-        facts.value = entry.crtime;
-        break;
-    case SortRule::kCtime:
-        facts.value = entry.ctime;
-        break;
-    case SortRule::kAtime:
-        facts.value = entry.atime;
-        break;
-    // By number on purpose: the owner's id, not the owner's name, orders "user" and "group".
-    case SortRule::kUser:
-        facts.value = entry.uid;
-        break;
-    case SortRule::kGroup:
-        facts.value = entry.gid;
-        break;
-    case SortRule::kPosix:
-        facts.value = entry.mode & 0x1FFu;
-        break;
-    default:
-        break;
+        case SortRule::kSize:
+            facts.value = entry.isdir ? 0 : static_cast<int64_t>(entry.size);
+            break;
+        case SortRule::kMtime:
+            facts.value = entry.mtime;
+            break;
+        case SortRule::kCrtime:
+            facts.value = entry.crtime;
+            break;
+        case SortRule::kCtime:
+            facts.value = entry.ctime;
+            break;
+        case SortRule::kAtime:
+            facts.value = entry.atime;
+            break;
+        // By number on purpose: the owner's id, not the owner's name, orders "user" and "group".
+        case SortRule::kUser:
+            facts.value = entry.uid;
+            break;
+        case SortRule::kGroup:
+            facts.value = entry.gid;
+            break;
+        case SortRule::kPosix:
+            facts.value = entry.mode & 0x1FFu;
+            break;
+        default:
+            break;
     }
     return facts;
 }
 
-std::vector<size_t> SortedPositions(size_t count, SortRule rule, const std::function<SortFacts(size_t)> &factsAt) {
+std::vector<size_t> SortedPositions(size_t count, SortRule rule,
+                                    const std::function<SortFacts(size_t)> &factsAt) {
     std::vector<SortRef> refs;
     refs.reserve(count);
     std::string folded;

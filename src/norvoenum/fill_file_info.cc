@@ -24,12 +24,12 @@ namespace {
 // The type filter: false when the entry is of a kind the caller did not ask for.
 bool Wanted(_tag_dir_entry_type_ type, bool isDir) {
     switch (type) {
-    case DIR_ENTRY_TYPE_DIR:
-        return isDir;
-    case DIR_ENTRY_TYPE_FILE:
-        return !isDir;
-    default:
-        return true;
+        case DIR_ENTRY_TYPE_DIR:
+            return isDir;
+        case DIR_ENTRY_TYPE_FILE:
+            return !isDir;
+        default:
+            return true;
     }
 }
 
@@ -134,8 +134,8 @@ EntryVerdict ReadEntryFacts(NorvoMountStatus &mounts, const char *realPath, _tag
 
 }  // namespace norvo
 
-int NvoEnum::FillFileInfo(const char *userPath, const char *realPath, const char *name, _tag_dir_entry_type_ type,
-                          unsigned char dtype, int info, DIRENTRY_INFO &entry) {
+int NvoEnum::FillFileInfo(const char *userPath, const char *realPath, const char *name,
+                          _tag_dir_entry_type_ type, unsigned char dtype, int info, DIRENTRY_INFO &entry) {
     if (userPath == nullptr || realPath == nullptr || name == nullptr) {
         NvoLibSetErr(NVO_ERR_GENERAL);
         return -1;
@@ -150,15 +150,15 @@ int NvoEnum::FillFileInfo(const char *userPath, const char *realPath, const char
         const EntryVerdict verdict = norvo::ReadEntryFacts(*this, realPath, type, dtype, info, &facts);
         entry.isdir = facts.isdir;
         switch (verdict) {
-        case EntryVerdict::kKeep:
-            break;
-        case EntryVerdict::kUnreachable:
-            entry.mount_point_type = facts.mountPointType;
-            return 1;  // skipped, yet a listing keeps it
-        case EntryVerdict::kSkip:
-            return 1;
-        case EntryVerdict::kFail:
-            return -1;
+            case EntryVerdict::kKeep:
+                break;
+            case EntryVerdict::kUnreachable:
+                entry.mount_point_type = facts.mountPointType;
+                return 1;  // skipped, yet a listing keeps it
+            case EntryVerdict::kSkip:
+                return 1;
+            case EntryVerdict::kFail:
+                return -1;
         }
         if (info & NVO_INFO_MOUNT_POINT_TYPE) {
             entry.mount_point_type = facts.mountPointType;

@@ -44,7 +44,8 @@ inline bool AppendGroupIds(PSZLIST list, std::list<unsigned int> &ids) {
         }
         unsigned int id = 0;
         if (!ParseGroupId(element, &id)) {
-            NVO_LOG_AT(kNorvoEnum, 606, "%s:%d Get Error Formate from QUIBGroupInfoGetgroupList (%s)", element);
+            NVO_LOG_AT(kNorvoEnum, 606, "%s:%d Get Error Formate from QUIBGroupInfoGetgroupList (%s)",
+                       element);
             return false;
         }
         ids.push_back(id);

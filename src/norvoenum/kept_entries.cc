@@ -8,24 +8,24 @@ namespace {
 // The rule's field, as SortFactsOf reads it from a record filled with the same facts.
 int64_t SortValueOf(SortRule rule, const EntryFacts &facts) {
     switch (rule) {
-    case SortRule::kSize:
-        return facts.isdir ? 0 : static_cast<int64_t>(facts.size);
-    case SortRule::kMtime:
-        return facts.mtime;
-    case SortRule::kCrtime:
-        return facts.crtime;
-    case SortRule::kCtime:
-        return facts.ctime;
-    case SortRule::kAtime:
-        return facts.atime;
-    case SortRule::kUser:
-        return facts.uid;
-    case SortRule::kGroup:
-        return facts.gid;
-    case SortRule::kPosix:
-        return facts.mode & 0x1FFu;
-    default:
-        return 0;
+        case SortRule::kSize:
+            return facts.isdir ? 0 : static_cast<int64_t>(facts.size);
+        case SortRule::kMtime:
+            return facts.mtime;
+        case SortRule::kCrtime:
+            return facts.crtime;
+        case SortRule::kCtime:
+            return facts.ctime;
+        case SortRule::kAtime:
+            return facts.atime;
+        case SortRule::kUser:
+            return facts.uid;
+        case SortRule::kGroup:
+            return facts.gid;
+        case SortRule::kPosix:
+            return facts.mode & 0x1FFu;
+        default:
+            return 0;
     }
 }
 
@@ -62,11 +62,12 @@ void KeptEntries::Add(const char *name, const EntryFacts &facts) {
 
 SortFacts KeptEntries::FactsAt(size_t i) const {
     const Kept &kept = kept_[i];
-    return SortFacts{text_.data() + kept.nameAt, text_.data() + kept.typeAt, kept.sortValue, kept.facts.isdir};
+    return SortFacts{text_.data() + kept.nameAt, text_.data() + kept.typeAt, kept.sortValue,
+                     kept.facts.isdir};
 }
 
-void KeptEntries::Build(size_t i, const std::string &userDir, const std::string &realDir, NorvoUserEnum &names,
-                        DIRENTRY_INFO &entry) const {
+void KeptEntries::Build(size_t i, const std::string &userDir, const std::string &realDir,
+                        NorvoUserEnum &names, DIRENTRY_INFO &entry) const {
     const Kept &kept = kept_[i];
     const EntryFacts &facts = kept.facts;
     entry.name.assign(text_, kept.nameAt, kept.nameSize);

@@ -120,7 +120,8 @@ void AddShare(NvoEnum &listing, const char *user, const char *name, int info, bo
     const std::string shareName = share->GetName();
     const std::string realPath = share->GetFullPath();
     const std::string userPath = "/" + std::string(name);
-    const int filled = FillKeepingSlot(listing, userPath.c_str(), realPath.c_str(), shareName.c_str(), 0, info, entry);
+    const int filled =
+        FillKeepingSlot(listing, userPath.c_str(), realPath.c_str(), shareName.c_str(), 0, info, entry);
     FillVolumeStatus(listing, realPath.c_str(), info, entry);
     if (filled == 0 || entry.mount_point_type == kRemoteFail) {
         out.push_back(std::move(entry));

@@ -24,20 +24,20 @@ struct Requirement {
     unsigned int permission;
 };
 constexpr Requirement kRequirements[] = {
-    {0x1, ACL_PERM_READ},   {0x2, ACL_PERM_WRITE}, {0x4, ACL_PERM_EXECUTE},
+    {0x1, ACL_PERM_READ},   {0x2, ACL_PERM_WRITE},   {0x4, ACL_PERM_EXECUTE},
     {0x8, ACL_PERM_DELETE}, {0x10, ACL_PERM_APPEND},
 };
 
 int DirectoryErrno(int err) {
     switch (err) {
-    case ENOENT:
-    case ENOTDIR:
-        return NVO_ERR_NO_PATH;
-    case EACCES:
-    case EPERM:
-        return NVO_ERR_PRIVILEGE;
-    default:
-        return NVO_ERR_ACCESS;
+        case ENOENT:
+        case ENOTDIR:
+            return NVO_ERR_NO_PATH;
+        case EACCES:
+        case EPERM:
+            return NVO_ERR_PRIVILEGE;
+        default:
+            return NVO_ERR_ACCESS;
     }
 }
 
@@ -51,15 +51,16 @@ unsigned int GetACLPrivilege(const char *path) {
         }
         const int err = VLIBCErrGet();
         switch (err) {
-        case QUIB_ERR_NO_SUCH_FILE:
-        case QUIB_ERR_ACCESS_DENIED:
-        case QUIB_ERR_NOT_MOUNTED:
-        case QUIB_ERR_ACL_NOT_SUPPORTED:
-            break;
-        default:
-            NVO_LOG(kNorvoMisc, "%s:%d Failed to get the ACL Privilege: file = %s, euid = %u, reason=[%X]",
-                    norvo::OrNull(path), static_cast<unsigned>(geteuid()), err);
-            break;
+            case QUIB_ERR_NO_SUCH_FILE:
+            case QUIB_ERR_ACCESS_DENIED:
+            case QUIB_ERR_NOT_MOUNTED:
+            case QUIB_ERR_ACL_NOT_SUPPORTED:
+                break;
+            default:
+                NVO_LOG(kNorvoMisc,
+                        "%s:%d Failed to get the ACL Privilege: file = %s, euid = %u, reason=[%X]",
+                        norvo::OrNull(path), static_cast<unsigned>(geteuid()), err);
+                break;
         }
         return kEverything;
     });
@@ -74,21 +75,22 @@ int ACLAccess(const char *path, int request) {
         if (QUIBACLPermGet(path, &mask) != 0) {
             const int err = VLIBCErrGet();
             switch (err) {
-            case QUIB_ERR_READ_ONLY_FS:
-                NvoLibSetErr(NVO_ERR_READ_ONLY);
-                return -1;
-            case QUIB_ERR_NOT_MOUNTED:
-            case QUIB_ERR_NO_SUCH_FILE:
-            case QUIB_ERR_NOT_DIRECTORY:
-                NvoLibSetErr(NVO_ERR_NO_PATH);
-                return -1;
-            // Without a readable ACL the file system's own checks decide when the file is used.
-            case QUIB_ERR_ACL_NOT_SUPPORTED:
-            case QUIB_ERR_ACCESS_DENIED:
-                return 0;
-            default:
-                NVO_LOG(kNorvoMisc, "%s:%d Failed to get the ACL Privilege: file = %s, reason=[%X]", path, err);
-                return -1;
+                case QUIB_ERR_READ_ONLY_FS:
+                    NvoLibSetErr(NVO_ERR_READ_ONLY);
+                    return -1;
+                case QUIB_ERR_NOT_MOUNTED:
+                case QUIB_ERR_NO_SUCH_FILE:
+                case QUIB_ERR_NOT_DIRECTORY:
+                    NvoLibSetErr(NVO_ERR_NO_PATH);
+                    return -1;
+                // Without a readable ACL the file system's own checks decide when the file is used.
+                case QUIB_ERR_ACL_NOT_SUPPORTED:
+                case QUIB_ERR_ACCESS_DENIED:
+                    return 0;
+                default:
+                    NVO_LOG(kNorvoMisc, "%s:%d Failed to get the ACL Privilege: file = %s, reason=[%X]", path,
+                            err);
+                    return -1;
             }
         }
         for (const Requirement &need : kRequirements) {

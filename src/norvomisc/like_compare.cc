@@ -139,64 +139,64 @@ int Match(const uint8_t *pattern, const uint8_t *subject, UChar32 esc) {
         const Element e = Read(p, esc);
         bool advanced = false;
         switch (e.kind) {
-        case Kind::kEnd:
-        case Kind::kEscapedEnd:
-            if (*s == 0) {
-                return 1;
-            }
-            break;
-        case Kind::kAll: {
-            // Further stars and question marks are taken at once, each '?' eating a character.
-            p = e.next;
-            for (;;) {
-                if (*p == 0) {
+            case Kind::kEnd:
+            case Kind::kEscapedEnd:
+                if (*s == 0) {
                     return 1;
                 }
-                UChar32 c;
-                const uint8_t *next = Decode(p, &c);
-                if (c != kMatchAll && c != kMatchOne) {
-                    break;
-                }
-                if (c == kMatchOne) {
-                    if (*s == 0) {
-                        return 0;
-                    }
-                    s = Skip(s);
-                }
-                p = next;
-            }
-            // The rest is tried at each character of the subject, never at its end; so an
-            // escape character that ends the pattern here can never match.
-            const Element first = Read(p, esc);
-            starResume = first.kind == Kind::kLiteral ? SeekPast(s, first.folded) : nullptr;
-            if (starResume == nullptr) {
-                return 0;
-            }
-            star = true;
-            starLiteral = first.folded;
-            starPattern = first.next;
-            s = starResume;
-            p = starPattern;
-            advanced = true;
-            break;
-        }
-        case Kind::kOne:
-            if (*s != 0) {
-                s = Skip(s);
+                break;
+            case Kind::kAll: {
+                // Further stars and question marks are taken at once, each '?' eating a character.
                 p = e.next;
+                for (;;) {
+                    if (*p == 0) {
+                        return 1;
+                    }
+                    UChar32 c;
+                    const uint8_t *next = Decode(p, &c);
+                    if (c != kMatchAll && c != kMatchOne) {
+                        break;
+                    }
+                    if (c == kMatchOne) {
+                        if (*s == 0) {
+                            return 0;
+                        }
+                        s = Skip(s);
+                    }
+                    p = next;
+                }
+                // The rest is tried at each character of the subject, never at its end; so an
+                // escape character that ends the pattern here can never match.
+                const Element first = Read(p, esc);
+                starResume = first.kind == Kind::kLiteral ? SeekPast(s, first.folded) : nullptr;
+                if (starResume == nullptr) {
+                    return 0;
+                }
+                star = true;
+                starLiteral = first.folded;
+                starPattern = first.next;
+                s = starResume;
+                p = starPattern;
                 advanced = true;
+                break;
             }
-            break;
-        case Kind::kLiteral:
-            if (*s != 0) {
-                const uint8_t *next;
-                if (FoldsTo(s, e.folded, &next)) {
-                    s = next;
+            case Kind::kOne:
+                if (*s != 0) {
+                    s = Skip(s);
                     p = e.next;
                     advanced = true;
                 }
-            }
-            break;
+                break;
+            case Kind::kLiteral:
+                if (*s != 0) {
+                    const uint8_t *next;
+                    if (FoldsTo(s, e.folded, &next)) {
+                        s = next;
+                        p = e.next;
+                        advanced = true;
+                    }
+                }
+                break;
         }
         if (advanced) {
             continue;

@@ -61,7 +61,8 @@ std::string FindCommonParent(std::vector<std::string> paths) {
         size_t common = 0;
         for (; common < longest; ++common) {
             const char c = at(paths.front(), common);
-            if (!std::all_of(paths.begin(), paths.end(), [&](const std::string &path) { return at(path, common) == c; })) {
+            if (!std::all_of(paths.begin(), paths.end(),
+                             [&](const std::string &path) { return at(path, common) == c; })) {
                 break;
             }
         }

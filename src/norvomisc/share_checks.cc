@@ -52,7 +52,6 @@ Verdict ShareAllows(const char *user, const char *sid, const char *path, unsigne
 
 }  // namespace
 
-
 int CheckShareListPrivilege(const char *user, const char *sid, const char *path) {
     return norvo::Guarded<int>(0, [&]() -> int {
         if (path == nullptr) {
@@ -69,7 +68,8 @@ int CheckShareDownloadPrivilege(const char *user, const char *sid, const char *p
             return 0;
         }
         // Only a refusal by the share sets the code; a failed lookup keeps its own.
-        const Verdict verdict = ShareAllows(user, sid, path, SHARE_RESTRICT_NO_DOWNLOAD | SHARE_RESTRICT_NO_BROWSE);
+        const Verdict verdict =
+            ShareAllows(user, sid, path, SHARE_RESTRICT_NO_DOWNLOAD | SHARE_RESTRICT_NO_BROWSE);
         if (verdict == kRefused) {
             NvoLibSetErr(NVO_ERR_PRIVILEGE);
         }
@@ -88,7 +88,8 @@ int CheckShareUploadPrivilege(const char *user, const char *sid, const char *pat
             int priv = 0;
             unsigned int flags = 0;
             if (NvoLibGetPrivilege(path, user, sid, &priv, &flags) < 0) {
-                NVO_LOG(kNorvoMisc, "%s:%d Failed to get privilege, path= %s, reason=[%d] ", path, NvoLibGetErr());
+                NVO_LOG(kNorvoMisc, "%s:%d Failed to get privilege, path= %s, reason=[%d] ", path,
+                        NvoLibGetErr());
                 return 0;
             }
             if (priv != kReadWrite) {

@@ -53,11 +53,13 @@ void StringExplode(const std::string &text, const char *delim, void (*callback)(
         if (IsEmptyDelimiter(delim) || callback == nullptr) {
             return;
         }
-        ForEachPiece(text, delim, [callback, user](std::string_view piece) { callback(std::string(piece), user); });
+        ForEachPiece(text, delim,
+                     [callback, user](std::string_view piece) { callback(std::string(piece), user); });
     });
 }
 
-void StringExplodeToFileNameString(std::string &out, const std::string &text, const char *delim, const char *sep) {
+void StringExplodeToFileNameString(std::string &out, const std::string &text, const char *delim,
+                                   const char *sep) {
     norvo::GuardedVoid([&] {
         if (IsEmptyDelimiter(delim)) {
             return;

@@ -100,8 +100,8 @@ int NvoLibStrReplace(const char *src, const char *from, const char *to, char **o
     });
 }
 
-int NvoLibTwoStrReplace(const char *src, const char *from1, const char *to1, const char *from2, const char *to2,
-                        char **out) {
+int NvoLibTwoStrReplace(const char *src, const char *from1, const char *to1, const char *from2,
+                        const char *to2, char **out) {
     return norvo::Guarded<int>(-1, [&]() -> int {
         if (out == nullptr) {
             return -1;

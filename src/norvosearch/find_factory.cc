@@ -46,14 +46,14 @@ bool Fail(int code) {
 
 bool NeedsOp(Field field) {
     switch (field) {
-    case FindFactory::FIND_FIELD_TYPE:
-    case FindFactory::FIND_FIELD_MTIME:
-    case FindFactory::FIND_FIELD_CRTIME:
-    case FindFactory::FIND_FIELD_ATIME:
-    case FindFactory::FIND_FIELD_SIZE:
-        return true;
-    default:
-        return false;
+        case FindFactory::FIND_FIELD_TYPE:
+        case FindFactory::FIND_FIELD_MTIME:
+        case FindFactory::FIND_FIELD_CRTIME:
+        case FindFactory::FIND_FIELD_ATIME:
+        case FindFactory::FIND_FIELD_SIZE:
+            return true;
+        default:
+            return false;
     }
 }
 
@@ -154,53 +154,54 @@ unsigned long long NumberOf(const char *value) {
 
 bool AppendField(Field field, const char *op, const char *value, Conditions &out) {
     switch (field) {
-    case FindFactory::FIND_FIELD_NAME:
-        AppendNames(value, out);
-        return true;
-    case FindFactory::FIND_FIELD_TYPE:
-        if (std::unique_ptr<FindComp> type{FindTypeCompFactory::createFindTypeOpt(op)}) {
-            Append(out, std::move(type));
+        case FindFactory::FIND_FIELD_NAME:
+            AppendNames(value, out);
+            return true;
+        case FindFactory::FIND_FIELD_TYPE:
+            if (std::unique_ptr<FindComp> type{FindTypeCompFactory::createFindTypeOpt(op)}) {
+                Append(out, std::move(type));
+            }
+            return true;
+        case FindFactory::FIND_FIELD_EXT:
+            AppendExtensions(value, out);
+            return true;
+        case FindFactory::FIND_FIELD_USER: {
+            uid_t uid = 0;
+            gid_t gid = 0;
+            if (QUIBUserGetUGID(value, &uid, &gid) < 0) {
+                return Fail(NVO_ERR_NO_USER);
+            }
+            Append(out, Make<FindUserComp>(value, static_cast<unsigned int>(uid)));
+            return true;
         }
-        return true;
-    case FindFactory::FIND_FIELD_EXT:
-        AppendExtensions(value, out);
-        return true;
-    case FindFactory::FIND_FIELD_USER: {
-        uid_t uid = 0;
-        gid_t gid = 0;
-        if (QUIBUserGetUGID(value, &uid, &gid) < 0) {
-            return Fail(NVO_ERR_NO_USER);
+        case FindFactory::FIND_FIELD_GROUP: {
+            gid_t gid = 0;
+            if (QUIBGroupGetGID(value, &gid) != 0) {
+                return Fail(NVO_ERR_NO_GROUP);
+            }
+            Append(out, Make<FindGroupComp>(value, static_cast<unsigned int>(gid)));
+            return true;
         }
-        Append(out, Make<FindUserComp>(value, static_cast<unsigned int>(uid)));
-        return true;
-    }
-    case FindFactory::FIND_FIELD_GROUP: {
-        gid_t gid = 0;
-        if (QUIBGroupGetGID(value, &gid) != 0) {
-            return Fail(NVO_ERR_NO_GROUP);
-        }
-        Append(out, Make<FindGroupComp>(value, static_cast<unsigned int>(gid)));
-        return true;
-    }
-    case FindFactory::FIND_FIELD_MTIME:
-        Append(out, Make<FindMTimeComp>(op, static_cast<long>(NumberOf(value))));
-        return true;
-    case FindFactory::FIND_FIELD_CRTIME:
-        Append(out, Make<FindCRTimeComp>(op, static_cast<long>(NumberOf(value))));
-        return true;
-    case FindFactory::FIND_FIELD_ATIME:
-        Append(out, Make<FindATimeComp>(op, static_cast<long>(NumberOf(value))));
-        return true;
-    case FindFactory::FIND_FIELD_SIZE:
-        Append(out, Make<FindSizeComp>(op, static_cast<long long>(NumberOf(value))));
-        return true;
+        case FindFactory::FIND_FIELD_MTIME:
+            Append(out, Make<FindMTimeComp>(op, static_cast<long>(NumberOf(value))));
+            return true;
+        case FindFactory::FIND_FIELD_CRTIME:
+            Append(out, Make<FindCRTimeComp>(op, static_cast<long>(NumberOf(value))));
+            return true;
+        case FindFactory::FIND_FIELD_ATIME:
+            Append(out, Make<FindATimeComp>(op, static_cast<long>(NumberOf(value))));
+            return true;
+        case FindFactory::FIND_FIELD_SIZE:
+            Append(out, Make<FindSizeComp>(op, static_cast<long long>(NumberOf(value))));
+            return true;
     }
     return true;  // a field this library does not know adds nothing
 }
 
 }  // namespace
 
-bool FindFactory::createFindOp(_tag_FIND_FIELD_ field, const char *op, const char *value, std::vector<FindComp *> &out) {
+bool FindFactory::createFindOp(_tag_FIND_FIELD_ field, const char *op, const char *value,
+                               std::vector<FindComp *> &out) {
     return norvo::Guarded<bool>(false, [&]() -> bool {
         if (field != FIND_FIELD_TYPE && value == nullptr) {
             return Fail(NVO_ERR_GENERAL);

@@ -46,16 +46,18 @@ FindSizeComp::FindSizeComp(const char *op, long long bytes) : mode(ModeOf(op)), 
         size = bytes > d ? bytes - d : 0;
         extraCond = static_cast<__tag_FI_SQL_COND *>(calloc(1, sizeof(__tag_FI_SQL_COND)));
         if (extraCond != nullptr) {
-            norvo::search::SetSqlCondNumber(*extraCond, FI_COND_SIZE, FI_OP_GE, Operand(size), nullptr, nullptr);
+            norvo::search::SetSqlCondNumber(*extraCond, FI_COND_SIZE, FI_OP_GE, Operand(size), nullptr,
+                                            nullptr);
         }
         if (cond != nullptr) {
-            norvo::search::SetSqlCondNumber(*cond, FI_COND_SIZE, FI_OP_LT, Operand(upper), extraCond, nullptr);
+            norvo::search::SetSqlCondNumber(*cond, FI_COND_SIZE, FI_OP_LT, Operand(upper), extraCond,
+                                            nullptr);
         }
         return;
     }
     if (cond != nullptr) {
-        norvo::search::SetSqlCondNumber(*cond, FI_COND_SIZE, mode == kLess ? FI_OP_LT : FI_OP_GT, Operand(bytes),
-                                        nullptr, nullptr);
+        norvo::search::SetSqlCondNumber(*cond, FI_COND_SIZE, mode == kLess ? FI_OP_LT : FI_OP_GT,
+                                        Operand(bytes), nullptr, nullptr);
     }
 }
 
@@ -64,14 +66,14 @@ FindSizeComp::~FindSizeComp() = default;
 bool FindSizeComp::operator()(const char * /*path*/, const _tag_QUIBSTAT_ &st) {
     const long long fileSize = (st.st_mode & kTypeMask) == kDirectory ? 0 : st.st_size;
     switch (mode) {
-    case kEqual:
-        return size <= fileSize && fileSize < upper;
-    case kGreater:
-        return fileSize > size;
-    case kLess:
-        return fileSize < size;
-    default:
-        return false;
+        case kEqual:
+            return size <= fileSize && fileSize < upper;
+        case kGreater:
+            return fileSize > size;
+        case kLess:
+            return fileSize < size;
+        default:
+            return false;
     }
 }
 

@@ -13,7 +13,9 @@ namespace FileSearch {
 
 // Unlike the size's operator words, "before" is taken in any case. Intended.
 FindTimeComp::FindTimeComp(__tag_FI_SQL_COND_TYPE type, const char *op, long when)
-    : mode(op != nullptr && strcasecmp(op, "before") == 0 ? kBefore : kAtOrAfter), lowTime(when), highTime(when) {
+    : mode(op != nullptr && strcasecmp(op, "before") == 0 ? kBefore : kAtOrAfter),
+      lowTime(when),
+      highTime(when) {
     if (cond != nullptr) {
         // Sign-extended first, so a moment before 1970 reads as its 64-bit two's complement.
         const auto operand = static_cast<unsigned long long>(static_cast<long long>(when));
@@ -27,12 +29,12 @@ FindTimeComp::~FindTimeComp() = default;
 bool FindTimeComp::operator()(const char * /*path*/, const _tag_QUIBSTAT_ &st) {
     const long time = getTime(st);
     switch (mode) {
-    case kAtOrAfter:
-        return lowTime <= time;
-    case kBefore:
-        return time < highTime;
-    default:
-        return false;
+        case kAtOrAfter:
+            return lowTime <= time;
+        case kBefore:
+            return time < highTime;
+        default:
+            return false;
     }
 }
 

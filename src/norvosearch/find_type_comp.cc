@@ -1,6 +1,6 @@
 // Type conditions: directories, or regular files only.
-#include <new>
 #include <strings.h>
+#include <new>
 
 #include "errors/guard.h"
 #include "norvo/norvosearch.h"

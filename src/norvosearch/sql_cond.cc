@@ -31,8 +31,8 @@ static_assert(sizeof(__tag_FI_SQL_COND) == 4120, "condition record size (8-byte 
 
 namespace norvo::search {
 
-void SetSqlCondText(__tag_FI_SQL_COND &c, __tag_FI_SQL_COND_TYPE type, __tag_FI_SQL_COND_OP op, const char *value,
-                    __tag_FI_SQL_COND *andNext, __tag_FI_SQL_COND *orNext) {
+void SetSqlCondText(__tag_FI_SQL_COND &c, __tag_FI_SQL_COND_TYPE type, __tag_FI_SQL_COND_OP op,
+                    const char *value, __tag_FI_SQL_COND *andNext, __tag_FI_SQL_COND *orNext) {
     memset(&c, 0, sizeof(c));
     c.andNext = andNext;
     c.orNext = orNext;
@@ -54,13 +54,11 @@ namespace FileSearch {
 
 void setSqlCond(__tag_FI_SQL_COND &c, __tag_FI_SQL_COND_TYPE type, __tag_FI_SQL_COND_OP op, std::string value,
                 __tag_FI_SQL_COND *andNext, __tag_FI_SQL_COND *orNext) {
-    norvo::GuardedVoid([&] {
-        norvo::search::SetSqlCondText(c, type, op, value.c_str(), andNext, orNext);
-    });
+    norvo::GuardedVoid([&] { norvo::search::SetSqlCondText(c, type, op, value.c_str(), andNext, orNext); });
 }
 
-void setSqlCond(__tag_FI_SQL_COND &c, __tag_FI_SQL_COND_TYPE type, __tag_FI_SQL_COND_OP op, unsigned long long value,
-                __tag_FI_SQL_COND *andNext, __tag_FI_SQL_COND *orNext) {
+void setSqlCond(__tag_FI_SQL_COND &c, __tag_FI_SQL_COND_TYPE type, __tag_FI_SQL_COND_OP op,
+                unsigned long long value, __tag_FI_SQL_COND *andNext, __tag_FI_SQL_COND *orNext) {
     norvo::search::SetSqlCondNumber(c, type, op, value, andNext, orNext);
 }
 

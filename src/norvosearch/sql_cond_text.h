@@ -6,8 +6,8 @@
 namespace norvo::search {
 
 // As FileSearch::setSqlCond; a null value counts as "".
-void SetSqlCondText(__tag_FI_SQL_COND &c, __tag_FI_SQL_COND_TYPE type, __tag_FI_SQL_COND_OP op, const char *value,
-                    __tag_FI_SQL_COND *andNext, __tag_FI_SQL_COND *orNext);
+void SetSqlCondText(__tag_FI_SQL_COND &c, __tag_FI_SQL_COND_TYPE type, __tag_FI_SQL_COND_OP op,
+                    const char *value, __tag_FI_SQL_COND *andNext, __tag_FI_SQL_COND *orNext);
 void SetSqlCondNumber(__tag_FI_SQL_COND &c, __tag_FI_SQL_COND_TYPE type, __tag_FI_SQL_COND_OP op,
                       unsigned long long value, __tag_FI_SQL_COND *andNext, __tag_FI_SQL_COND *orNext);
 

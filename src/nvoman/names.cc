@@ -22,9 +22,9 @@ int NvoCheckReservedName(const char *name) {
             NvoLibSetErr(NVO_ERR_GENERAL);
             return 0;
         }
-        const bool reserved = strcmp(name, ".") == 0 || strcmp(name, "..") == 0 || strchr(name, ':') != nullptr ||
-                              strchr(name, '/') != nullptr || strncmp(name, "._", 2) == 0 ||
-                              QUIBEAIsHiddenDir(name) == 1;
+        const bool reserved = strcmp(name, ".") == 0 || strcmp(name, "..") == 0 ||
+                              strchr(name, ':') != nullptr || strchr(name, '/') != nullptr ||
+                              strncmp(name, "._", 2) == 0 || QUIBEAIsHiddenDir(name) == 1;
         if (reserved) {
             NvoLibSetErr(NVO_ERR_RESERVED_NAME);
             return 0;

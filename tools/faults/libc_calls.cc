@@ -38,34 +38,34 @@ int NssFailure(Entry **result) {
 
 // Each wrapper fails as the call itself does: -1 or null with errno, or the error number for
 // the *_r lookups. open and open64 (likewise the others) are one call under two names.
-#define SEAM_OPEN(fn)                                    \
-    int fn(const char *path, int flags, ...) {           \
-        SEAM_REAL(fn);                                   \
-        va_list args;                                    \
-        va_start(args, flags);                           \
-        const mode_t mode = ModeArgument(flags, args);   \
-        va_end(args);                                    \
+#define SEAM_OPEN(fn)                                          \
+    int fn(const char *path, int flags, ...) {                 \
+        SEAM_REAL(fn);                                         \
+        va_list args;                                          \
+        va_start(args, flags);                                 \
+        const mode_t mode = ModeArgument(flags, args);         \
+        va_end(args);                                          \
         return ShouldFail(#fn) ? -1 : real(path, flags, mode); \
     }
 SEAM_OPEN(open)
 SEAM_OPEN(open64)
 
-#define SEAM_OPENAT(fn)                                           \
-    int fn(int dir, const char *path, int flags, ...) {           \
-        SEAM_REAL(fn);                                            \
-        va_list args;                                             \
-        va_start(args, flags);                                    \
-        const mode_t mode = ModeArgument(flags, args);            \
-        va_end(args);                                             \
+#define SEAM_OPENAT(fn)                                             \
+    int fn(int dir, const char *path, int flags, ...) {             \
+        SEAM_REAL(fn);                                              \
+        va_list args;                                               \
+        va_start(args, flags);                                      \
+        const mode_t mode = ModeArgument(flags, args);              \
+        va_end(args);                                               \
         return ShouldFail(#fn) ? -1 : real(dir, path, flags, mode); \
     }
 SEAM_OPENAT(openat)
 SEAM_OPENAT(openat64)
 
 // One wrapper: name(parameters) forwards args, failing with the value given.
-#define SEAM_CALL(type, fn, failure, params, args) \
-    type fn params {                               \
-        SEAM_REAL(fn);                             \
+#define SEAM_CALL(type, fn, failure, params, args)      \
+    type fn params {                                    \
+        SEAM_REAL(fn);                                  \
         return ShouldFail(#fn) ? (failure) : real args; \
     }
 

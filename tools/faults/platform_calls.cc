@@ -25,9 +25,9 @@
 namespace seam = norvo::faults::seam;
 using seam::ShouldFailPlatform;
 
-#define SEAM_PLATFORM(type, fn, failure, params, args) \
-    type fn params {                                   \
-        SEAM_REAL(fn);                                 \
+#define SEAM_PLATFORM(type, fn, failure, params, args)          \
+    type fn params {                                            \
+        SEAM_REAL(fn);                                          \
         return ShouldFailPlatform(#fn) ? (failure) : real args; \
     }
 
@@ -42,10 +42,10 @@ SEAM_PLATFORM(int, QUIBGroupIsAdminGroupMemEx, -1, (const char *user, int withDo
 SEAM_PLATFORM(int, QUIBServiceUserHomeIsEnabled, 0, (const PQUIBUSER user), (user))
 SEAM_PLATFORM(int, QUIBServiceHomePathGet, -1, (const char *user, char *buf, int size), (user, buf, size))
 SEAM_PLATFORM(int, VLIBUserPrivilegeHas, 0, (const char *user, const char *priv), (user, priv))
-SEAM_PLATFORM(int, QuibCgiDomGetPrivilege, -1, (const char *share, const char *user, const char *sid, int *priv),
-              (share, user, sid, priv))
-SEAM_PLATFORM(int, QuibCgiLDAPGetPrivilege, -1, (const char *share, const char *user, const char *sid, int *priv),
-              (share, user, sid, priv))
+SEAM_PLATFORM(int, QuibCgiDomGetPrivilege, -1,
+              (const char *share, const char *user, const char *sid, int *priv), (share, user, sid, priv))
+SEAM_PLATFORM(int, QuibCgiLDAPGetPrivilege, -1,
+              (const char *share, const char *user, const char *sid, int *priv), (share, user, sid, priv))
 SEAM_PLATFORM(uid_t, QuibCgiUIDGet, static_cast<uid_t>(-1), (const char *sid, const char *user), (sid, user))
 SEAM_PLATFORM(gid_t, QuibCgiGIDGet, static_cast<gid_t>(-1), (const char *sid, const char *user), (sid, user))
 SEAM_PLATFORM(int, QUIBLoginCreate, -1,
@@ -59,17 +59,19 @@ SEAM_PLATFORM(int, QUIBFSIsInMountTable, -1, (const char *path), (path))
 SEAM_PLATFORM(int, QUIBACLPermGet, -1, (const char *path, unsigned int *mask), (path, mask))
 SEAM_PLATFORM(int, QUIBACLIsSupport, -1, (const char *path, int fd, int flags), (path, fd, flags))
 SEAM_PLATFORM(int, VLIBCFileLStat, -1, (const char *path, int flags, PQUIBSTAT st), (path, flags, st))
-SEAM_PLATFORM(int, VLIBCFileGetKeyValue, -1, (const char *file, const char *key, char *buf, size_t size, int flags),
+SEAM_PLATFORM(int, VLIBCFileGetKeyValue, -1,
+              (const char *file, const char *key, char *buf, size_t size, int flags),
               (file, key, buf, size, flags))
-SEAM_PLATFORM(int, VLIBCFileSetKeyValue, -1, (const char *file, const char *key, const char *value, int format),
-              (file, key, value, format))
+SEAM_PLATFORM(int, VLIBCFileSetKeyValue, -1,
+              (const char *file, const char *key, const char *value, int format), (file, key, value, format))
 SEAM_PLATFORM(int, VLIBCFileRemoveKey, -1, (const char *file, const char *key), (file, key))
-SEAM_PLATFORM(int, VLIBCFileCheckKeyValue, -1, (const char *file, const char *key, const char *value, int flags),
-              (file, key, value, flags))
+SEAM_PLATFORM(int, VLIBCFileCheckKeyValue, -1,
+              (const char *file, const char *key, const char *value, int flags), (file, key, value, flags))
 SEAM_PLATFORM(int, VLIBCSupportGet, -1, (const char *key), (key))
 SEAM_PLATFORM(int, VLIBCSzListSortItems, -1, (PSZLIST list, int flags), (list, flags))
 
-int QUIBFSMkdirP(const char *path, char *stopAt, int stopAtSize, int recursive, uid_t uid, gid_t gid, mode_t mode) {
+int QUIBFSMkdirP(const char *path, char *stopAt, int stopAtSize, int recursive, uid_t uid, gid_t gid,
+                 mode_t mode) {
     SEAM_REAL(QUIBFSMkdirP);
     if (!ShouldFailPlatform("QUIBFSMkdirP")) {
         return real(path, stopAt, stopAtSize, recursive, uid, gid, mode);
@@ -81,34 +83,35 @@ int QUIBFSMkdirP(const char *path, char *stopAt, int stopAtSize, int recursive, 
 }
 
 // Calls that hand out a record: entered on success.
-#define SEAM_MAKER(type, fn, params, args, record)  \
-    type fn params {                                \
-        SEAM_REAL(fn);                              \
-        if (ShouldFailPlatform(#fn)) {              \
-            return static_cast<type>(-1);           \
-        }                                           \
-        const type rc = real args;                  \
-        if (rc == 0) {                              \
-            seam::Track(record, #fn);               \
-        }                                           \
-        return rc;                                  \
+#define SEAM_MAKER(type, fn, params, args, record) \
+    type fn params {                               \
+        SEAM_REAL(fn);                             \
+        if (ShouldFailPlatform(#fn)) {             \
+            return static_cast<type>(-1);          \
+        }                                          \
+        const type rc = real args;                 \
+        if (rc == 0) {                             \
+            seam::Track(record, #fn);              \
+        }                                          \
+        return rc;                                 \
     }
 SEAM_MAKER(int, QUIBShareGet, (const char *name, PQUIBSHARE *pshare), (name, pshare), *pshare)
 SEAM_MAKER(int, QUIBUserGet, (const char *name, PQUIBUSER *puser), (name, puser), *puser)
 SEAM_MAKER(int, QUIBUserGetByUID, (uid_t uid, PQUIBUSER *puser, int noCache), (uid, puser, noCache), *puser)
 SEAM_MAKER(int, QUIBGroupGet, (const char *name, PQUIBGROUP *pgroup), (name, pgroup), *pgroup)
-SEAM_MAKER(int, QUIBGroupGetByGID, (gid_t gid, PQUIBGROUP *pgroup, int noCache), (gid, pgroup, noCache), *pgroup)
+SEAM_MAKER(int, QUIBGroupGetByGID, (gid_t gid, PQUIBGROUP *pgroup, int noCache), (gid, pgroup, noCache),
+           *pgroup)
 
 // Calls that hand out a new object or null.
-#define SEAM_OPENER(type, fn, params, args)          \
-    type fn params {                                 \
-        SEAM_REAL(fn);                               \
-        if (ShouldFailPlatform(#fn)) {               \
-            return nullptr;                          \
-        }                                            \
-        type made = real args;                       \
-        seam::Track(made, #fn);                      \
-        return made;                                 \
+#define SEAM_OPENER(type, fn, params, args) \
+    type fn params {                        \
+        SEAM_REAL(fn);                      \
+        if (ShouldFailPlatform(#fn)) {      \
+            return nullptr;                 \
+        }                                   \
+        type made = real args;              \
+        seam::Track(made, #fn);             \
+        return made;                        \
     }
 SEAM_OPENER(PQUIBSHARE_DB, QUIBShareDBOpen, (void), ())
 SEAM_OPENER(PQUIBUSER_DB, QUIBUserDBOpen, (void), ())
@@ -116,16 +119,16 @@ SEAM_OPENER(PQUIBGROUP_DB, QUIBGroupDBOpen, (void), ())
 SEAM_OPENER(PSZLIST, VLIBCSzListAlloc, (int capacity), (capacity))
 SEAM_OPENER(PSZLIST, QuibCgiDomValidShareGen, (const char *context, const char *user, int sort, int writable),
             (context, user, sort, writable))
-SEAM_OPENER(PSZLIST, QuibCgiLDAPValidShareGen, (const char *context, const char *user, int sort, int writable),
-            (context, user, sort, writable))
+SEAM_OPENER(PSZLIST, QuibCgiLDAPValidShareGen,
+            (const char *context, const char *user, int sort, int writable), (context, user, sort, writable))
 SEAM_OPENER(QUIBDirPass *, QUIBDirPassBegin, (const char *dirPath), (dirPath))
 
 // Calls that release one.
-#define SEAM_RELEASER(type, fn)    \
-    void fn(type record) {         \
-        SEAM_REAL(fn);             \
-        seam::Untrack(record);     \
-        real(record);              \
+#define SEAM_RELEASER(type, fn) \
+    void fn(type record) {      \
+        SEAM_REAL(fn);          \
+        seam::Untrack(record);  \
+        real(record);           \
     }
 SEAM_RELEASER(PQUIBSHARE, QUIBShareFree)
 SEAM_RELEASER(PQUIBUSER, QUIBUserFree)
@@ -137,27 +140,28 @@ SEAM_RELEASER(PSZLIST, VLIBCSzListFree)
 SEAM_RELEASER(QUIBDirPass *, QUIBDirPassEnd)
 
 // Calls that refill a caller's slot (a cursor's record, a list that may move as it grows).
-#define SEAM_REFILL(fn, slot, params, args)          \
-    int fn params {                                  \
-        SEAM_REAL(fn);                               \
-        if (ShouldFailPlatform(#fn)) {               \
-            return -1;                               \
-        }                                            \
+#define SEAM_REFILL(fn, slot, params, args)                     \
+    int fn params {                                             \
+        SEAM_REAL(fn);                                          \
+        if (ShouldFailPlatform(#fn)) {                          \
+            return -1;                                          \
+        }                                                       \
         const void *before = slot != nullptr ? *slot : nullptr; \
-        const int rc = real args;                    \
-        if (slot != nullptr) {                       \
-            seam::Refilled(before, *slot, #fn);      \
-        }                                            \
-        return rc;                                   \
+        const int rc = real args;                               \
+        if (slot != nullptr) {                                  \
+            seam::Refilled(before, *slot, #fn);                 \
+        }                                                       \
+        return rc;                                              \
     }
 SEAM_REFILL(QUIBShareDBCursorGet, pshare, (PQUIBSHARE_DB db, PQUIBSHARE *pshare), (db, pshare))
 SEAM_REFILL(QUIBUserDBGetByCursor, puser, (PQUIBUSER_DB db, PQUIBUSER *puser, AUTH_TYPE type, int noCache),
             (db, puser, type, noCache))
-SEAM_REFILL(QUIBGroupDBGetByCursor, pgroup, (PQUIBGROUP_DB db, PQUIBGROUP *pgroup, AUTH_TYPE type, int noCache),
-            (db, pgroup, type, noCache))
-SEAM_REFILL(VLIBCSzListPush, plist, (PSZLIST *plist, const char *item), (plist, item))
+SEAM_REFILL(QUIBGroupDBGetByCursor, pgroup,
+            (PQUIBGROUP_DB db, PQUIBGROUP *pgroup, AUTH_TYPE type, int noCache), (db, pgroup, type, noCache))
+SEAM_REFILL(VLIBCSzListPush, plist, (PSZLIST * plist, const char *item), (plist, item))
 SEAM_REFILL(VLIBCStrTok, plist, (const char *text, const char *delims, PSZLIST *plist), (text, delims, plist))
-SEAM_REFILL(QUIBGroupInfoGetgroupList, plist, (const char *user, PSZLIST *plist, int flags), (user, plist, flags))
+SEAM_REFILL(QUIBGroupInfoGetgroupList, plist, (const char *user, PSZLIST *plist, int flags),
+            (user, plist, flags))
 
 int VLIBCFileGetKeys(const char *file, PSZLIST *keys, PSZLIST *values) {
     SEAM_REAL(VLIBCFileGetKeys);
@@ -184,7 +188,8 @@ int QUIB::WebAPIUtil::ParseToArray(const char *value, Json::Value &array) {
 }
 
 SDK::Share *SDK::Share::LoadShare(const char *name) {
-    static const auto real = reinterpret_cast<Share *(*)(const char *)>(seam::Next("_ZN3SDK5Share9LoadShareEPKc"));
+    static const auto real =
+        reinterpret_cast<Share *(*)(const char *)>(seam::Next("_ZN3SDK5Share9LoadShareEPKc"));
     if (ShouldFailPlatform("SDK::Share::LoadShare")) {
         return nullptr;
     }

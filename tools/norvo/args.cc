@@ -41,7 +41,8 @@ const OptionDef *FindOption(const CommandDef &command, const std::string &name) 
 }
 
 // Parses what follows the command name into outcome.invocation.
-ParseOutcome ParseCommandArgs(const CommandDef &command, bool json, int argc, const char *const *argv, int first) {
+ParseOutcome ParseCommandArgs(const CommandDef &command, bool json, int argc, const char *const *argv,
+                              int first) {
     ParseOutcome outcome;
     outcome.kind = ParseOutcome::kRun;
     Invocation &inv = outcome.invocation;
@@ -116,7 +117,8 @@ ParseOutcome ParseCommandArgs(const CommandDef &command, bool json, int argc, co
     const bool repeated = !command.arguments.empty() && IsRepeated(command.arguments.back());
     const size_t wanted = command.arguments.size() - (repeated ? 1 : 0);
     if (inv.arguments.size() < wanted) {
-        return UsageError(&command, std::string("missing argument ") + command.arguments[inv.arguments.size()].name);
+        return UsageError(&command,
+                          std::string("missing argument ") + command.arguments[inv.arguments.size()].name);
     }
     if (!repeated && inv.arguments.size() > wanted) {
         return UsageError(&command, "unexpected argument " + inv.arguments[wanted]);

@@ -11,7 +11,7 @@ struct ParseOutcome {
     enum Kind { kRun, kHelp, kUsageError };
     Kind kind = kUsageError;
     Invocation invocation;              // kRun
-    const CommandDef *topic = nullptr; // kHelp: null for the overview; kUsageError: the command, if known
+    const CommandDef *topic = nullptr;  // kHelp: null for the overview; kUsageError: the command, if known
     std::string error;                  // kUsageError: one line, not yet made terminal-safe
 };
 

@@ -22,12 +22,18 @@ constexpr BitName kRestrictions[] = {
 };
 
 constexpr BitName kAclBits[] = {
-    {ACL_PERM_EXECUTE, "execute"},         {ACL_PERM_WRITE, "write"},
-    {ACL_PERM_READ, "read"},               {ACL_PERM_APPEND, "append"},
-    {ACL_PERM_READ_XATTR, "read-xattr"},   {ACL_PERM_WRITE_XATTR, "write-xattr"},
-    {ACL_PERM_DELETE_CHILD, "delete-child"}, {ACL_PERM_READ_ATTR, "read-attr"},
-    {ACL_PERM_WRITE_ATTR, "write-attr"},   {ACL_PERM_DELETE, "delete"},
-    {ACL_PERM_READ_ACL, "read-acl"},       {ACL_PERM_WRITE_ACL, "write-acl"},
+    {ACL_PERM_EXECUTE, "execute"},
+    {ACL_PERM_WRITE, "write"},
+    {ACL_PERM_READ, "read"},
+    {ACL_PERM_APPEND, "append"},
+    {ACL_PERM_READ_XATTR, "read-xattr"},
+    {ACL_PERM_WRITE_XATTR, "write-xattr"},
+    {ACL_PERM_DELETE_CHILD, "delete-child"},
+    {ACL_PERM_READ_ATTR, "read-attr"},
+    {ACL_PERM_WRITE_ATTR, "write-attr"},
+    {ACL_PERM_DELETE, "delete"},
+    {ACL_PERM_READ_ACL, "read-acl"},
+    {ACL_PERM_WRITE_ACL, "write-acl"},
     {ACL_PERM_CHANGE_OWNER, "change-owner"},
 };
 
@@ -78,14 +84,14 @@ std::string NamesText(const std::string &hex, const std::vector<std::string> &na
 
 const char *PrivilegeName(int privilege) {
     switch (privilege) {
-    case 0:
-        return "none";
-    case 1:
-        return "read-only";
-    case 2:
-        return "read-write";
-    default:
-        return "unknown";
+        case 0:
+            return "none";
+        case 1:
+            return "read-only";
+        case 2:
+            return "read-write";
+        default:
+            return "unknown";
     }
 }
 

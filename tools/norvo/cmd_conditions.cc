@@ -146,8 +146,7 @@ int RunConditions(const Invocation &inv) {
     Json::Value data(Json::objectValue);
     TextTable text;
     data["conditions"] = Json::Value(Json::arrayValue);
-    text.Line(built.empty() ? "conditions: none (every file matches)"
-                            : "conditions (every one must hold):");
+    text.Line(built.empty() ? "conditions: none (every file matches)" : "conditions (every one must hold):");
     for (size_t i = 0; i < built.size(); ++i) {
         const char *kind = ConditionKind(*built[i].condition);
         Json::Value entry(Json::objectValue);
@@ -181,8 +180,8 @@ int RunConditions(const Invocation &inv) {
         entry["and"] = NumberOrNull(numbers.Of(record->andNext));
         entry["or"] = NumberOrNull(numbers.Of(record->orNext));
         data["records"].append(entry);
-        text.Row("  #" + std::to_string(number), CondTypeName(record->type) + " " + CondOpName(record->op) + " \"" +
-                                                     record->value + "\"" + Links(numbers, *record));
+        text.Row("  #" + std::to_string(number), CondTypeName(record->type) + " " + CondOpName(record->op) +
+                                                     " \"" + record->value + "\"" + Links(numbers, *record));
     }
 
     data["files"] = Json::Value(Json::arrayValue);

@@ -51,12 +51,12 @@ std::string LoginErrorMessage(int quibErr) {
     char hex[16];
     snprintf(hex, sizeof(hex), "0x%04X", static_cast<unsigned>(quibErr));
     switch (quibErr) {
-    case QUIB_ERR_NO_SUCH_USER:
-        return std::string("login refused: no such account (platform ") + hex + ")";
-    case QUIB_ERR_ACCESS_DENIED:
-        return std::string("login refused: wrong password or expired account (platform ") + hex + ")";
-    default:
-        return std::string("login failed (platform ") + hex + ")";
+        case QUIB_ERR_NO_SUCH_USER:
+            return std::string("login refused: no such account (platform ") + hex + ")";
+        case QUIB_ERR_ACCESS_DENIED:
+            return std::string("login refused: wrong password or expired account (platform ") + hex + ")";
+        default:
+            return std::string("login failed (platform ") + hex + ")";
     }
 }
 
@@ -80,7 +80,8 @@ int RunLogin(const Invocation &inv) {
     const char *remoteAddr = inv.Has("remote-addr") ? inv.CStr("remote-addr") : kDefaultRemoteAddr;
 
     char sid[256] = {0};
-    if (QUIBLoginCreate(user.c_str(), password.c_str(), remoteAddr, sid, static_cast<int>(sizeof(sid))) != 0) {
+    if (QUIBLoginCreate(user.c_str(), password.c_str(), remoteAddr, sid, static_cast<int>(sizeof(sid))) !=
+        0) {
         const int quibErr = VLIBCErrGet();
         return ReportFailure(inv, LoginErrorCode(quibErr), LoginErrorMessage(quibErr));
     }

@@ -122,23 +122,31 @@ public:
 
     std::vector<std::string> Header() const {
         std::vector<std::string> cells;
-        if (info_ & NVO_INFO_PERM) cells.push_back("posix");
-        if (info_ & NVO_INFO_OWNER) cells.push_back("owner");
-        if (info_ & NVO_INFO_SIZE) cells.push_back("size");
-        if (info_ & NVO_INFO_TIME) cells.push_back("modified");
-        if (volume_) cells.push_back("volume");
+        if (info_ & NVO_INFO_PERM)
+            cells.push_back("posix");
+        if (info_ & NVO_INFO_OWNER)
+            cells.push_back("owner");
+        if (info_ & NVO_INFO_SIZE)
+            cells.push_back("size");
+        if (info_ & NVO_INFO_TIME)
+            cells.push_back("modified");
+        if (volume_)
+            cells.push_back("volume");
         cells.push_back("name");
         return cells;
     }
 
     std::vector<std::string> Cells(const DIRENTRY_INFO &entry) const {
         std::vector<std::string> cells;
-        if (info_ & NVO_INFO_PERM) cells.push_back(GetPrivilegeStr(entry.mode));
+        if (info_ & NVO_INFO_PERM)
+            cells.push_back(GetPrivilegeStr(entry.mode));
         if (info_ & NVO_INFO_OWNER) {
             cells.push_back(TerminalSafe(entry.user.empty() ? std::to_string(entry.uid) : entry.user));
         }
-        if (info_ & NVO_INFO_SIZE) cells.push_back(entry.isdir ? "-" : HumanSize(entry.size));
-        if (info_ & NVO_INFO_TIME) cells.push_back(Date(entry.mtime));
+        if (info_ & NVO_INFO_SIZE)
+            cells.push_back(entry.isdir ? "-" : HumanSize(entry.size));
+        if (info_ & NVO_INFO_TIME)
+            cells.push_back(Date(entry.mtime));
         if (volume_) {
             cells.push_back(entry.mount_point_type == "remotefail"
                                 ? std::string("unreachable")
@@ -243,10 +251,12 @@ int RunLs(const Invocation &inv) {
     }
     int offset = 0;
     int limit = 0;
-    if (const std::string *text = inv.Value("offset"); text && !ParseNumber(*text, 0, kLargestPageNumber, &offset)) {
+    if (const std::string *text = inv.Value("offset");
+        text && !ParseNumber(*text, 0, kLargestPageNumber, &offset)) {
         return ReportUsageError(inv.command, "--offset wants a number from 0 to 2147483647, not " + *text);
     }
-    if (const std::string *text = inv.Value("limit"); text && !ParseNumber(*text, 0, kLargestPageNumber, &limit)) {
+    if (const std::string *text = inv.Value("limit");
+        text && !ParseNumber(*text, 0, kLargestPageNumber, &limit)) {
         return ReportUsageError(inv.command, "--limit wants a number from 0 to 2147483647, not " + *text);
     }
     _tag_dir_entry_type_ type = DIR_ENTRY_TYPE_ALL;
@@ -307,11 +317,11 @@ int RunLs(const Invocation &inv) {
     NvoLibSetErr(NVO_ERR_NONE);
     const int listed =
         shares ? lister.NvoLibShareEntryListEnum(userName.c_str(), nullptr, false, sortKey, info,
-                                                  static_cast<unsigned long>(offset),
-                                                  static_cast<unsigned long>(limit), ascending, files, &total)
-               : lister.NvoLibDirEntryListEnum(path.c_str(), realPath.c_str(), sortKey, info,
-                                                static_cast<unsigned long>(offset), static_cast<unsigned long>(limit),
-                                                ascending, type, conditions.items, files, &total);
+                                                 static_cast<unsigned long>(offset),
+                                                 static_cast<unsigned long>(limit), ascending, files, &total)
+               : lister.NvoLibDirEntryListEnum(
+                     path.c_str(), realPath.c_str(), sortKey, info, static_cast<unsigned long>(offset),
+                     static_cast<unsigned long>(limit), ascending, type, conditions.items, files, &total);
     identity.reset();
     if (listed != 1) {
         return ReportLibraryFailure(inv, "listing " + path);

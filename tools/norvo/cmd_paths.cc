@@ -47,7 +47,9 @@ int RunResolve(const Invocation &inv) {
     data["encrypted"] = encryptionKnown ? Json::Value(encrypted) : Json::Value(Json::nullValue);
     TextTable text;
     text.Row("real path", realPath)
-        .Row("share", share + (home ? " (the user's home folder)" : encrypted ? " (encrypted)" : ""))
+        .Row("share", share + (home        ? " (the user's home folder)"
+                               : encrypted ? " (encrypted)"
+                                           : ""))
         .Row("volume path", volumePath)
         .Row("share path", sharePath);
     return ReportSuccess(inv, data, text);

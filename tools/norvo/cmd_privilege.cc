@@ -8,8 +8,8 @@
 #include <string>
 
 #include "accounts.h"
-#include "common/beneath.h"
 #include "bit_names.h"
+#include "common/beneath.h"
 #include "exit_status.h"
 #include "handlers.h"
 #include "identity.h"
@@ -111,7 +111,8 @@ int RunPrivilege(const Invocation &inv) {
     std::string linkTarget;
     const Reach reach = ReachOf(path, realPath, &linkTarget);
     if (reach == Reach::kThroughLink) {
-        return ReportFailure(inv, NVO_ERR_PRIVILEGE, path + " passes through a symbolic link, which is not followed");
+        return ReportFailure(inv, NVO_ERR_PRIVILEGE,
+                             path + " passes through a symbolic link, which is not followed");
     }
     // The checks below let home folders through without a share lookup; so does this.
     const bool home = IsDirUserHome(share, nullptr) == 1;

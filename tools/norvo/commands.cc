@@ -10,7 +10,8 @@ constexpr char kUserHelp[] = "the account asking: a local name, DOMAIN\\name or 
 
 std::vector<CommandDef> MakeCommands() {
     return {
-        {"resolve", "where a user-visible path leads (real path, share, volume)",
+        {"resolve",
+         "where a user-visible path leads (real path, share, volume)",
          "Resolves PATH as the file manager does for USER (NvoFullPathGet): the real path, the\n"
          "share name, the volume path and the share's real path, and whether the share is\n"
          "encrypted (NvoLibCheckEncryptShare). /home/... is USER's own home\n"
@@ -18,7 +19,8 @@ std::vector<CommandDef> MakeCommands() {
          {{"user", "USER", true, kUserHelp}},
          {{"PATH", "a user-visible path: /share/dir/file, /home/..., /homes/USER/..."}},
          RunResolve},
-        {"privilege", "what a user may do at a path (share privilege, restrictions, ACL, checks)",
+        {"privilege",
+         "what a user may do at a path (share privilege, restrictions, ACL, checks)",
          "Reports for USER at PATH: the share privilege (none, read-only, read-write; 0/1/2 in\n"
          "JSON) and the share's restriction flags (no-browse 0x1, no-modify 0x2, no-download\n"
          "0x4; administrators have none), both from NvoLibGetPrivilege; the ACL mask of the\n"
@@ -35,10 +37,12 @@ std::vector<CommandDef> MakeCommands() {
          "Domain (DOMAIN\\name) and directory (name@realm) accounts are asked through their\n"
          "service only with --sid, the sid of one of their logins (see norvo login). Home\n"
          "folders (/home/...) have no share privilege: the checks let them through.",
-         {{"user", "USER", true, kUserHelp}, {"sid", "SID", false, "the login sid of a domain or directory account"}},
+         {{"user", "USER", true, kUserHelp},
+          {"sid", "SID", false, "the login sid of a domain or directory account"}},
          {{"PATH", "a user-visible path: /share/dir/file, /home/..., /homes/USER/..."}},
          RunPrivilege},
-        {"shares", "the shares a user's file manager lists",
+        {"shares",
+         "the shares a user's file manager lists",
          "Lists the visible shares USER may read, or with --writable write (NvoLibValidShareGen),\n"
          "in configuration order, or sorted case-insensitively with --sort. Hidden shares and\n"
          "shares that deny USER are left out.",
@@ -47,7 +51,8 @@ std::vector<CommandDef> MakeCommands() {
           {"sort", nullptr, false, "sort the names case-insensitively"}},
          {},
          RunShares},
-        {"check-name", "whether a name may be created in a directory",
+        {"check-name",
+         "whether a name may be created in a directory",
          "Asks NvoCheckFileName whether NAME may be created in the real directory DIR: refused\n"
          "with 418 for reserved names (\".\", \"..\", a name with \":\" or \"/\", \"._...\", the\n"
          "platform's extended-attribute directories) and with 419 for characters a FAT file\n"
@@ -55,7 +60,8 @@ std::vector<CommandDef> MakeCommands() {
          {},
          {{"DIR", "a real directory, e.g. /volume1/photo"}, {"NAME", "the name to create"}},
          RunCheckName},
-        {"check-path", "whether a real path is acceptable before creating its missing tail",
+        {"check-path",
+         "whether a real path is acceptable before creating its missing tail",
          "Asks NvoCheckPath about the real path PATH. Without --find-existing PATH itself must\n"
          "exist; with it, the longest existing leading part is checked and printed. --mode asks\n"
          "an access test on that part (bits: 1 read, 2 write, 4 execute, 8 delete, 16 append;\n"
@@ -66,7 +72,8 @@ std::vector<CommandDef> MakeCommands() {
           {"user", "USER", false, "judge the access test as this account (needs root)"}},
          {{"PATH", "an absolute real path, e.g. /volume1/photo/new/dir"}},
          RunCheckPath},
-        {"login", "log a user in and print the new sid",
+        {"login",
+         "log a user in and print the new sid",
          "Checks USER's password and records a login from the remote address, as the web\n"
          "interface does (QUIBLoginCreate), then prints the sid (alone on its line in text, so\n"
          "$(norvo login ...) takes it). Give the password with --password (visible to other\n"
@@ -77,7 +84,8 @@ std::vector<CommandDef> MakeCommands() {
           {"remote-addr", "ADDR", false, "the address the login comes from (default 127.0.0.1)"}},
          {},
          RunLogin},
-        {"mounts", "the mount-status table a listing works with",
+        {"mounts",
+         "the mount-status table a listing works with",
          "Reads the mount table as the library does (NorvoMountStatus, from /proc/mounts) and\n"
          "prints each mount directory with its read-only state and its file-system type: the\n"
          "index into the platform's type table and its name. Type names compare exactly with the\n"
@@ -92,7 +100,8 @@ std::vector<CommandDef> MakeCommands() {
          {{"path", "PATH", false, "also report the read-only state and type the library gives PATH"}},
          {},
          RunMounts},
-        {"whois", "names and groups of a user or group id, through the name caches",
+        {"whois",
+         "names and groups of a user or group id, through the name caches",
          "Names an id as a listing names the owner of a file (NorvoUserEnum): --uid N gives the\n"
          "account's name and its groups (NvoEnum::EnumUserGroups, the primary group first), each\n"
          "named through the group cache; --user USER the same for an account name; --gid N the\n"
@@ -103,7 +112,8 @@ std::vector<CommandDef> MakeCommands() {
           {"user", "USER", false, kUserHelp}},
          {},
          RunWhois},
-        {"conditions", "the search conditions a request makes, their index records, and what they match",
+        {"conditions",
+         "the search conditions a request makes, their index records, and what they match",
          "Builds the conditions a search request with these fields makes\n"
          "(FileSearch::FindFactory::createFindOp, in the order of the options below) and joins them\n"
          "into one query as the search walker does. Prints each condition with the file-index\n"
@@ -129,7 +139,8 @@ std::vector<CommandDef> MakeCommands() {
           {"size", "OP:BYTES", false, "size: equal:N, less:N, or greater than with any other word"}},
          {{"FILE...", "real paths to test in memory"}},
          RunConditions},
-        {"ls", "a directory's page of entries, or the shares at /, as the web interface gets it",
+        {"ls",
+         "a directory's page of entries, or the shares at /, as the web interface gets it",
          "Lists PATH as the file manager's listing request does for USER: resolved first\n"
          "(NvoFullPathGet), refused unless USER may list its share (CheckShareListPrivilege; 407\n"
          "when the check gives no code), then read as USER (initgroups, setegid, seteuid: needs\n"
@@ -145,7 +156,8 @@ std::vector<CommandDef> MakeCommands() {
          "for the --info groups; the text is a table of the same groups, a folder's name ending in\n"
          "\"/\". Default info: every group but volume_status and sync_share; at \"/\" volume_status too.",
          {{"user", "USER", true, kUserHelp},
-          {"sort", "KEY", false, "sort key: size, mtime, crtime, ctime, atime, user, group, posix, type, name"},
+          {"sort", "KEY", false,
+           "sort key: size, mtime, crtime, ctime, atime, user, group, posix, type, name"},
           {"desc", nullptr, false, "descending: the sorted list reversed"},
           {"offset", "N", false, "the page's first entry, from 0"},
           {"limit", "N", false, "at most N entries (0: all)"},

@@ -69,7 +69,8 @@ void PrintCommandHelp(std::ostream &out, const CommandDef &command) {
     }
     std::vector<std::pair<std::string, std::string>> rows;
     for (const OptionDef &option : command.options) {
-        rows.emplace_back(OptionLabel(option), std::string(option.help) + (option.required ? " (required)" : ""));
+        rows.emplace_back(OptionLabel(option),
+                          std::string(option.help) + (option.required ? " (required)" : ""));
     }
     rows.emplace_back("--json", "print one JSON object instead of text");
     if (TakesPaths(command)) {

@@ -12,9 +12,12 @@ namespace {
 constexpr char kHex[] = "0123456789abcdef";
 
 void AppendUnit(std::string &out, unsigned unit) {
-    const char escape[] = {'\\',          'u',
-                           kHex[(unit >> 12) & 0xF], kHex[(unit >> 8) & 0xF],
-                           kHex[(unit >> 4) & 0xF],  kHex[unit & 0xF]};
+    const char escape[] = {'\\',
+                           'u',
+                           kHex[(unit >> 12) & 0xF],
+                           kHex[(unit >> 8) & 0xF],
+                           kHex[(unit >> 4) & 0xF],
+                           kHex[unit & 0xF]};
     out.append(escape, sizeof escape);
 }
 
@@ -38,35 +41,49 @@ void AppendQuoted(std::string &out, const char *text, const char *end) {
             continue;
         }
         switch (byte) {
-        case '"': out += "\\\""; break;
-        case '\\': out += "\\\\"; break;
-        case '\b': out += "\\b"; break;
-        case '\f': out += "\\f"; break;
-        case '\n': out += "\\n"; break;
-        case '\r': out += "\\r"; break;
-        case '\t': out += "\\t"; break;
-        default:
-            if (byte < 0x80) {
-                AppendUnit(out, byte);
+            case '"':
+                out += "\\\"";
                 break;
-            }
-            {
-                // Valid UTF-8 by contract: the lead byte gives the length (cut at the end
-                // all the same, so a broken string cannot make the walk overrun).
-                const ptrdiff_t lead = byte >= 0xF0 ? 4 : byte >= 0xE0 ? 3 : 2;
-                const int length = static_cast<int>(std::min(lead, end - text));
-                unsigned c = byte & (0x7F >> length);
-                for (int i = 1; i < length; ++i) {
-                    c = (c << 6) | (static_cast<unsigned char>(text[i]) & 0x3F);
+            case '\\':
+                out += "\\\\";
+                break;
+            case '\b':
+                out += "\\b";
+                break;
+            case '\f':
+                out += "\\f";
+                break;
+            case '\n':
+                out += "\\n";
+                break;
+            case '\r':
+                out += "\\r";
+                break;
+            case '\t':
+                out += "\\t";
+                break;
+            default:
+                if (byte < 0x80) {
+                    AppendUnit(out, byte);
+                    break;
                 }
-                text += length - 1;
-                if (c < 0x10000) {
-                    AppendUnit(out, c);
-                } else {
-                    AppendUnit(out, 0xD800 + ((c - 0x10000) >> 10));
-                    AppendUnit(out, 0xDC00 + ((c - 0x10000) & 0x3FF));
+                {
+                    // Valid UTF-8 by contract: the lead byte gives the length (cut at the end
+                    // all the same, so a broken string cannot make the walk overrun).
+                    const ptrdiff_t lead = byte >= 0xF0 ? 4 : byte >= 0xE0 ? 3 : 2;
+                    const int length = static_cast<int>(std::min(lead, end - text));
+                    unsigned c = byte & (0x7F >> length);
+                    for (int i = 1; i < length; ++i) {
+                        c = (c << 6) | (static_cast<unsigned char>(text[i]) & 0x3F);
+                    }
+                    text += length - 1;
+                    if (c < 0x10000) {
+                        AppendUnit(out, c);
+                    } else {
+                        AppendUnit(out, 0xD800 + ((c - 0x10000) >> 10));
+                        AppendUnit(out, 0xDC00 + ((c - 0x10000) & 0x3FF));
+                    }
                 }
-            }
         }
         ++text;
     }
@@ -91,52 +108,54 @@ void AppendDouble(std::string &out, double value) {
 
 void AppendJson(std::string &out, const Json::Value &value) {
     switch (value.type()) {
-    case Json::nullValue:
-        out += "null";
-        break;
-    case Json::intValue:
-        out += std::to_string(value.asLargestInt());
-        break;
-    case Json::uintValue:
-        out += std::to_string(value.asLargestUInt());
-        break;
-    case Json::realValue:
-        AppendDouble(out, value.asDouble());
-        break;
-    case Json::booleanValue:
-        out += value.asBool() ? "true" : "false";
-        break;
-    case Json::stringValue: {
-        const char *begin = nullptr;
-        const char *end = nullptr;
-        value.getString(&begin, &end);
-        AppendQuoted(out, begin, end);
-        break;
-    }
-    case Json::arrayValue: {
-        out += '[';
-        for (Json::ArrayIndex i = 0; i < value.size(); ++i) {
-            if (i != 0) out += ',';
-            AppendJson(out, value[i]);
-        }
-        out += ']';
-        break;
-    }
-    case Json::objectValue: {
-        out += '{';
-        bool first = true;
-        for (auto member = value.begin(); member != value.end(); ++member) {
-            if (!first) out += ',';
-            first = false;
+        case Json::nullValue:
+            out += "null";
+            break;
+        case Json::intValue:
+            out += std::to_string(value.asLargestInt());
+            break;
+        case Json::uintValue:
+            out += std::to_string(value.asLargestUInt());
+            break;
+        case Json::realValue:
+            AppendDouble(out, value.asDouble());
+            break;
+        case Json::booleanValue:
+            out += value.asBool() ? "true" : "false";
+            break;
+        case Json::stringValue: {
+            const char *begin = nullptr;
             const char *end = nullptr;
-            const char *name = member.memberName(&end);
-            AppendQuoted(out, name, end);
-            out += ':';
-            AppendJson(out, *member);
+            value.getString(&begin, &end);
+            AppendQuoted(out, begin, end);
+            break;
         }
-        out += '}';
-        break;
-    }
+        case Json::arrayValue: {
+            out += '[';
+            for (Json::ArrayIndex i = 0; i < value.size(); ++i) {
+                if (i != 0)
+                    out += ',';
+                AppendJson(out, value[i]);
+            }
+            out += ']';
+            break;
+        }
+        case Json::objectValue: {
+            out += '{';
+            bool first = true;
+            for (auto member = value.begin(); member != value.end(); ++member) {
+                if (!first)
+                    out += ',';
+                first = false;
+                const char *end = nullptr;
+                const char *name = member.memberName(&end);
+                AppendQuoted(out, name, end);
+                out += ':';
+                AppendJson(out, *member);
+            }
+            out += '}';
+            break;
+        }
     }
 }
 

@@ -16,20 +16,20 @@ int main(int argc, char **argv) {
     try {
         const ParseOutcome outcome = ParseCommandLine(argc, argv);
         switch (outcome.kind) {
-        case ParseOutcome::kHelp:
-            if (outcome.topic != nullptr) {
-                PrintCommandHelp(std::cout, *outcome.topic);
-            } else {
-                PrintOverview(std::cout);
-            }
-            status = kExitOk;
-            break;
-        case ParseOutcome::kUsageError:
-            status = ReportUsageError(outcome.topic, outcome.error);
-            break;
-        case ParseOutcome::kRun:
-            status = outcome.invocation.command->handler(outcome.invocation);
-            break;
+            case ParseOutcome::kHelp:
+                if (outcome.topic != nullptr) {
+                    PrintCommandHelp(std::cout, *outcome.topic);
+                } else {
+                    PrintOverview(std::cout);
+                }
+                status = kExitOk;
+                break;
+            case ParseOutcome::kUsageError:
+                status = ReportUsageError(outcome.topic, outcome.error);
+                break;
+            case ParseOutcome::kRun:
+                status = outcome.invocation.command->handler(outcome.invocation);
+                break;
         }
     } catch (const std::exception &e) {
         std::cerr << "norvo: internal error: " << e.what() << '\n';

@@ -161,7 +161,8 @@ int ReportFailure(const Invocation &inv, int code, const std::string &message) {
 int ReportLibraryFailure(const Invocation &inv, const std::string &message) {
     const int code = NvoLibGetErr();
     if (code == NVO_ERR_NONE) {
-        return ReportFailure(inv, NVO_ERR_SYSTEM, message.empty() ? "the library gave no error code" : message);
+        return ReportFailure(inv, NVO_ERR_SYSTEM,
+                             message.empty() ? "the library gave no error code" : message);
     }
     return ReportFailure(inv, code, message);
 }

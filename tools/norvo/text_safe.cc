@@ -65,13 +65,13 @@ UChar32 CodePoint(const char *sequence, size_t length) {
 // Characters that change how the line shows rather than showing themselves.
 bool IsInvisible(UChar32 c) {
     switch (u_charType(c)) {
-    case U_CONTROL_CHAR:
-    case U_FORMAT_CHAR:
-    case U_LINE_SEPARATOR:
-    case U_PARAGRAPH_SEPARATOR:
-        return true;
-    default:
-        return false;
+        case U_CONTROL_CHAR:
+        case U_FORMAT_CHAR:
+        case U_LINE_SEPARATOR:
+        case U_PARAGRAPH_SEPARATOR:
+            return true;
+        default:
+            return false;
     }
 }
 
@@ -81,9 +81,12 @@ bool NeedsHex(std::string_view text, size_t pos, size_t length) {
 }
 
 int HexValue(char c) {
-    if (c >= '0' && c <= '9') return c - '0';
-    if (c >= 'a' && c <= 'f') return c - 'a' + 10;
-    if (c >= 'A' && c <= 'F') return c - 'A' + 10;
+    if (c >= '0' && c <= '9')
+        return c - '0';
+    if (c >= 'a' && c <= 'f')
+        return c - 'a' + 10;
+    if (c >= 'A' && c <= 'F')
+        return c - 'A' + 10;
     return -1;
 }
 
@@ -132,7 +135,7 @@ std::string TerminalSafe(std::string_view text) {
             // CORP\dave stays as it is.
             const size_t next = pos + 1;
             const bool starts = next < text.size() && (text[next] == '\\' || text[next] == 'x' ||
-                                                      NeedsHex(text, next, SequenceLength(text, next)));
+                                                       NeedsHex(text, next, SequenceLength(text, next)));
             out += starts ? "\\\\" : "\\";
         } else {
             out.append(text, pos, length);

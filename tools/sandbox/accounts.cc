@@ -24,12 +24,15 @@ constexpr uid_t kNobody = 65534;
 std::string HashPassword(const std::string &password) {
     static const char kAlphabet[] = "./0123456789ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz";
     unsigned char random[16];
-    if (getrandom(random, sizeof random, 0) != ssize_t(sizeof random)) FailErrno("can't get a salt");
+    if (getrandom(random, sizeof random, 0) != ssize_t(sizeof random))
+        FailErrno("can't get a salt");
     std::string salt = "$6$";
-    for (unsigned char byte : random) salt += kAlphabet[byte & 63];
+    for (unsigned char byte : random)
+        salt += kAlphabet[byte & 63];
     const auto data = std::make_unique<crypt_data>();
     const char *hash = crypt_r(password.c_str(), salt.c_str(), data.get());
-    if (hash == nullptr || hash[0] == '*') Fail("crypt refused to hash a password");
+    if (hash == nullptr || hash[0] == '*')
+        Fail("crypt refused to hash a password");
     return hash;
 }
 
@@ -40,7 +43,8 @@ void CheckName(const std::string &name, const char *what) {
 
 std::string Join(const std::vector<std::string> &items) {
     std::string out;
-    for (const auto &item : items) out += (out.empty() ? "" : ",") + item;
+    for (const auto &item : items)
+        out += (out.empty() ? "" : ",") + item;
     return out;
 }
 
@@ -57,7 +61,8 @@ Accounts::Accounts() {
 
 Accounts::Group *Accounts::FindGroupEntry(const std::string &name) {
     for (auto &group : groups_)
-        if (group.name == name) return &group;
+        if (group.name == name)
+            return &group;
     return nullptr;
 }
 
@@ -69,22 +74,26 @@ Accounts::Group &Accounts::EnsureGroup(const std::string &name, gid_t gid) {
                  unsigned(gid));
         return *existing;
     }
-    if (gid == 0) gid = NextGid();
+    if (gid == 0)
+        gid = NextGid();
     for (const auto &group : groups_)
-        if (group.gid == gid) Fail("gid %u is already taken by group %s", unsigned(gid), group.name.c_str());
+        if (group.gid == gid)
+            Fail("gid %u is already taken by group %s", unsigned(gid), group.name.c_str());
     groups_.push_back({name, gid, {}});
     return groups_.back();
 }
 
 uid_t Accounts::NextUid() const {
     uid_t uid = kFirstUid;
-    while (std::any_of(users_.begin(), users_.end(), [&](const User &u) { return u.uid == uid; })) ++uid;
+    while (std::any_of(users_.begin(), users_.end(), [&](const User &u) { return u.uid == uid; }))
+        ++uid;
     return uid;
 }
 
 gid_t Accounts::NextGid() const {
     gid_t gid = kFirstGid;
-    while (std::any_of(groups_.begin(), groups_.end(), [&](const Group &g) { return g.gid == gid; })) ++gid;
+    while (std::any_of(groups_.begin(), groups_.end(), [&](const Group &g) { return g.gid == gid; }))
+        ++gid;
     return gid;
 }
 
@@ -92,11 +101,14 @@ void Accounts::AddUser(const UserSpec &account) {
     CheckName(account.name, "user");
     uid_t ignoredUid;
     gid_t ignoredGid;
-    if (FindUser(account.name, &ignoredUid, &ignoredGid)) Fail("user %s already exists", account.name.c_str());
+    if (FindUser(account.name, &ignoredUid, &ignoredGid))
+        Fail("user %s already exists", account.name.c_str());
     const uid_t uid = account.uid != 0 ? account.uid : NextUid();
     for (const auto &user : users_)
-        if (user.uid == uid) Fail("uid %u is already taken by %s", unsigned(uid), user.name.c_str());
-    if (account.home.find_first_of(":\n") != std::string::npos) Fail("bad home \"%s\"", account.home.c_str());
+        if (user.uid == uid)
+            Fail("uid %u is already taken by %s", unsigned(uid), user.name.c_str());
+    if (account.home.find_first_of(":\n") != std::string::npos)
+        Fail("bad home \"%s\"", account.home.c_str());
     users_.push_back({account.name, uid, kUsersGid, HashPassword(account.password), account.home, "/bin/sh",
                       account.expireDay});
     // Every local account of the appliance is listed in "users" as well as having it as primary.
@@ -120,7 +132,9 @@ void Accounts::AddGroup(const GroupSpec &account) {
     }
 }
 
-void Accounts::SetHomesRoot(const std::string &root) { homesRoot_ = root; }
+void Accounts::SetHomesRoot(const std::string &root) {
+    homesRoot_ = root;
+}
 
 bool Accounts::FindUser(const std::string &name, uid_t *uid, gid_t *gid) const {
     for (const auto &user : users_) {

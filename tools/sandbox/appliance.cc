@@ -44,7 +44,9 @@ constexpr const char kNsswitch[] =
     "hosts: files dns\nnetworks: files\nprotocols: files\nservices: files\n"
     "ethers: files\nrpc: files\nnetgroup: files\n";
 
-const char *YesNo(bool value) { return value ? "yes" : "no"; }
+const char *YesNo(bool value) {
+    return value ? "yes" : "no";
+}
 
 // How long the destructor waits for the process's other threads to let go of its file-system
 // context.
@@ -62,7 +64,8 @@ void ReturnToNamespace(int ns, const std::string &cwd) {
         timespec delay{0, 1000000L};
         nanosleep(&delay, nullptr);
     }
-    if (chdir(cwd.c_str()) != 0 && chdir("/") != 0) FailErrno("can't enter / on the host");
+    if (chdir(cwd.c_str()) != 0 && chdir("/") != 0)
+        FailErrno("can't enter / on the host");
 }
 
 }  // namespace
@@ -81,24 +84,28 @@ struct Appliance::Impl {
     void Owner(const std::string &owner, uid_t *uid, gid_t *gid) const {
         const size_t colon = owner.find(':');
         const std::string user = owner.substr(0, colon);
-        if (!accounts.FindUser(user, uid, gid)) Fail("unknown owner %s", user.c_str());
+        if (!accounts.FindUser(user, uid, gid))
+            Fail("unknown owner %s", user.c_str());
         if (colon != std::string::npos && !accounts.FindGroup(owner.substr(colon + 1), gid))
             Fail("unknown group %s", owner.substr(colon + 1).c_str());
     }
 };
 
 Appliance::Appliance() : impl_(new Impl) {
-    if (g_applianceAlive) Fail("one appliance at a time: the previous one is still alive");
+    if (g_applianceAlive)
+        Fail("one appliance at a time: the previous one is still alive");
     g_applianceAlive = true;
     impl_->hostNamespace = UniqueFd(open("/proc/self/ns/mnt", O_RDONLY | O_CLOEXEC));
-    if (!impl_->hostNamespace) FailErrno("can't open the current mount namespace");
+    if (!impl_->hostNamespace)
+        FailErrno("can't open the current mount namespace");
     char cwd[PATH_MAX];
     impl_->hostCwd = getcwd(cwd, sizeof cwd) != nullptr ? cwd : "/";
 
     EnterPrivateRoot({NORVO_SOURCE_DIR, NORVO_BINARY_DIR});
     WriteWholeFile("/etc/nsswitch.conf", kNsswitch, 0, 0, 0644);
     impl_->accounts.Write();
-    for (KeyValueFile *file : {&impl_->settings, &impl_->defaults, &impl_->privileges}) file->Write();
+    for (KeyValueFile *file : {&impl_->settings, &impl_->defaults, &impl_->privileges})
+        file->Write();
     impl_->shares.Write();
     impl_->capture = std::make_unique<SyslogCapture>("/dev/log");
     // glibc keeps its syslog socket connected; the next line must connect to the capture.
@@ -173,7 +180,8 @@ Appliance &Appliance::SetHomeService(bool enabled, const std::string &root, bool
     impl_->accounts.SetHomesRoot(root);
     impl_->accounts.Write();
     // The appliance creates the homes folder when the service is switched on; homes are not.
-    if (enabled) MakeDirectory(root, 0, 0, 0755);
+    if (enabled)
+        MakeDirectory(root, 0, 0, 0755);
     return *this;
 }
 
@@ -241,9 +249,13 @@ Appliance &Appliance::MountDeadRemote(const std::string &path) {
     return *this;
 }
 
-std::vector<LogLine> Appliance::Logs() { return impl_->capture->Lines(); }
+std::vector<LogLine> Appliance::Logs() {
+    return impl_->capture->Lines();
+}
 
-void Appliance::ClearLogs() { impl_->capture->Clear(); }
+void Appliance::ClearLogs() {
+    impl_->capture->Clear();
+}
 
 void Appliance::ForwardLogs(std::function<void(const LogLine &)> sink) {
     impl_->capture->SetSink(std::move(sink));
@@ -252,17 +264,20 @@ void Appliance::ForwardLogs(std::function<void(const LogLine &)> sink) {
 std::vector<std::string> Appliance::ErrorLines() {
     std::vector<std::string> errors;
     for (const LogLine &line : Logs())
-        if (line.priority == LOG_ERR) errors.push_back(NormaliseSourceLines(line.text));
+        if (line.priority == LOG_ERR)
+            errors.push_back(NormaliseSourceLines(line.text));
     return errors;
 }
 
 int Appliance::RunAs(const std::string &user, const std::function<int()> &fn) {
     uid_t uid;
     gid_t gid;
-    if (!impl_->accounts.FindUser(user, &uid, &gid)) Fail("RunAs: no user %s in the appliance", user.c_str());
+    if (!impl_->accounts.FindUser(user, &uid, &gid))
+        Fail("RunAs: no user %s in the appliance", user.c_str());
     fflush(nullptr);
     const pid_t pid = fork();
-    if (pid < 0) FailErrno("RunAs: can't fork");
+    if (pid < 0)
+        FailErrno("RunAs: can't fork");
     if (pid == 0) {
         BecomeUser(user);
         const int result = std::clamp(fn(), -kResultLimit, kResultLimit);
@@ -271,9 +286,11 @@ int Appliance::RunAs(const std::string &user, const std::function<int()> &fn) {
     }
     int status = 0;
     while (waitpid(pid, &status, 0) < 0) {
-        if (errno != EINTR) FailErrno("RunAs: can't wait for the child");
+        if (errno != EINTR)
+            FailErrno("RunAs: can't wait for the child");
     }
-    if (WIFSIGNALED(status)) return -1000 - WTERMSIG(status);
+    if (WIFSIGNALED(status))
+        return -1000 - WTERMSIG(status);
     const int code = WEXITSTATUS(status);
     if (code < kResultBias - kResultLimit || code > kResultBias + kResultLimit)
         Fail("RunAs: the child as %s exited with status %d without returning a result", user.c_str(), code);
@@ -283,13 +300,15 @@ int Appliance::RunAs(const std::string &user, const std::function<int()> &fn) {
 uid_t Appliance::Uid(const std::string &user) const {
     uid_t uid;
     gid_t gid;
-    if (!impl_->accounts.FindUser(user, &uid, &gid)) Fail("Uid: no user %s in the appliance", user.c_str());
+    if (!impl_->accounts.FindUser(user, &uid, &gid))
+        Fail("Uid: no user %s in the appliance", user.c_str());
     return uid;
 }
 
 gid_t Appliance::Gid(const std::string &group) const {
     gid_t gid;
-    if (!impl_->accounts.FindGroup(group, &gid)) Fail("Gid: no group %s in the appliance", group.c_str());
+    if (!impl_->accounts.FindGroup(group, &gid))
+        Fail("Gid: no group %s in the appliance", group.c_str());
     return gid;
 }
 

@@ -35,9 +35,9 @@ struct ShareSpec {
     std::string noAccess;  // comma-separated users and @groups, as in the share configuration
     std::string readWrite;
     std::string readOnly;
-    bool hidden = false;      // browseable = no
+    bool hidden = false;  // browseable = no
     bool encrypted = false;
-    unsigned restrict = 0;    // SHARE_RESTRICT_* bits
+    unsigned restrict = 0;  // SHARE_RESTRICT_* bits
     bool aclMode = true;
     std::string comment;
 };
@@ -51,7 +51,9 @@ struct LogLine {
 inline bool operator==(const LogLine &a, const LogLine &b) {
     return a.priority == b.priority && a.text == b.text;
 }
-inline bool operator!=(const LogLine &a, const LogLine &b) { return !(a == b); }
+inline bool operator!=(const LogLine &a, const LogLine &b) {
+    return !(a == b);
+}
 // Readable in test failure messages.
 inline void PrintTo(const LogLine &line, std::ostream *out) {
     *out << "{" << line.priority << ", \"" << line.text << "\"}";
@@ -88,8 +90,8 @@ public:
     // Creates the share's directory (mode 0777, root) and its configuration section.
     Appliance &AddShare(const ShareSpec &share);
     // The home service: enabled flag for local, domain and directory accounts, and the root.
-    Appliance &SetHomeService(bool enabled, const std::string &root = "/volume1/homes",
-                              bool domain = true, bool directory = true);
+    Appliance &SetHomeService(bool enabled, const std::string &root = "/volume1/homes", bool domain = true,
+                              bool directory = true);
     // Configures a domain ("CORP") or directory service so their privilege lookups work.
     Appliance &SetDomain(const std::string &workgroup);
     Appliance &SetDirectory(const std::string &server);

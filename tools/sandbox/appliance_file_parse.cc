@@ -35,8 +35,10 @@ std::vector<Token> Tokenize(std::string_view line) {
     std::vector<Token> tokens;
     size_t at = 0;
     for (;;) {
-        while (at < line.size() && std::isspace(static_cast<unsigned char>(line[at]))) ++at;
-        if (at >= line.size() || line[at] == '#') return tokens;
+        while (at < line.size() && std::isspace(static_cast<unsigned char>(line[at])))
+            ++at;
+        if (at >= line.size() || line[at] == '#')
+            return tokens;
         Token token;
         bool quoted = false;
         for (; at < line.size() && (quoted || !std::isspace(static_cast<unsigned char>(line[at]))); ++at) {
@@ -44,13 +46,23 @@ std::vector<Token> Tokenize(std::string_view line) {
             if (c == '"') {
                 quoted = !quoted;
             } else if (quoted && c == '\\') {
-                if (++at >= line.size()) break;
+                if (++at >= line.size())
+                    break;
                 switch (line[at]) {
-                    case '"': token.text += '"'; break;
-                    case '\\': token.text += '\\'; break;
-                    case 'n': token.text += '\n'; break;
-                    case 't': token.text += '\t'; break;
-                    default: throw LineError{std::string("unknown escape '\\") + line[at] + "' in quotes"};
+                    case '"':
+                        token.text += '"';
+                        break;
+                    case '\\':
+                        token.text += '\\';
+                        break;
+                    case 'n':
+                        token.text += '\n';
+                        break;
+                    case 't':
+                        token.text += '\t';
+                        break;
+                    default:
+                        throw LineError{std::string("unknown escape '\\") + line[at] + "' in quotes"};
                 }
             } else {
                 if (!quoted && c == '=' && token.equals == std::string::npos)
@@ -58,7 +70,8 @@ std::vector<Token> Tokenize(std::string_view line) {
                 token.text += c;
             }
         }
-        if (quoted) throw LineError{"unterminated quote"};
+        if (quoted)
+            throw LineError{"unterminated quote"};
         tokens.push_back(std::move(token));
     }
 }
@@ -77,8 +90,11 @@ const std::vector<Syntax> &Directives() {
         {"user", Kind::kUser, 1, {"password", "uid", "groups", "home", "expire"}, {}},
         {"admin", Kind::kAdmin, 1, {"password", "uid", "groups", "home", "expire"}, {}},
         {"group", Kind::kGroup, 1, {"gid", "members"}, {}},
-        {"share", Kind::kShare, 1,
-         {"volume", "path", "rw", "ro", "noaccess", "restrict", "acl", "comment"}, {"hidden", "encrypted"}},
+        {"share",
+         Kind::kShare,
+         1,
+         {"volume", "path", "rw", "ro", "noaccess", "restrict", "acl", "comment"},
+         {"hidden", "encrypted"}},
         {"home", Kind::kHome, 1, {"root", "domain", "directory"}, {}},
         {"domain", Kind::kDomain, 1, {}, {}},
         {"directory", Kind::kDirectory, 1, {}, {}},
@@ -104,7 +120,8 @@ unsigned long long Number(const std::string &key, const std::string &text, unsig
         !std::all_of(text.begin(), text.end(), [](char c) { return c >= '0' && c <= '9'; }))
         throw LineError{"bad " + key + " '" + text + "' (a decimal number)"};
     const unsigned long long value = std::stoull(text);
-    if (value > max) throw LineError{"bad " + key + " '" + text + "' (at most " + std::to_string(max) + ")"};
+    if (value > max)
+        throw LineError{"bad " + key + " '" + text + "' (at most " + std::to_string(max) + ")"};
     return value;
 }
 
@@ -117,8 +134,10 @@ mode_t Mode(const std::string &text) {
 }
 
 bool YesNo(const std::string &key, const std::string &text) {
-    if (text == "yes") return true;
-    if (text == "no") return false;
+    if (text == "yes")
+        return true;
+    if (text == "no")
+        return false;
     throw LineError{"bad " + key + " '" + text + "' (yes or no)"};
 }
 
@@ -129,25 +148,32 @@ std::vector<std::string> List(const std::string &key, const std::string &text) {
         const size_t comma = text.find(',', start);
         const std::string item =
             text.substr(start, comma == std::string::npos ? std::string::npos : comma - start);
-        if (item.empty()) throw LineError{"bad " + key + " '" + text + "' (names separated by commas)"};
+        if (item.empty())
+            throw LineError{"bad " + key + " '" + text + "' (names separated by commas)"};
         items.push_back(item);
-        if (comma == std::string::npos) return items;
+        if (comma == std::string::npos)
+            return items;
         start = comma + 1;
     }
 }
 
 std::string AbsolutePath(const std::string &text) {
-    if (text.empty() || text[0] != '/') throw LineError{"'" + text + "' is not an absolute path"};
+    if (text.empty() || text[0] != '/')
+        throw LineError{"'" + text + "' is not an absolute path"};
     return text;
 }
 
 unsigned Restrictions(const std::string &text) {
     unsigned bits = 0;
     for (const std::string &word : List("restrict", text)) {
-        if (word == "nobrowse") bits |= SHARE_RESTRICT_NO_BROWSE;
-        else if (word == "nomodify") bits |= SHARE_RESTRICT_NO_MODIFY;
-        else if (word == "nodownload") bits |= SHARE_RESTRICT_NO_DOWNLOAD;
-        else throw LineError{"unknown restriction '" + word + "' (nobrowse, nomodify, nodownload)"};
+        if (word == "nobrowse")
+            bits |= SHARE_RESTRICT_NO_BROWSE;
+        else if (word == "nomodify")
+            bits |= SHARE_RESTRICT_NO_MODIFY;
+        else if (word == "nodownload")
+            bits |= SHARE_RESTRICT_NO_DOWNLOAD;
+        else
+            throw LineError{"unknown restriction '" + word + "' (nobrowse, nomodify, nodownload)"};
     }
     return bits;
 }
@@ -166,7 +192,8 @@ struct KnownNames {
     void CheckOwner(const std::string &owner) const {
         const size_t colon = owner.find(':');
         const std::string user = owner.substr(0, colon);
-        if (users.count(user) == 0) throw LineError{"unknown owner '" + user + "'"};
+        if (users.count(user) == 0)
+            throw LineError{"unknown owner '" + user + "'"};
         if (colon != std::string::npos && groups.count(owner.substr(colon + 1)) == 0)
             throw LineError{"unknown group '" + owner.substr(colon + 1) + "'"};
     }
@@ -185,24 +212,37 @@ public:
                                 (syntax.positionals == 1 ? " argument" : " arguments")};
             positionals_.push_back(tokens[next].text);
         }
-        for (; next < tokens.size(); ++next) arguments_.push_back(tokens[next]);
+        for (; next < tokens.size(); ++next)
+            arguments_.push_back(tokens[next]);
     }
 
     ApplianceStep Parse() {
         switch (syntax_.kind) {
-            case Kind::kBasic: Basic(); break;
+            case Kind::kBasic:
+                Basic();
+                break;
             case Kind::kUser:
-            case Kind::kAdmin: User(); break;
-            case Kind::kGroup: Group(); break;
-            case Kind::kShare: Share(); break;
-            case Kind::kHome: Home(); break;
+            case Kind::kAdmin:
+                User();
+                break;
+            case Kind::kGroup:
+                Group();
+                break;
+            case Kind::kShare:
+                Share();
+                break;
+            case Kind::kHome:
+                Home();
+                break;
             case Kind::kDomain:
             case Kind::kDirectory:
                 Options();
                 step_.name = positionals_[0];
                 break;
             case Kind::kSetting:
-            case Kind::kDefaultSetting: Setting(); break;
+            case Kind::kDefaultSetting:
+                Setting();
+                break;
             case Kind::kPrivilege:
                 Options();
                 step_.name = positionals_[0];
@@ -216,7 +256,9 @@ public:
                 step_.path = AbsolutePath(positionals_[0]);
                 break;
             case Kind::kDir:
-            case Kind::kFile: Node(); break;
+            case Kind::kFile:
+                Node();
+                break;
         }
         return step_;
     }
@@ -243,7 +285,8 @@ private:
 
     void Basic() {
         Options();
-        for (const char *user : {"admin", "alice", "bob"}) known_.AddUser(user, step_.line);
+        for (const char *user : {"admin", "alice", "bob"})
+            known_.AddUser(user, step_.line);
         known_.groups.insert("staff");
     }
 
@@ -253,11 +296,16 @@ private:
         if (user.name.find_first_of(":,") != std::string::npos)
             throw LineError{"bad user name '" + user.name + "'"};
         for (const auto &[key, value] : Options()) {
-            if (key == "password") user.password = value;
-            else if (key == "uid") user.uid = uid_t(Number(key, value, 4294967294ULL));
-            else if (key == "groups") user.groups = List(key, value);
-            else if (key == "home") user.home = AbsolutePath(value);
-            else if (key == "expire") user.expireDay = long(Number(key, value, 2147483647ULL));
+            if (key == "password")
+                user.password = value;
+            else if (key == "uid")
+                user.uid = uid_t(Number(key, value, 4294967294ULL));
+            else if (key == "groups")
+                user.groups = List(key, value);
+            else if (key == "home")
+                user.home = AbsolutePath(value);
+            else if (key == "expire")
+                user.expireDay = long(Number(key, value, 2147483647ULL));
         }
         if (step_.kind == Kind::kAdmin && !Contains(user.groups, QUIB_ADMIN_GROUP))
             user.groups.push_back(QUIB_ADMIN_GROUP);
@@ -268,8 +316,10 @@ private:
     void Group() {
         step_.group.name = positionals_[0];
         for (const auto &[key, value] : Options()) {
-            if (key == "gid") step_.group.gid = gid_t(Number(key, value, 4294967294ULL));
-            else if (key == "members") step_.group.members = List(key, value);
+            if (key == "gid")
+                step_.group.gid = gid_t(Number(key, value, 4294967294ULL));
+            else if (key == "members")
+                step_.group.members = List(key, value);
         }
         known_.groups.insert(step_.group.name);
     }
@@ -278,14 +328,22 @@ private:
         ShareSpec &share = step_.share;
         share.name = positionals_[0];
         for (const auto &[key, value] : Options()) {
-            if (key == "volume") share.volume = AbsolutePath(value);
-            else if (key == "path") share.path = AbsolutePath(value);
-            else if (key == "rw") share.readWrite = value;
-            else if (key == "ro") share.readOnly = value;
-            else if (key == "noaccess") share.noAccess = value;
-            else if (key == "restrict") share.restrict = Restrictions(value);
-            else if (key == "acl") share.aclMode = YesNo(key, value);
-            else if (key == "comment") share.comment = value;
+            if (key == "volume")
+                share.volume = AbsolutePath(value);
+            else if (key == "path")
+                share.path = AbsolutePath(value);
+            else if (key == "rw")
+                share.readWrite = value;
+            else if (key == "ro")
+                share.readOnly = value;
+            else if (key == "noaccess")
+                share.noAccess = value;
+            else if (key == "restrict")
+                share.restrict = Restrictions(value);
+            else if (key == "acl")
+                share.aclMode = YesNo(key, value);
+            else if (key == "comment")
+                share.comment = value;
         }
         share.hidden = flags_.count("hidden") != 0;
         share.encrypted = flags_.count("encrypted") != 0;
@@ -293,13 +351,17 @@ private:
 
     void Home() {
         const std::string &state = positionals_[0];
-        if (state != "on" && state != "off") throw LineError{"bad home state '" + state + "' (on or off)"};
+        if (state != "on" && state != "off")
+            throw LineError{"bad home state '" + state + "' (on or off)"};
         step_.enabled = state == "on";
         step_.path = "/volume1/homes";
         for (const auto &[key, value] : Options()) {
-            if (key == "root") step_.path = AbsolutePath(value);
-            else if (key == "domain") step_.domain = YesNo(key, value);
-            else if (key == "directory") step_.directory = YesNo(key, value);
+            if (key == "root")
+                step_.path = AbsolutePath(value);
+            else if (key == "domain")
+                step_.domain = YesNo(key, value);
+            else if (key == "directory")
+                step_.directory = YesNo(key, value);
         }
     }
 
@@ -349,17 +411,20 @@ bool ParseApplianceFile(std::string_view text, const std::string &origin, Applia
     int lineNumber = 0;
     for (size_t start = 0; start <= text.size();) {
         size_t end = text.find('\n', start);
-        if (end == std::string_view::npos) end = text.size();
+        if (end == std::string_view::npos)
+            end = text.size();
         const std::string_view line = text.substr(start, end - start);
         ++lineNumber;
         start = end + 1;
         try {
             const std::vector<Token> tokens = Tokenize(line);
-            if (tokens.empty()) continue;
+            if (tokens.empty())
+                continue;
             const auto &directives = Directives();
             const auto syntax = std::find_if(directives.begin(), directives.end(),
                                              [&](const Syntax &s) { return tokens[0].text == s.name; });
-            if (syntax == directives.end()) throw LineError{"unknown directive '" + tokens[0].text + "'"};
+            if (syntax == directives.end())
+                throw LineError{"unknown directive '" + tokens[0].text + "'"};
             parsed.steps.push_back(LineParser(*syntax, tokens, lineNumber, known).Parse());
         } catch (const LineError &failure) {
             *error = origin + ":" + std::to_string(lineNumber) + ": " + failure.message;

@@ -11,9 +11,15 @@
 
 namespace {
 
-int DeadGetattr(const char *, struct stat *, fuse_file_info *) { return -EIO; }
-int DeadAccess(const char *, int) { return -EIO; }
-int DeadOpendir(const char *, fuse_file_info *) { return -EIO; }
+int DeadGetattr(const char *, struct stat *, fuse_file_info *) {
+    return -EIO;
+}
+int DeadAccess(const char *, int) {
+    return -EIO;
+}
+int DeadOpendir(const char *, fuse_file_info *) {
+    return -EIO;
+}
 int DeadReaddir(const char *, void *, fuse_fill_dir_t, off_t, fuse_file_info *, fuse_readdir_flags) {
     return -EIO;
 }

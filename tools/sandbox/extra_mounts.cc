@@ -28,7 +28,8 @@ constexpr off_t kFatImageBytes = 64 << 20;
 void WaitForMount(ChildProcess &server, const std::string &path, const std::string &type,
                   const char *program) {
     for (long waited = 0; waited < kMountTimeoutMilliseconds; waited += 5) {
-        if (MountTypeAt(path) == type) return;
+        if (MountTypeAt(path) == type)
+            return;
         int status = 0;
         if (server.Ended(&status)) {
             Fail("%s gave up mounting %s (%s %d)", program, path.c_str(),
@@ -41,29 +42,35 @@ void WaitForMount(ChildProcess &server, const std::string &path, const std::stri
     Fail("%s did not mount %s within %ld ms", program, path.c_str(), kMountTimeoutMilliseconds);
 }
 
-bool IsMountPoint(const std::string &path) { return !MountTypeAt(path).empty(); }
+bool IsMountPoint(const std::string &path) {
+    return !MountTypeAt(path).empty();
+}
 
 }  // namespace
 
 std::string MountTypeAt(const std::string &path) {
     const std::unique_ptr<FILE, int (*)(FILE *)> table(setmntent("/proc/self/mounts", "re"), endmntent);
-    if (!table) FailErrno("can't read /proc/self/mounts");
+    if (!table)
+        FailErrno("can't read /proc/self/mounts");
     std::string type;
     mntent entry{};
     char buffer[4096];
     while (getmntent_r(table.get(), &entry, buffer, sizeof buffer) != nullptr)
-        if (path == entry.mnt_dir) type = entry.mnt_type;
+        if (path == entry.mnt_dir)
+            type = entry.mnt_type;
     return type;
 }
 
 void MountVolume(const std::string &path) {
-    if (path.empty() || path[0] != '/') Fail("a volume needs an absolute path, not \"%s\"", path.c_str());
+    if (path.empty() || path[0] != '/')
+        Fail("a volume needs an absolute path, not \"%s\"", path.c_str());
     MountTmpfs(path, "0755");
 }
 
 void RemountReadOnly(const std::string &path) {
     struct stat st {};
-    if (stat(path.c_str(), &st) != 0) FailErrno("can't make %s read-only", path.c_str());
+    if (stat(path.c_str(), &st) != 0)
+        FailErrno("can't make %s read-only", path.c_str());
     if (!IsMountPoint(path) && mount(path.c_str(), path.c_str(), nullptr, MS_BIND, nullptr) != 0)
         FailErrno("can't bind %s onto itself", path.c_str());
     // A bind remount changes only this mount's flag, whatever the file system.
@@ -74,13 +81,16 @@ void RemountReadOnly(const std::string &path) {
 ChildProcess MountFat(const std::string &path) {
     const std::string mkfs = FindProgram("mkfs.vfat");
     const std::string fusefat = FindProgram("fusefat");
-    if (mkfs.empty()) Fail("MountFat needs mkfs.vfat (package dosfstools)");
-    if (fusefat.empty()) Fail("MountFat needs fusefat (package fusefat)");
+    if (mkfs.empty())
+        Fail("MountFat needs mkfs.vfat (package dosfstools)");
+    if (fusefat.empty())
+        Fail("MountFat needs fusefat (package fusefat)");
     static int images = 0;
     const std::string image = std::string(kStateDir) + "/fat" + std::to_string(++images) + ".img";
     {
         const UniqueFd fd(open(image.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0600));
-        if (!fd || ftruncate(fd.get(), kFatImageBytes) != 0) FailErrno("can't create %s", image.c_str());
+        if (!fd || ftruncate(fd.get(), kFatImageBytes) != 0)
+            FailErrno("can't create %s", image.c_str());
     }
     RunProgram({mkfs, image});
     MakeDirectory(path, 0, 0, 0755);
@@ -98,4 +108,3 @@ ChildProcess MountDeadRemote(const std::string &path) {
 }
 
 }  // namespace norvo::testing::internal
-

@@ -11,7 +11,7 @@ namespace norvo::testing::internal {
 namespace {
 
 [[noreturn]] __attribute__((format(printf, 1, 0))) void Report(const char *format, va_list args,
-                                                                 const char *reason) {
+                                                               const char *reason) {
     char message[2048];
     vsnprintf(message, sizeof message, format, args);
     if (reason != nullptr)

@@ -16,8 +16,7 @@ void MakeDirectory(const std::string &path, uid_t uid, gid_t gid, mode_t mode);
 // Replaces path's content (parents as MakeParents), then gives it uid, gid and exactly mode.
 // Ownership and mode are only changed when they differ, so a FAT mount that refuses chown still
 // takes root-owned files.
-void WriteWholeFile(const std::string &path, const std::string &content, uid_t uid, gid_t gid,
-                    mode_t mode);
+void WriteWholeFile(const std::string &path, const std::string &content, uid_t uid, gid_t gid, mode_t mode);
 // The whole content of path; false when it can't be read.
 [[nodiscard]] bool ReadWholeFile(const std::string &path, std::string *content);
 

@@ -48,12 +48,17 @@ bool ParseOptions(int argc, char **argv, Options *options) {
     int at = 1;
     for (; at < argc && strncmp(argv[at], "--", 2) == 0 && strcmp(argv[at], "--") != 0; ++at) {
         const std::string arg = argv[at];
-        if (arg.rfind("--user=", 0) == 0) options->user = arg.substr(7);
-        else if (arg.rfind("--log=", 0) == 0) options->log = arg.substr(6);
-        else if (arg == "--no-log") options->log.clear();
-        else return false;
+        if (arg.rfind("--user=", 0) == 0)
+            options->user = arg.substr(7);
+        else if (arg.rfind("--log=", 0) == 0)
+            options->log = arg.substr(6);
+        else if (arg == "--no-log")
+            options->log.clear();
+        else
+            return false;
     }
-    if (at + 2 >= argc || strcmp(argv[at + 1], "--") != 0) return false;
+    if (at + 2 >= argc || strcmp(argv[at + 1], "--") != 0)
+        return false;
     options->applianceFile = argv[at];
     options->command.assign(argv + at + 2, argv + argc);
     return true;
@@ -75,9 +80,11 @@ int ShellStatus(int status) {
     prctl(PR_SET_PDEATHSIG, SIGKILL);
     signal(SIGINT, SIG_DFL);
     signal(SIGQUIT, SIG_DFL);
-    if (!options.user.empty()) norvo::testing::internal::BecomeUser(options.user);
+    if (!options.user.empty())
+        norvo::testing::internal::BecomeUser(options.user);
     std::vector<char *> args;
-    for (const auto &arg : options.command) args.push_back(const_cast<char *>(arg.c_str()));
+    for (const auto &arg : options.command)
+        args.push_back(const_cast<char *>(arg.c_str()));
     args.push_back(nullptr);
     execvp(args[0], args.data());
     const int error = errno;
@@ -94,13 +101,17 @@ int ShellStatus(int status) {
         perror("norvo-sandbox: fork");
         _exit(kSandboxFailed);
     }
-    if (command == 0) ExecCommand(options);
+    if (command == 0)
+        ExecCommand(options);
     for (;;) {
         int status = 0;
         const pid_t done = wait(&status);
-        if (done < 0 && errno == EINTR) continue;
-        if (done < 0) _exit(kSandboxFailed);
-        if (done == command) _exit(ShellStatus(status));
+        if (done < 0 && errno == EINTR)
+            continue;
+        if (done < 0)
+            _exit(kSandboxFailed);
+        if (done == command)
+            _exit(ShellStatus(status));
     }
 }
 
@@ -115,7 +126,8 @@ int RunCommand(const Options &options) {
         perror("norvo-sandbox: fork");
         return kSandboxFailed;
     }
-    if (init == 0) RunInit(options);
+    if (init == 0)
+        RunInit(options);
     // Like system(): the terminal's interrupt is for the command, which decides.
     signal(SIGINT, SIG_IGN);
     signal(SIGQUIT, SIG_IGN);
@@ -165,12 +177,14 @@ int main(int argc, char **argv) {
         norvo::testing::Appliance appliance;
         norvo::testing::BuildAppliance(appliance, file);
         appliance.ForwardLogs([log](const norvo::testing::LogLine &line) {
-            if (log == nullptr) return;
+            if (log == nullptr)
+                return;
             fprintf(log, "syslog.%s: %s\n", SeverityName(line.priority), line.text.c_str());
             fflush(log);
         });
         status = RunCommand(options);
     }
-    if (log != nullptr && log != stderr) fclose(log);
+    if (log != nullptr && log != stderr)
+        fclose(log);
     return status;
 }

@@ -38,19 +38,23 @@ void Mount(const char *source, const std::string &target, const char *type, unsi
 }
 
 void MakeDir(const std::string &path, mode_t mode) {
-    if (mkdir(path.c_str(), mode) != 0 && errno != EEXIST) FailErrno("can't create %s", path.c_str());
-    if (chmod(path.c_str(), mode) != 0) FailErrno("can't set the mode of %s", path.c_str());
+    if (mkdir(path.c_str(), mode) != 0 && errno != EEXIST)
+        FailErrno("can't create %s", path.c_str());
+    if (chmod(path.c_str(), mode) != 0)
+        FailErrno("can't set the mode of %s", path.c_str());
 }
 
 // A bind mount needs a target of the same kind: an empty file for a file or a device node.
 void MakeEmptyFile(const std::string &path) {
     const UniqueFd fd(open(path.c_str(), O_WRONLY | O_CREAT | O_CLOEXEC, 0600));
-    if (!fd) FailErrno("can't create %s", path.c_str());
+    if (!fd)
+        FailErrno("can't create %s", path.c_str());
 }
 
 void BindInto(const std::string &hostPath, const std::string &target) {
     struct stat st {};
-    if (lstat(hostPath.c_str(), &st) != 0) return;
+    if (lstat(hostPath.c_str(), &st) != 0)
+        return;
     if (S_ISDIR(st.st_mode)) {
         MakeDir(target, st.st_mode & 07777);
     } else {
@@ -62,9 +66,11 @@ void BindInto(const std::string &hostPath, const std::string &target) {
 void CopySymlink(const std::string &hostPath, const std::string &target) {
     char link[PATH_MAX];
     const ssize_t n = readlink(hostPath.c_str(), link, sizeof link - 1);
-    if (n < 0) FailErrno("can't read the link %s", hostPath.c_str());
+    if (n < 0)
+        FailErrno("can't read the link %s", hostPath.c_str());
     link[n] = '\0';
-    if (symlink(link, target.c_str()) != 0) FailErrno("can't create the link %s", target.c_str());
+    if (symlink(link, target.c_str()) != 0)
+        FailErrno("can't create the link %s", target.c_str());
 }
 
 // Recursively: mount_setattr reaches the mounts below path, which a bind remount would not.
@@ -84,14 +90,15 @@ void MountOverlay(const std::string &hostPath, const std::string &newRoot) {
     MakeDir(state + "/upper", 0755);
     MakeDir(state + "/work", 0700);
     struct stat st {};
-    if (stat(hostPath.c_str(), &st) != 0) FailErrno("can't examine %s", hostPath.c_str());
+    if (stat(hostPath.c_str(), &st) != 0)
+        FailErrno("can't examine %s", hostPath.c_str());
     // The merged directory shows the upper layer's mode and owner: a private /tmp stays 1777.
     if (chmod((state + "/upper").c_str(), st.st_mode & 07777) != 0 ||
         chown((state + "/upper").c_str(), st.st_uid, st.st_gid) != 0)
         FailErrno("can't prepare the overlay of %s", hostPath.c_str());
     MakeDir(newRoot + hostPath, st.st_mode & 07777);
-    const std::string options = "lowerdir=" + hostPath + ",upperdir=" + state +
-                                "/upper,workdir=" + state + "/work";
+    const std::string options =
+        "lowerdir=" + hostPath + ",upperdir=" + state + "/upper,workdir=" + state + "/work";
     Mount("overlay", newRoot + hostPath, "overlay", 0, options.c_str());
 }
 
@@ -100,8 +107,8 @@ void MountOverlay(const std::string &hostPath, const std::string &newRoot) {
 void BuildDev(const std::string &dev) {
     MakeDir(dev, 0755);
     Mount("tmpfs", dev, "tmpfs", MS_NOSUID, "mode=0755");
-    for (const char *node : {"null", "zero", "full", "random", "urandom", "tty", "fuse", "ptmx",
-                             "loop-control"}) {
+    for (const char *node :
+         {"null", "zero", "full", "random", "urandom", "tty", "fuse", "ptmx", "loop-control"}) {
         BindInto(std::string("/dev/") + node, dev + "/" + node);
     }
     glob_t loops{};
@@ -114,11 +121,11 @@ void BuildDev(const std::string &dev) {
     globfree(&loops);
     BindInto("/dev/pts", dev + "/pts");
     MountTmpfs(dev + "/shm", "1777");
-    for (const auto &[name, target] : {std::pair{"fd", "/proc/self/fd"},
-                                       std::pair{"stdin", "/proc/self/fd/0"},
-                                       std::pair{"stdout", "/proc/self/fd/1"},
-                                       std::pair{"stderr", "/proc/self/fd/2"}}) {
-        if (symlink(target, (dev + "/" + name).c_str()) != 0) FailErrno("can't create /dev/%s", name);
+    for (const auto &[name, target] :
+         {std::pair{"fd", "/proc/self/fd"}, std::pair{"stdin", "/proc/self/fd/0"},
+          std::pair{"stdout", "/proc/self/fd/1"}, std::pair{"stderr", "/proc/self/fd/2"}}) {
+        if (symlink(target, (dev + "/" + name).c_str()) != 0)
+            FailErrno("can't create /dev/%s", name);
     }
 }
 
@@ -133,9 +140,11 @@ std::vector<ReachableTree> OpenReachableTrees(const std::vector<std::string> &pa
     std::vector<ReachableTree> trees;
     for (const std::string &path : paths) {
         const std::unique_ptr<char, void (*)(void *)> real(realpath(path.c_str(), nullptr), free);
-        if (!real || std::string(real.get()) == "/") continue;  // a tree moved away stays out
+        if (!real || std::string(real.get()) == "/")
+            continue;  // a tree moved away stays out
         ReachableTree tree{real.get(), UniqueFd(open(real.get(), O_PATH | O_DIRECTORY | O_CLOEXEC))};
-        if (!tree.fd) FailErrno("can't open %s", real.get());
+        if (!tree.fd)
+            FailErrno("can't open %s", real.get());
         trees.push_back(std::move(tree));
     }
     // A tree inside another one comes with it.
@@ -146,7 +155,8 @@ std::vector<ReachableTree> OpenReachableTrees(const std::vector<std::string> &pa
         const auto inside = [&tree](const ReachableTree &outer) {
             return tree.path == outer.path || tree.path.rfind(outer.path + "/", 0) == 0;
         };
-        if (std::none_of(outermost.begin(), outermost.end(), inside)) outermost.push_back(std::move(tree));
+        if (std::none_of(outermost.begin(), outermost.end(), inside))
+            outermost.push_back(std::move(tree));
     }
     return outermost;
 }
@@ -165,27 +175,31 @@ void MountReachable(const std::string &newRoot, const ReachableTree &tree) {
         } else if ((st.st_mode & S_IXOTH) == 0 && slash != std::string::npos) {
             Mount("tmpfs", target, "tmpfs", 0, "mode=0755");
         }
-        if (slash == std::string::npos) break;
+        if (slash == std::string::npos)
+            break;
     }
     const std::string source = "/proc/self/fd/" + std::to_string(tree.fd.get());
     Mount(source.c_str(), newRoot + tree.path, nullptr, MS_BIND | MS_REC, nullptr);
 }
 
-bool IsVolumeName(const std::string &name) { return name.rfind("volume", 0) == 0; }
+bool IsVolumeName(const std::string &name) {
+    return name.rfind("volume", 0) == 0;
+}
 
 // Fills newRoot with the host's top-level entries, each in the form the appliance needs.
 void PopulateRoot(const std::string &newRoot) {
     const std::unique_ptr<DIR, int (*)(DIR *)> root(opendir("/"), closedir);
-    if (!root) FailErrno("can't list /");
+    if (!root)
+        FailErrno("can't list /");
     while (const dirent *entry = readdir(root.get())) {
         const std::string name = entry->d_name;
         const std::string host = "/" + name;
         const std::string target = newRoot + host;
-        if (name == "." || name == ".." || host == kStateDir || IsVolumeName(name) ||
-            name == "lost+found")
+        if (name == "." || name == ".." || host == kStateDir || IsVolumeName(name) || name == "lost+found")
             continue;
         struct stat st {};
-        if (lstat(host.c_str(), &st) != 0) continue;
+        if (lstat(host.c_str(), &st) != 0)
+            continue;
         if (S_ISLNK(st.st_mode)) {
             CopySymlink(host, target);
         } else if (name == "etc" || name == "usr") {
@@ -209,7 +223,8 @@ void PopulateRoot(const std::string &newRoot) {
         }
     }
     struct stat st {};
-    if (lstat((newRoot + "/etc.defaults").c_str(), &st) != 0) MountTmpfs(newRoot + "/etc.defaults", "0755");
+    if (lstat((newRoot + "/etc.defaults").c_str(), &st) != 0)
+        MountTmpfs(newRoot + "/etc.defaults", "0755");
 }
 
 }  // namespace
@@ -222,11 +237,13 @@ void MountTmpfs(const std::string &path, const char *mode) {
 }
 
 void EnterPrivateRoot(const std::vector<std::string> &reachable) {
-    if (geteuid() != 0) Fail("the appliance needs root (it mounts file systems in a private namespace)");
+    if (geteuid() != 0)
+        Fail("the appliance needs root (it mounts file systems in a private namespace)");
     char cwd[PATH_MAX];
     const bool haveCwd = getcwd(cwd, sizeof cwd) != nullptr;
 
-    if (unshare(CLONE_NEWNS) != 0) FailErrno("can't create a mount namespace");
+    if (unshare(CLONE_NEWNS) != 0)
+        FailErrno("can't create a mount namespace");
     // Private before anything else, so no mount below can propagate back to the host.
     Mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr);
 
@@ -235,17 +252,23 @@ void EnterPrivateRoot(const std::vector<std::string> &reachable) {
     Mount("tmpfs", newRoot, "tmpfs", 0, "mode=0755");
     MakeDir(newRoot + kStateDir, 0700);
     PopulateRoot(newRoot);
-    for (const ReachableTree &tree : trees) MountReachable(newRoot, tree);
+    for (const ReachableTree &tree : trees)
+        MountReachable(newRoot, tree);
 
     // pivot_root(".", ".") stacks the old root on the new one; detaching it leaves the new root.
-    if (chdir(newRoot.c_str()) != 0) FailErrno("can't enter %s", newRoot.c_str());
-    if (syscall(SYS_pivot_root, ".", ".") != 0) FailErrno("can't pivot into the private root");
-    if (umount2(".", MNT_DETACH) != 0) FailErrno("can't detach the host's root");
+    if (chdir(newRoot.c_str()) != 0)
+        FailErrno("can't enter %s", newRoot.c_str());
+    if (syscall(SYS_pivot_root, ".", ".") != 0)
+        FailErrno("can't pivot into the private root");
+    if (umount2(".", MNT_DETACH) != 0)
+        FailErrno("can't detach the host's root");
     if (!haveCwd || chdir(cwd) != 0) {
-        if (chdir("/") != 0) FailErrno("can't enter /");
+        if (chdir("/") != 0)
+            FailErrno("can't enter /");
     }
 
-    for (const char *volume : {"/volume1", "/volume2"}) MountTmpfs(volume, "0755");
+    for (const char *volume : {"/volume1", "/volume2"})
+        MountTmpfs(volume, "0755");
 }
 
 }  // namespace norvo::testing::internal

@@ -22,13 +22,15 @@ void KeyValueFile::Set(const std::string &key, const std::string &value) {
             found = true;
         }
     }
-    if (!found) entries_.emplace_back(key, value);
+    if (!found)
+        entries_.emplace_back(key, value);
     Write();
 }
 
 void KeyValueFile::Write() const {
     std::string text;
-    for (const auto &[key, value] : entries_) text += key + "=\"" + value + "\"\n";
+    for (const auto &[key, value] : entries_)
+        text += key + "=\"" + value + "\"\n";
     WriteWholeFile(path_, text, 0, 0, 0644);
 }
 
@@ -39,9 +41,10 @@ std::string ShareFile::Add(const ShareSpec &share) {
         if (strcasecmp(existing.name.c_str(), share.name.c_str()) == 0)
             Fail("share %s already exists", share.name.c_str());
     ShareSpec added = share;
-    if (added.path.empty()) added.path = added.volume + "/" + added.name;
-    for (const std::string *value : {&added.path, &added.comment, &added.noAccess, &added.readWrite,
-                                     &added.readOnly})
+    if (added.path.empty())
+        added.path = added.volume + "/" + added.name;
+    for (const std::string *value :
+         {&added.path, &added.comment, &added.noAccess, &added.readWrite, &added.readOnly})
         if (value->find('\n') != std::string::npos)
             Fail("share %s: a value holds a line break", share.name.c_str());
     shares_.push_back(added);
@@ -54,18 +57,23 @@ void ShareFile::Write() const {
     for (const auto &share : shares_) {
         text += "[" + share.name + "]\n";
         text += "\tpath = " + share.path + "\n";
-        const std::pair<const char *, const std::string *> lists[] = {
-            {"comment", &share.comment},
-            {"invalid users", &share.noAccess},
-            {"write list", &share.readWrite},
-            {"read list", &share.readOnly}};
+        const std::pair<const char *, const std::string *> lists[] = {{"comment", &share.comment},
+                                                                      {"invalid users", &share.noAccess},
+                                                                      {"write list", &share.readWrite},
+                                                                      {"read list", &share.readOnly}};
         for (const auto &[key, value] : lists)
-            if (!value->empty()) text += std::string("\t") + key + " = " + *value + "\n";
-        if (share.hidden) text += "\tbrowseable = no\n";
-        if (share.encrypted) text += "\tencrypted = yes\n";
-        if (share.restrict & SHARE_RESTRICT_NO_BROWSE) text += "\tdisable browsing = yes\n";
-        if (share.restrict & SHARE_RESTRICT_NO_MODIFY) text += "\tdisable modify = yes\n";
-        if (share.restrict & SHARE_RESTRICT_NO_DOWNLOAD) text += "\tdisable download = yes\n";
+            if (!value->empty())
+                text += std::string("\t") + key + " = " + *value + "\n";
+        if (share.hidden)
+            text += "\tbrowseable = no\n";
+        if (share.encrypted)
+            text += "\tencrypted = yes\n";
+        if (share.restrict & SHARE_RESTRICT_NO_BROWSE)
+            text += "\tdisable browsing = yes\n";
+        if (share.restrict & SHARE_RESTRICT_NO_MODIFY)
+            text += "\tdisable modify = yes\n";
+        if (share.restrict & SHARE_RESTRICT_NO_DOWNLOAD)
+            text += "\tdisable download = yes\n";
         text += std::string("\tacl = ") + (share.aclMode ? "yes" : "no") + "\n";
         text += "\n";
     }

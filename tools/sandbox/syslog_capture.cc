@@ -41,7 +41,9 @@ void GuardForksWithGate() {
     });
 }
 
-bool IsNameChar(char c) { return std::isalnum(static_cast<unsigned char>(c)) || c == '_' || c == '-'; }
+bool IsNameChar(char c) {
+    return std::isalnum(static_cast<unsigned char>(c)) || c == '_' || c == '-';
+}
 
 bool HasSourceExtension(std::string_view name) {
     for (std::string_view extension : {".cpp", ".cc", ".c"})
@@ -57,14 +59,19 @@ bool LineNumberAfter(const std::string &text, size_t end, size_t *first, size_t 
     if (at < text.size() && text[at] == ':') {
         ++at;
     } else {
-        if (at < text.size() && text[at] == ' ') ++at;
-        if (at >= text.size() || text[at] != '(') return false;
+        if (at < text.size() && text[at] == ' ')
+            ++at;
+        if (at >= text.size() || text[at] != '(')
+            return false;
         ++at;
     }
     size_t digits = at;
-    while (digits < text.size() && std::isdigit(static_cast<unsigned char>(text[digits]))) ++digits;
-    if (digits == at) return false;
-    if (text[at - 1] == '(' && (digits >= text.size() || text[digits] != ')')) return false;
+    while (digits < text.size() && std::isdigit(static_cast<unsigned char>(text[digits])))
+        ++digits;
+    if (digits == at)
+        return false;
+    if (text[at - 1] == '(' && (digits >= text.size() || text[digits] != ')'))
+        return false;
     *first = at;
     *last = digits;
     return true;
@@ -73,17 +80,19 @@ bool LineNumberAfter(const std::string &text, size_t end, size_t *first, size_t 
 }  // namespace
 
 bool ParseSyslogDatagram(std::string_view datagram, LogLine *line) {
-    if (datagram.size() < 3 || datagram[0] != '<') return false;
+    if (datagram.size() < 3 || datagram[0] != '<')
+        return false;
     size_t at = 1;
     int pri = 0;
     while (at < datagram.size() && std::isdigit(static_cast<unsigned char>(datagram[at])) && at < 5)
         pri = pri * 10 + (datagram[at++] - '0');
-    if (at == 1 || at >= datagram.size() || datagram[at] != '>') return false;
+    if (at == 1 || at >= datagram.size() || datagram[at] != '>')
+        return false;
     std::string_view rest = datagram.substr(at + 1);
     // "Mmm dd hh:mm:ss " (RFC 3164 timestamp).
     constexpr size_t kStampLength = 16;
-    if (rest.size() < kStampLength || rest[3] != ' ' || rest[6] != ' ' || rest[9] != ':' ||
-        rest[12] != ':' || rest[15] != ' ')
+    if (rest.size() < kStampLength || rest[3] != ' ' || rest[6] != ' ' || rest[9] != ':' || rest[12] != ':' ||
+        rest[15] != ' ')
         return false;
     rest.remove_prefix(kStampLength);
     const size_t colon = rest.find(": ");
@@ -106,7 +115,8 @@ std::string NormaliseSourceLines(const std::string &text) {
             continue;
         }
         size_t end = start;
-        while (end < text.size() && (IsNameChar(text[end]) || text[end] == '.')) ++end;
+        while (end < text.size() && (IsNameChar(text[end]) || text[end] == '.'))
+            ++end;
         const std::string_view name(text.data() + start, end - start);
         size_t first = 0, last = 0;
         if ((start == 0 || HasSourceExtension(name)) && LineNumberAfter(text, end, &first, &last)) {
@@ -122,21 +132,25 @@ std::string NormaliseSourceLines(const std::string &text) {
 
 SyslogCapture::SyslogCapture(const std::string &path) {
     socket_ = UniqueFd(socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
-    if (!socket_) FailErrno("can't create the syslog socket");
+    if (!socket_)
+        FailErrno("can't create the syslog socket");
     sockaddr_un address{};
     address.sun_family = AF_UNIX;
-    if (path.size() >= sizeof address.sun_path) Fail("syslog path too long: %s", path.c_str());
+    if (path.size() >= sizeof address.sun_path)
+        Fail("syslog path too long: %s", path.c_str());
     memcpy(address.sun_path, path.c_str(), path.size() + 1);
     unlink(path.c_str());
     if (bind(socket_.get(), reinterpret_cast<const sockaddr *>(&address), sizeof address) != 0)
         FailErrno("can't bind the syslog socket at %s", path.c_str());
-    if (chmod(path.c_str(), 0666) != 0) FailErrno("can't open %s to every user", path.c_str());
+    if (chmod(path.c_str(), 0666) != 0)
+        FailErrno("can't open %s to every user", path.c_str());
     const int size = kReceiveBuffer;
     if (setsockopt(socket_.get(), SOL_SOCKET, SO_RCVBUFFORCE, &size, sizeof size) != 0 &&
         setsockopt(socket_.get(), SOL_SOCKET, SO_RCVBUF, &size, sizeof size) != 0)
         FailErrno("can't enlarge the syslog socket's buffer");
     wake_ = UniqueFd(eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK));
-    if (!wake_) FailErrno("can't create an eventfd");
+    if (!wake_)
+        FailErrno("can't create an eventfd");
     GuardForksWithGate();
     // Forks must not overlap the thread's own start-up either: wait until it is about to poll.
     std::promise<void> started;
@@ -150,7 +164,8 @@ SyslogCapture::SyslogCapture(const std::string &path) {
 
 SyslogCapture::~SyslogCapture() {
     const uint64_t one = 1;
-    if (write(wake_.get(), &one, sizeof one) != ssize_t(sizeof one)) abort();
+    if (write(wake_.get(), &one, sizeof one) != ssize_t(sizeof one))
+        abort();
     thread_.join();
     const std::lock_guard<std::mutex> lock(mutex_);
     DrainLocked();
@@ -160,10 +175,12 @@ void SyslogCapture::Run() {
     for (;;) {
         pollfd fds[2] = {{socket_.get(), POLLIN, 0}, {wake_.get(), POLLIN, 0}};
         if (poll(fds, 2, -1) < 0) {
-            if (errno == EINTR) continue;
+            if (errno == EINTR)
+                continue;
             FailErrno("can't wait for syslog lines");
         }
-        if (fds[1].revents != 0) return;
+        if (fds[1].revents != 0)
+            return;
         const std::lock_guard<std::mutex> gate(ForkGate());
         const std::lock_guard<std::mutex> lock(mutex_);
         DrainLocked();
@@ -174,8 +191,10 @@ void SyslogCapture::DrainLocked() {
     for (;;) {
         const ssize_t n = recv(socket_.get(), buffer_.data(), buffer_.size(), MSG_TRUNC);
         if (n < 0) {
-            if (errno == EINTR) continue;
-            if (errno == EAGAIN || errno == EWOULDBLOCK) return;
+            if (errno == EINTR)
+                continue;
+            if (errno == EAGAIN || errno == EWOULDBLOCK)
+                return;
             FailErrno("can't read the syslog socket");
         }
         const std::string_view datagram(buffer_.data(), std::min(size_t(n), buffer_.size()));
@@ -207,7 +226,8 @@ void SyslogCapture::Clear() {
 void SyslogCapture::SetSink(std::function<void(const LogLine &)> sink) {
     const std::lock_guard<std::mutex> lock(mutex_);
     DrainLocked();
-    for (const auto &line : lines_) sink(line);
+    for (const auto &line : lines_)
+        sink(line);
     lines_.clear();
     sink_ = std::move(sink);
 }
