@@ -9,6 +9,8 @@
 
 #include <atomic>
 
+#include "common/path_names.h"
+
 namespace norvo {
 namespace {
 
@@ -128,22 +130,6 @@ bool TopOf(const std::string &userPath, const std::string &realPath, std::string
     }
     *top = realPath.substr(0, realPath.size() - restSize);
     return true;
-}
-
-bool HasDotComponent(const std::string &path) {
-    size_t start = 0;
-    while (start <= path.size()) {
-        size_t end = path.find('/', start);
-        if (end == std::string::npos) {
-            end = path.size();
-        }
-        const size_t length = end - start;
-        if ((length == 1 || length == 2) && path.compare(start, length, std::string(length, '.')) == 0) {
-            return true;
-        }
-        start = end + 1;
-    }
-    return false;
 }
 
 OwnedFd OpenBeneath(const std::string &top, const std::string &realPath, int flags) {

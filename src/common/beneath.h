@@ -42,9 +42,6 @@ bool PathBelow(const std::string &top, const std::string &realPath, std::string 
 // realPath does not end with that rest, or userPath is not "/" followed by a name.
 bool TopOf(const std::string &userPath, const std::string &realPath, std::string *top);
 
-// Whether a path holds a "." or ".." component (empty components are not counted).
-bool HasDotComponent(const std::string &path);
-
 // Opens realPath, which lies at or below top, with flags (O_CLOEXEC is added).
 // top itself is opened as configured (it may be a link an administrator made); below it no
 // component may be a symbolic link, ".", or "..". Returns the descriptor, or an empty one with

@@ -42,6 +42,22 @@ inline bool IsWellFormedUserPath(const char *path) {
     }
 }
 
+// Whether a path holds a "." or ".." component (empty components are not counted).
+inline bool HasDotComponent(const std::string &path) {
+    for (size_t start = 0; start <= path.size();) {
+        size_t end = path.find('/', start);
+        if (end == std::string::npos) {
+            end = path.size();
+        }
+        const size_t length = end - start;
+        if ((length == 1 || length == 2) && path[start] == '.' && path[end - 1] == '.') {
+            return true;
+        }
+        start = end + 1;
+    }
+    return false;
+}
+
 // "home", "/home" or a path below "/home/": the caller's own home, asked without a user.
 inline bool IsOwnHomeName(const char *name) {
     return strcmp(name, "home") == 0 || strcmp(name, "/home") == 0 || strncmp(name, "/home/", 6) == 0;

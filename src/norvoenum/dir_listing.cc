@@ -17,6 +17,7 @@
 #include "common/log.h"
 #include "common/modules.h"
 #include "common/owners.h"
+#include "common/path_names.h"
 #include "common/remote_mount.h"
 #include "common/text.h"
 #include "norvo/errors.h"

@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "accounts.h"
+#include "common/path_names.h"
 #include "exit_status.h"
 #include "handlers.h"
 #include "identity.h"
@@ -197,22 +198,6 @@ void PrintTable(std::ostream &out, const std::list<DIRENTRY_INFO> &files, int in
     }
 }
 
-bool HasDotComponent(const std::string &path) {
-    size_t start = 0;
-    while (start <= path.size()) {
-        size_t end = path.find('/', start);
-        if (end == std::string::npos) {
-            end = path.size();
-        }
-        const size_t length = end - start;
-        if ((length == 1 || length == 2) && path.compare(start, length, std::string(length, '.')) == 0) {
-            return true;
-        }
-        start = end + 1;
-    }
-    return false;
-}
-
 std::string PageText(unsigned long total, unsigned long offset, size_t shown) {
     std::string text = "total " + std::to_string(total);
     if (shown == 0) {
@@ -234,8 +219,7 @@ int RunLs(const Invocation &inv) {
     }
     const bool shares = path == "/";
     if (HasDotComponent(path)) {
-        // The resolution would take /share/../other as a path of share; its check would be
-        // the wrong share's.
+        // The library refuses it too; the command says why in words.
         return ReportUsageError(inv.command, "PATH may not hold . or .. components: " + path);
     }
 
