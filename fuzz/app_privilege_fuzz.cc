@@ -12,11 +12,14 @@
 #include <vector>
 
 #include "app_privilege.h"
+#include "damage.h"
 #include "name_list.h"
 #include "settings_format.h"
 
 namespace {
 
+using norvo::fuzz::DamageByte;
+using norvo::fuzz::Input;
 using norvo::platform::ListMatcher;
 using norvo::platform::ParseSettings;
 using norvo::platform::PrivilegeVerdict;
@@ -26,36 +29,6 @@ const char *const kUsers[] = {"root", "alice", "carol"};
 const char *const kHolders[] = {"root",  "alice",  "carol",  "@root",
                                 "!root", "!carol", "!@root", "\"@CORP\\domain users\""};
 const char *const kPrivileges[] = {"P.One", "P.Two"};
-
-class Input {
-public:
-    Input(const uint8_t *data, size_t size) : data_(data), size_(size) {}
-    uint8_t Byte() { return pos_ < size_ ? data_[pos_++] : 0; }
-    bool Empty() const { return pos_ >= size_; }
-
-private:
-    const uint8_t *data_;
-    size_t size_;
-    size_t pos_ = 0;
-};
-
-// A byte that damages: a control character (tab and line breaks aside), DEL, a double quote
-// (the quote of holder lists), or a lone byte above 0x7F. A single quote is not: inside a
-// holder it is an ordinary character.
-char DamageByte(uint8_t pick) {
-    static const std::string alphabet = [] {
-        std::string bytes;
-        for (int c = 0; c < 0x20; ++c) {
-            if (c != '\t' && c != '\n' && c != '\r')
-                bytes += static_cast<char>(c);
-        }
-        bytes += "\x7f\"";
-        for (int c = 0x80; c <= 0xFF; c += 9)
-            bytes += static_cast<char>(c);
-        return bytes;
-    }();
-    return alphabet[pick % alphabet.size()];
-}
 
 // The quoted form the writers produce, escaping quotes and backslashes.
 std::string Quoted(const std::string &holders) {

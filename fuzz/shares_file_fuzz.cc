@@ -13,6 +13,7 @@
 #include <string_view>
 #include <vector>
 
+#include "damage.h"
 #include "name_list.h"
 #include "quib_share.h"
 #include "share_config.h"
@@ -20,6 +21,8 @@
 
 namespace {
 
+using norvo::fuzz::DamageByte;
+using norvo::fuzz::Input;
 using norvo::platform::ListMatcher;
 using norvo::platform::ShareEntry;
 
@@ -27,35 +30,6 @@ using norvo::platform::ShareEntry;
 const char *const kUsers[] = {"root", "alice", "carol"};
 const char *const kEntries[] = {"root", "alice", "carol", "@root", "\"@CORP\\domain users\"", "@nogroup-x"};
 const char *const kListKeys[] = {"invalid users", "write list", "read list"};
-
-class Input {
-public:
-    Input(const uint8_t *data, size_t size) : data_(data), size_(size) {}
-    uint8_t Byte() { return pos_ < size_ ? data_[pos_++] : 0; }
-    bool Empty() const { return pos_ >= size_; }
-
-private:
-    const uint8_t *data_;
-    size_t size_;
-    size_t pos_ = 0;
-};
-
-// A byte that damages: a control character (tab and line breaks aside: a tab is a separator
-// and a line break ends the value), DEL, a double quote, or a lone byte above 0x7F.
-char DamageByte(uint8_t pick) {
-    static const std::string alphabet = [] {
-        std::string bytes;
-        for (int c = 0; c < 0x20; ++c) {
-            if (c != '\t' && c != '\n' && c != '\r')
-                bytes += static_cast<char>(c);
-        }
-        bytes += "\x7f\"";
-        for (int c = 0x80; c <= 0xFF; c += 9)
-            bytes += static_cast<char>(c);
-        return bytes;
-    }();
-    return alphabet[pick % alphabet.size()];
-}
 
 struct Text {
     std::string text;
