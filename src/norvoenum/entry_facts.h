@@ -36,6 +36,9 @@ enum class EntryVerdict {
 EntryVerdict ReadEntryFacts(NorvoMountStatus &mounts, const char *realPath, _tag_dir_entry_type_ type,
                             unsigned char dtype, int info, EntryFacts *facts);
 
+// Copies the facts info asks for (size, owner with its names, times, permissions) into entry.
+void CopyFacts(const EntryFacts &facts, int info, NorvoUserEnum &names, DIRENTRY_INFO *entry);
+
 // The extension of name in lower case, "" without one (the "type" of a file).
 void LowerExtension(const char *name, std::string *type);
 

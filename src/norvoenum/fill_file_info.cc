@@ -79,6 +79,29 @@ const char *MountPointType(int fsType) {
 
 namespace norvo {
 
+void CopyFacts(const EntryFacts &facts, int info, NorvoUserEnum &names, DIRENTRY_INFO *entry) {
+    if (info & NVO_INFO_SIZE) {
+        entry->size = facts.size;
+    }
+    if (info & NVO_INFO_OWNER) {
+        entry->uid = facts.uid;
+        entry->gid = facts.gid;
+        entry->user = names.GetUserNameByUID(facts.uid);
+        entry->group = names.GetGroupNameByGID(facts.gid);
+    }
+    if (info & NVO_INFO_TIME) {
+        entry->mtime = facts.mtime;
+        entry->ctime = facts.ctime;
+        entry->crtime = facts.crtime;
+        entry->atime = facts.atime;
+    }
+    if (info & NVO_INFO_PERM) {
+        entry->mode = facts.mode;
+        entry->acl_privilege = facts.aclPrivilege;
+        entry->is_acl_mode = facts.isAclMode;
+    }
+}
+
 void LowerExtension(const char *name, std::string *type) {
     const char *ext = ReturnFileExt(name, 0);
     if (ext == nullptr) {
@@ -166,26 +189,7 @@ int NvoEnum::FillFileInfo(const char *userPath, const char *realPath, const char
         if ((info & NVO_INFO_TYPE) && !entry.isdir) {
             norvo::LowerExtension(name, &entry.type);
         }
-        if (info & NVO_INFO_SIZE) {
-            entry.size = facts.size;
-        }
-        if (info & NVO_INFO_OWNER) {
-            entry.uid = facts.uid;
-            entry.gid = facts.gid;
-            entry.user = userEnum_.GetUserNameByUID(facts.uid);
-            entry.group = userEnum_.GetGroupNameByGID(facts.gid);
-        }
-        if (info & NVO_INFO_TIME) {
-            entry.mtime = facts.mtime;
-            entry.ctime = facts.ctime;
-            entry.crtime = facts.crtime;
-            entry.atime = facts.atime;
-        }
-        if (info & NVO_INFO_PERM) {
-            entry.mode = facts.mode;
-            entry.acl_privilege = facts.aclPrivilege;
-            entry.is_acl_mode = facts.isAclMode;
-        }
+        norvo::CopyFacts(facts, info, userEnum_, &entry);
         return 0;
     } catch (...) {
         // Only memory can run out here.

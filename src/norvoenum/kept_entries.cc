@@ -83,26 +83,7 @@ void KeptEntries::Build(size_t i, const std::string &userDir, const std::string 
     if ((info_ & NVO_INFO_MOUNT_POINT_TYPE) != 0 || strcmp(facts.mountPointType, "remotefail") == 0) {
         entry.mount_point_type = facts.mountPointType;
     }
-    if (info_ & NVO_INFO_SIZE) {
-        entry.size = facts.size;
-    }
-    if (info_ & NVO_INFO_OWNER) {
-        entry.uid = facts.uid;
-        entry.gid = facts.gid;
-        entry.user = names.GetUserNameByUID(facts.uid);
-        entry.group = names.GetGroupNameByGID(facts.gid);
-    }
-    if (info_ & NVO_INFO_TIME) {
-        entry.mtime = facts.mtime;
-        entry.ctime = facts.ctime;
-        entry.crtime = facts.crtime;
-        entry.atime = facts.atime;
-    }
-    if (info_ & NVO_INFO_PERM) {
-        entry.mode = facts.mode;
-        entry.acl_privilege = facts.aclPrivilege;
-        entry.is_acl_mode = facts.isAclMode;
-    }
+    CopyFacts(facts, info_, names, &entry);
 }
 
 }  // namespace norvo
