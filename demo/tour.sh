@@ -96,4 +96,20 @@ show "Without a valid sid the domain is not asked: the library refuses" \
     privilege --user 'CORP\dave' --sid not-a-sid /projects
 show "Every command answers in JSON too, for scripts" \
     --json resolve --user alice /photo/2024/beach.jpg
+
+# carol, who may not see public2, tries the ways out of the share she may see.
+show "A user path is one / and a share's name: public/2 does not reach public2 (bad parameter)" \
+    ls --user carol public/2
+show "Nor does .. lead from public into photo" \
+    resolve --user carol /public/../photo
+ln -s /volume1/photo /volume1/public/to-photo
+chown -h "$(id -u carol)" /volume1/public/to-photo
+show "carol made a link in public to photo's folder; the library does not follow it" \
+    ls --user carol /public/to-photo
+newline=$(printf '\nx')
+newline=${newline%x}
+mkdir -p /volume1/public/names
+touch "/volume1/public/names/a${newline}b" '/volume1/public/names/a\x0Ab'
+show "A name with a real line break prints escaped, apart from the four characters \\x0A" \
+    ls --user alice /public/names
 printf '\nEnd of the tour.\n'
