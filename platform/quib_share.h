@@ -52,6 +52,14 @@ QUIB_API PQUIBSHARE_DB QUIBShareDBOpen(void);
 QUIB_API int QUIBShareDBCursorGet(PQUIBSHARE_DB db, PQUIBSHARE *pshare);
 QUIB_API void QUIBShareDBClose(PQUIBSHARE_DB db);
 
+// 1 when realPath is a share's recycle bin: the folder "#recycle" directly in a share's folder,
+// or, when there is a "homes" share, directly in a home folder (a folder directly under the home
+// service's homes root). The path is compared lexically after normalisation (a trailing "/" is
+// fine; nothing is examined on disk); a path inside a bin, a "#recycle" deeper in a share, and a
+// relative path are 0. -1 with 0x0D00 for a null or empty path, 0xC300 for one of 4096 bytes or
+// more, 0x0900 when the shares file (or, for a home folder, the settings) can't be read.
+QUIB_API int QUIBShareIsShareRecycle(const char *realPath);
+
 // 1 when user is named in list (entries separated by commas or white space, double quotes around
 // an entry that holds them; names compare ignoring ASCII case; "@group" entries match members of
 // that group, primary or supplementary, through NSS), 0 when not (also for an unknown user or

@@ -13,4 +13,11 @@ public:
     // including a missing path; false with the error slot set for a null-containing, empty or
     // over-long path (0x0D00, 0xC300).
     static bool IsMountPoint(const std::string &path);
+    // The file-system type name ("ext4", "fuse.sshfs"...) of the mount whose directory is path,
+    // from the mount table alone, compared lexically: the mount itself is never touched, so a
+    // network mount whose server is gone still answers. Of mounts stacked on one directory the
+    // topmost. "" when the table lists no mount there (a link to one included: links are not
+    // followed), and "" with the error slot set for a bad path (as IsMountPoint) or a table or
+    // working directory that can't be read.
+    static std::string getMountType(const std::string &path);
 };

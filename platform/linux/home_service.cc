@@ -11,6 +11,7 @@
 #include <vector>
 
 #include "api_guard.h"
+#include "home_service.h"
 #include "locked_file.h"
 #include "quib_paths.h"
 #include "quib_user.h"
@@ -95,6 +96,16 @@ Home HomeOf(const QUIBUSER &user, std::string *home) {
 }
 
 }  // namespace
+
+bool HomesRoot(std::string *root) {
+    HomeSettings settings;
+    if (!LoadHomeSettings(&settings)) {
+        return false;
+    }
+    *root = settings.root;
+    return true;
+}
+
 }  // namespace norvo::platform
 
 namespace np = norvo::platform;

@@ -1,4 +1,5 @@
-// QUIBShareGet, the share cursor and BlSDKUserIsInList, backed by QUIB_SHARE_CONF.
+// QUIBShareGet, the share cursor, BlSDKUserIsInList and the recycle-bin test, backed by
+// QUIB_SHARE_CONF.
 #include <stdlib.h>
 #include <string.h>
 
@@ -7,6 +8,8 @@
 #include <vector>
 
 #include "api_guard.h"
+#include "fs_path.h"
+#include "home_service.h"
 #include "name_list.h"
 #include "quib_share.h"
 #include "share_config.h"
@@ -77,6 +80,36 @@ const ShareEntry *FindByPath(const ShareTable &table, std::string_view path) {
     std::string_view first = std::string_view(normal).substr(1);
     first = first.substr(0, first.find('/'));
     return first.empty() ? nullptr : table.Find(first);
+}
+
+// 1 when normal (normalised, absolute) is "#recycle" directly in a share's folder, or in a
+// home folder (a folder directly under the homes root, the "home" share of its user) when
+// there is a "homes" share; 0 when not; -1 with the slot set when a file can't be read.
+int IsRecycleBin(std::string_view normal) {
+    constexpr std::string_view kBin = "/#recycle";
+    if (normal.size() <= kBin.size() || normal.substr(normal.size() - kBin.size()) != kBin) {
+        return 0;
+    }
+    const std::string_view folder = normal.substr(0, normal.size() - kBin.size());
+    std::shared_ptr<const ShareTable> table;
+    if (!LoadShares(&table)) {
+        return -1;
+    }
+    for (const ShareEntry &share : table->shares) {
+        if (share.path == folder) {
+            return 1;
+        }
+    }
+    // Only then the settings: most bins are a share's own.
+    const size_t slash = folder.rfind('/');
+    if (table->Find("homes") == nullptr || slash == 0) {
+        return 0;
+    }
+    std::string root;
+    if (!HomesRoot(&root)) {
+        return -1;
+    }
+    return !root.empty() && folder.substr(0, slash) == root ? 1 : 0;
 }
 
 }  // namespace
@@ -164,6 +197,14 @@ int QUIBShareDBCursorGet(PQUIBSHARE_DB db, PQUIBSHARE *pshare) {
 
 void QUIBShareDBClose(PQUIBSHARE_DB db) {
     delete db;
+}
+
+int QUIBShareIsShareRecycle(const char *realPath) {
+    if (const int err = np::CheckPathArgument(realPath)) {
+        return NORVO_FAIL_ERRNO(err);
+    }
+    // Lexical: a real path holds no link, and a share's folder is configured by its real path.
+    return np::Guarded(-1, [&] { return np::IsRecycleBin(np::NormalizePath(realPath)); });
 }
 
 int BlSDKUserIsInList(const char *user, const char *list) {

@@ -30,8 +30,10 @@ bool DiffersFromParent(const std::string &path, const struct statx &self) {
            up.stx_ino == self.stx_ino;
 }
 
-// Whether the mount table lists path itself as a mount directory.
-bool ListedAsMount(const std::string &path) {
+// The last (topmost) entry of the mount table whose directory is path itself, compared
+// lexically, into *type; false when there is none, or with the slot set when the table or the
+// working directory can't be read.
+bool ListedAsMount(const std::string &path, std::string *type) {
     const std::string absolute = AbsolutePath(path.c_str());
     std::vector<MountEntry> entries;
     if (absolute.empty()) {
@@ -42,12 +44,22 @@ bool ListedAsMount(const std::string &path) {
         QUIB_SET_ERRNO(err);
         return false;
     }
-    for (const MountEntry &entry : entries) {
-        if (entry.dir == absolute) {
+    for (auto entry = entries.rbegin(); entry != entries.rend(); ++entry) {
+        if (entry->dir == absolute) {
+            *type = entry->type;
             return true;
         }
     }
     return false;
+}
+
+// 0 when path may be handed on; else the errno, with the slot set.
+int CheckPathString(const std::string &path) {
+    const int err = path.find('\0') != std::string::npos ? EINVAL : CheckPathArgument(path.c_str());
+    if (err != 0) {
+        NORVO_FAIL_ERRNO(err);
+    }
+    return err;
 }
 
 }  // namespace
@@ -56,12 +68,7 @@ bool ListedAsMount(const std::string &path) {
 using namespace norvo::platform;
 
 bool WebUtils::IsMountPoint(const std::string &path) {
-    if (path.find('\0') != std::string::npos) {
-        NORVO_FAIL_ERRNO(EINVAL);
-        return false;
-    }
-    if (const int err = CheckPathArgument(path.c_str())) {
-        NORVO_FAIL_ERRNO(err);
+    if (CheckPathString(path) != 0) {
         return false;
     }
     return Guarded(false, [&] {
@@ -75,6 +82,17 @@ bool WebUtils::IsMountPoint(const std::string &path) {
         if (errno == ENOENT || errno == ENOTDIR) {
             return false;  // nothing there, so nothing mounted there
         }
-        return ListedAsMount(path);
+        std::string type;
+        return ListedAsMount(path, &type);
+    });
+}
+
+std::string WebUtils::getMountType(const std::string &path) {
+    if (CheckPathString(path) != 0) {
+        return std::string();
+    }
+    return Guarded(std::string(), [&] {
+        std::string type;
+        return ListedAsMount(path, &type) ? type : std::string();
     });
 }

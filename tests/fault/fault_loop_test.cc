@@ -26,7 +26,9 @@
 #include "quib_fs.h"
 #include "quib_login.h"
 #include "quib_paths.h"
+#include "quib_share.h"
 #include "quib_user.h"
+#include "quib_webutils.h"
 #include "vlibc_err.h"
 #include "vlibc_file.h"
 
@@ -311,6 +313,19 @@ const Op kOps[] = {
          NorvoMountStatus mounts;
          const bool ok = mounts.GetMountStatus() == 1;
          return Expect(ok, mounts.getFSTYPE("/volume1") == FSTYPE_TMPFS);
+     },
+     kPlatformSlot},
+    {"MountType",
+     [] {
+         const std::string type = WebUtils::getMountType("/volume1");
+         return Expect(!type.empty(), type == "tmpfs");
+     },
+     kPlatformSlot},
+    {"RecycleBin",
+     [] {
+         const int bin = QUIBShareIsShareRecycle("/volume1/photo/#recycle");
+         const int deeper = QUIBShareIsShareRecycle("/volume1/photo/a/#recycle");
+         return Expect(bin >= 0 && deeper >= 0, bin == 1 && deeper == 0);
      },
      kPlatformSlot},
 };

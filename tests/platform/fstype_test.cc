@@ -118,22 +118,32 @@ TEST(MountTable, EachPathIsHeldByItsDeepestDataMount) {
 TEST(MountPoint, KernelMarkOrMountTable) {
     Appliance app;
     app.MakeDir("/volume1/dir/sub").MakeDir("/volume1/bound").MakeDir("/volume1/web/cgi");
-    app.MountDeadRemote("/volume1/dead");
+    app.MountDeadRemote("/volume1/dead").AddVolume("/volume2/stack").MountFat("/volume2/stack");
     ASSERT_EQ(mount("/volume1/dir", "/volume1/bound", nullptr, MS_BIND, nullptr), 0);  // same device
     ASSERT_EQ(symlink("/volume1/bound", "/volume1/link"), 0);
     ASSERT_EQ(chdir("/volume1/web/cgi"), 0);
+    const std::string fat = "fuse.fusefat", dead = "fuse.norvo-deadremote";
+    // The type comes from the table alone ("*": the host's root, any type): the lost share answers it, a link names no mount.
     struct Case {
         std::string path;
         bool mountPoint;
+        std::string type;
+        int slot = 0;
     } cases[] = {
-        {"/", true}, {"/volume1", true}, {"/volume1/", true}, {"/volume1/dir", false}, {"/volume1/dir/sub", false},
-        {"/volume1/bound", true}, {"/volume1/link", false},  // a link is never one
-        {"/volume1/dead", true}, {"/volume1/dead/x", false}, {"/volume1/dir/../dead", true},
-        {"../..", true}, {"..", false}, {"/volume1/missing", false},
-        {"", false}, {std::string("/volume1\0/x", 11), false}, {"/" + std::string(4096, 'a'), false},
+        {"/", true, "*"}, {"/volume1", true, "tmpfs"}, {"/volume1/", true, "tmpfs"}, {"/volume1/dir", false, ""},
+        {"/volume1/dir/sub", false, ""}, {"/volume1/bound", true, "tmpfs"}, {"/volume1/link", false, ""},
+        {"/volume1/dead", true, dead}, {"/volume1/dead/x", false, ""}, {"/volume1/dir/../dead", true, dead},
+        {"/volume2/stack", true, fat},  // a FAT mount over a tmpfs one: the topmost
+        {"/volume2/stack/", true, fat}, {"../..", true, "tmpfs"}, {"..", false, ""}, {"/volume1/missing", false, ""},
+        {"", false, "", QUIB_ERR_BAD_PARAMETER}, {std::string("/volume1\0/x", 11), false, "", QUIB_ERR_BAD_PARAMETER},
+        {"/" + std::string(4096, 'a'), false, "", QUIB_ERR_NAME_TOO_LONG},
     };
     for (const Case &c : cases) {
         EXPECT_EQ(WebUtils::IsMountPoint(c.path), c.mountPoint) << c.path.substr(0, 40);
+        VLIBCErrSetEx(QUIB_ERR_NONE, "", 0);
+        const std::string type = WebUtils::getMountType(c.path);
+        EXPECT_EQ(c.type == "*" && !type.empty() ? "*" : type, c.type) << c.path.substr(0, 40);
+        EXPECT_EQ(VLIBCErrGet(), c.slot) << c.path.substr(0, 40);
     }
 }
 

@@ -9,6 +9,7 @@
 #include <gtest/gtest.h>
 
 #include "appliance.h"
+#include "platform_test_util.h"
 #include "quib_paths.h"
 #include "quib_share.h"
 #include "vlibc_err.h"
@@ -183,6 +184,45 @@ TEST_F(ShareConfig, PathsFindTheShareHoldingThem) {
         EXPECT_EQ(found.substr(0, found.find(' ')), row.share ? row.share : "error") << row.path;
         EXPECT_EQ(found, row.share ? found : "error 0x1400") << row.path;
     }
+}
+
+// The bin is "#recycle" directly in a share's folder (or a home folder, given a "homes" share),
+// by the real path's text alone: never a deeper "#recycle", nor anything inside a bin.
+TEST_F(ShareConfig, RecycleBinsAreTheTopFoldersNamedSo) {
+    using norvo::testing::Failed;
+    using norvo::testing::Outcome;
+    const std::string shares = "[photo]\npath = /volume1/photo\n[media]\npath = /volume2/media\n"
+                               "[docs]\npath = /volume1/documents\n[inner]\npath = /volume1/photo/inner\n";
+    Conf(shares + "[homes]\npath = /volume1/homes\n");
+    app_.SetHomeService(true, "/volume1/homes");
+    const std::string overlong = "/" + std::string(4096, 'a');
+    const Outcome yes{1}, no{0};
+    struct Row { const char *path; Outcome want; } rows[] = {
+        {"/volume1/photo/#recycle", yes},     {"/volume1/photo/#recycle/", yes},     {"/volume2/media/#recycle", yes},
+        {"/volume1/documents/#recycle", yes}, {"/volume1//photo/./#recycle", yes},   {"/volume1/photo/a/../#recycle", yes},
+        {"/volume1/photo/inner/#recycle", yes}, {"/volume1/homes/#recycle", yes},  {"/volume1/homes/alice/#recycle", yes},
+        {"/volume1/docs/#recycle", no},  // the folder is not named after its share
+        {"/volume1/media/#recycle", no},      {"/volume1/photo/a/#recycle", no},     {"/volume1/photo/#recycle/a", no},
+        {"/volume1/photo/#Recycle", no},      {"/volume1/photo/#recycle2", no},      {"/volume1/photo", no},
+        {"/volume1/photos/#recycle", no},     {"/volume1/homes/alice/a/#recycle", no}, {"/#recycle", no},
+        {"/volume1/link/#recycle", no},  // links are not followed: a real path has none
+        {"photo/#recycle", no},               {"#recycle", no},
+        {"", Failed(QUIB_ERR_BAD_PARAMETER)}, {overlong.c_str(), Failed(QUIB_ERR_NAME_TOO_LONG)},
+    };
+    ASSERT_EQ(symlink("/volume1/photo", "/volume1/link"), 0);
+    for (const Row &row : rows) {
+        EXPECT_EQ(OUTCOME(QUIBShareIsShareRecycle(row.path)), row.want) << row.path;
+    }
+    EXPECT_EQ(OUTCOME(QUIBShareIsShareRecycle(nullptr)), Failed(QUIB_ERR_BAD_PARAMETER));
+    // The settings are read only for a home folder's bin; without a "homes" share there is none.
+    ASSERT_EQ(unlink(QUIB_INFO_CONF), 0);
+    app_.MakeDir(QUIB_INFO_CONF);
+    EXPECT_EQ(OUTCOME(QUIBShareIsShareRecycle("/volume1/homes/alice/#recycle")), Failed(QUIB_ERR_OPEN_FAILED));
+    EXPECT_EQ(OUTCOME(QUIBShareIsShareRecycle("/volume1/photo/#recycle")), yes);
+    Conf(shares);
+    EXPECT_EQ(OUTCOME(QUIBShareIsShareRecycle("/volume1/homes/alice/#recycle")), no);
+    ASSERT_EQ(unlink(QUIB_SHARE_CONF), 0);
+    EXPECT_EQ(OUTCOME(QUIBShareIsShareRecycle("/volume1/photo/#recycle")), Failed(QUIB_ERR_OPEN_FAILED));
 }
 
 // Only a missing name is a bad argument; a name no share can carry names no share, and a

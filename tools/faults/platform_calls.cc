@@ -16,6 +16,7 @@
 #include "quib_stat.h"
 #include "quib_user.h"
 #include "quib_webapi.h"
+#include "quib_webutils.h"
 #include "vlibc_file.h"
 #include "vlibc_support.h"
 #include "vlibc_szlist.h"
@@ -56,6 +57,7 @@ SEAM_PLATFORM(int, QUIBLoginRemove, -1, (const char *sid), (sid))
 SEAM_PLATFORM(int, QUIBS2SIsSyncedShare, -1, (const char *name), (name))
 SEAM_PLATFORM(int, QUIBGetFSType, -1, (const char *path, int flags), (path, flags))
 SEAM_PLATFORM(int, QUIBFSIsInMountTable, -1, (const char *path), (path))
+SEAM_PLATFORM(int, QUIBShareIsShareRecycle, -1, (const char *realPath), (realPath))
 SEAM_PLATFORM(int, QUIBACLPermGet, -1, (const char *path, unsigned int *mask), (path, mask))
 SEAM_PLATFORM(int, QUIBACLIsSupport, -1, (const char *path, int fd, int flags), (path, fd, flags))
 SEAM_PLATFORM(int, VLIBCFileLStat, -1, (const char *path, int flags, PQUIBSTAT st), (path, flags, st))
@@ -185,6 +187,12 @@ int QUIB::WebAPIUtil::ParseToArray(const char *value, Json::Value &array) {
     static const auto real = reinterpret_cast<int (*)(const char *, Json::Value &)>(
         seam::Next("_ZN4QUIB10WebAPIUtil12ParseToArrayEPKcRN4Json5ValueE"));
     return ShouldFailPlatform("QUIB::WebAPIUtil::ParseToArray") ? -1 : real(value, array);
+}
+
+std::string WebUtils::getMountType(const std::string &path) {
+    static const auto real = reinterpret_cast<std::string (*)(const std::string &)>(
+        seam::Next("_ZN8WebUtils12getMountTypeERKNSt7__cxx1112basic_stringIcSt11char_traitsIcESaIcEEE"));
+    return ShouldFailPlatform("WebUtils::getMountType") ? std::string() : real(path);
 }
 
 SDK::Share *SDK::Share::LoadShare(const char *name) {
