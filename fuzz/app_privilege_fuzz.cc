@@ -18,7 +18,7 @@
 
 namespace {
 
-using norvo::fuzz::DamageByte;
+using norvo::fuzz::DamageValues;
 using norvo::fuzz::Input;
 using norvo::platform::ListMatcher;
 using norvo::platform::ParseSettings;
@@ -75,30 +75,6 @@ Text IntactFile(Input *in) {
     return out;
 }
 
-// At most one damaged byte per value: two quotes, or two high bytes, could be an edit.
-std::string Damage(const Text &intact, Input *in) {
-    std::map<size_t, std::pair<size_t, std::string>> edits;  // by start, applied back to front
-    while (!in->Empty() && !intact.values.empty()) {
-        const auto &[start, length] = intact.values[in->Byte() % intact.values.size()];
-        const size_t at = in->Byte() % (length + 1);
-        const uint8_t how = in->Byte();
-        if (edits.count(start) != 0)
-            continue;
-        std::string value = intact.text.substr(start, length);
-        if ((how & 1) != 0 && at < length) {
-            value[at] = DamageByte(how >> 1);
-        } else {
-            value.insert(at, 1, DamageByte(how >> 1));
-        }
-        edits[start] = {length, value};
-    }
-    std::string text = intact.text;
-    for (auto it = edits.rbegin(); it != edits.rend(); ++it) {
-        text.replace(it->first, it->second.first, it->second.second);
-    }
-    return text;
-}
-
 int Verdict(const std::string &text, const char *privilege, const char *user) {
     ListMatcher matcher(user);
     return PrivilegeVerdict(ParseSettings(text), privilege, &matcher);
@@ -115,7 +91,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
 
     Input in(data, size);
     const Text intact = IntactFile(&in);
-    const std::string damaged = Damage(intact, &in);
+    const std::string damaged = DamageValues(intact.text, intact.values, &in);
     for (const char *privilege : kPrivileges) {
         for (const char *user : kUsers) {
             if (Verdict(damaged, privilege, user) == 1 && Verdict(intact.text, privilege, user) != 1)

@@ -4,7 +4,10 @@
 #include <stddef.h>
 #include <stdint.h>
 
+#include <map>
 #include <string>
+#include <utility>
+#include <vector>
 
 namespace norvo::fuzz {
 
@@ -38,6 +41,33 @@ inline char DamageByte(uint8_t pick) {
         return bytes;
     }();
     return alphabet[pick % alphabet.size()];
+}
+
+// text with some of its values damaged, at most one byte each (two quotes, or two high bytes,
+// could be an edit). values: where each value lies in text, as (start, length).
+inline std::string DamageValues(const std::string &text, const std::vector<std::pair<size_t, size_t>> &values,
+                                Input *in) {
+    std::map<size_t, std::pair<size_t, std::string>> edits;  // by start, applied back to front
+    while (!in->Empty() && !values.empty()) {
+        const auto &[start, length] = values[in->Byte() % values.size()];
+        const size_t at = in->Byte() % (length + 1);
+        const uint8_t how = in->Byte();
+        if (edits.count(start) != 0) {
+            continue;
+        }
+        std::string value = text.substr(start, length);
+        if ((how & 1) != 0 && at < length) {
+            value[at] = DamageByte(how >> 1);
+        } else {
+            value.insert(at, 1, DamageByte(how >> 1));
+        }
+        edits[start] = {length, value};
+    }
+    std::string damaged = text;
+    for (auto it = edits.rbegin(); it != edits.rend(); ++it) {
+        damaged.replace(it->first, it->second.first, it->second.second);
+    }
+    return damaged;
 }
 
 }  // namespace norvo::fuzz

@@ -21,7 +21,7 @@
 
 namespace {
 
-using norvo::fuzz::DamageByte;
+using norvo::fuzz::DamageValues;
 using norvo::fuzz::Input;
 using norvo::platform::ListMatcher;
 using norvo::platform::ShareEntry;
@@ -67,33 +67,6 @@ Text IntactConfiguration(Input *in) {
             out.Line("comment", "the \"best\" share");
     }
     return out;
-}
-
-// At most one damaged byte per value: two quotes, or two high bytes, could be an edit.
-std::string Damage(const Text &intact, Input *in) {
-    std::map<size_t, size_t> damaged;  // value index by start, so edits apply back to front
-    std::map<size_t, std::string> values;
-    while (!in->Empty()) {
-        const size_t index = in->Byte() % intact.values.size();
-        const auto &[start, length] = intact.values[index];
-        const size_t at = in->Byte() % (length + 1);
-        const uint8_t how = in->Byte();
-        if (values.count(start) != 0)
-            continue;
-        std::string value = intact.text.substr(start, length);
-        if ((how & 1) != 0 && at < length) {
-            value[at] = DamageByte(how >> 1);
-        } else {
-            value.insert(at, 1, DamageByte(how >> 1));
-        }
-        values[start] = value;
-        damaged[start] = length;
-    }
-    std::string text = intact.text;
-    for (auto it = damaged.rbegin(); it != damaged.rend(); ++it) {
-        text.replace(it->first, it->second, values[it->first]);
-    }
-    return text;
 }
 
 // 0 no access, 1 read-only, 2 read-write, as SDK::Share answers; a list that can't be
@@ -149,7 +122,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     Input in(data, size);
     const Text intact = IntactConfiguration(&in);
     const std::vector<ShareEntry> before = norvo::platform::ParseShareConfig(intact.text);
-    const std::vector<ShareEntry> after = norvo::platform::ParseShareConfig(Damage(intact, &in));
+    const std::vector<ShareEntry> after =
+        norvo::platform::ParseShareConfig(DamageValues(intact.text, intact.values, &in));
     CheckSound(after);
     for (const ShareEntry &share : after) {
         const ShareEntry *was = Named(before, share.name);
