@@ -43,4 +43,9 @@ QUIB_BEGIN_C
 // kernel's errno (ENOENT 0x0600, ENOTDIR 0x0700, EACCES 0x0300, EIO 0x8100, ...).
 QUIB_API int VLIBCFileLStat(const char *path, int flags, PQUIBSTAT st);
 
+// The same for name looked up in the directory open at dirFd, however long the directory's own
+// path: what a walk asks about each entry of the directory it holds open. EINVAL (0x0D00) for a
+// null or empty name, EBADF (0x8100) for a descriptor that is not open.
+QUIB_API int VLIBCFileLStatAt(int dirFd, const char *name, int flags, PQUIBSTAT st);
+
 QUIB_END_C

@@ -4,6 +4,7 @@
 #include <string>
 
 #include "norvo/export.h"
+#include "quib_stat.h"
 #include "vlibc_szlist.h"
 
 NORVO_BEGIN_C
@@ -52,3 +53,57 @@ NORVO_API int NvoLibHasPrivilege(const char *path, const char *user, const char 
 NORVO_API PSZLIST NvoLibValidShareGen(const char *user, int sort, int writableOnly);
 
 NORVO_END_C
+
+// ---- The directory walker ----
+//
+// Visits every entry below a directory and hands each, with its stat record (a final link is
+// described, never followed), to a callback, keeping the user path and the real path side by
+// side. Each directory is opened relative to the one holding it and must not be a link, so a
+// folder swapped for a link mid-walk ends that branch instead of leading out of the tree; only
+// a bounded number of descriptors is held at any depth. The walker changes the working
+// directory into each directory it opens and does not restore it.
+
+// Which failures a walk passes over silently (any other value: none).
+typedef enum _enum_ignore_err_ : int {
+    IGNORE_ERR_PERMISSION = 0,  // EACCES and EPERM only
+    IGNORE_ERR_ALL = 1,
+    IGNORE_ERR_NONE = 2,
+} _enum_ignore_err_;
+
+class NORVO_API NvoDirectoryWalkerCallBack {
+public:
+    // One entry: userPath and realPath are the directory's paths + "/" + name; basePath and
+    // extra are the walk's own, unchanged. false stops the walk.
+    virtual bool operator()(const std::string &userPath, const std::string &basePath,
+                            const std::string &realPath, const std::string &name, _tag_QUIBSTAT_ &stat,
+                            const std::string *extra) = 0;
+    virtual ~NvoDirectoryWalkerCallBack();
+};
+
+class NORVO_API NvoDirectoryWalker {
+public:
+    // cancel (may be null) stays the caller's: a 1 there stops the walk before the next entry,
+    // and the walk then counts as finished.
+    NvoDirectoryWalker(_enum_ignore_err_ mode, int *cancel);
+
+    // Depth first, pre before and post after each entry (a directory's after its subtree);
+    // either may be null. With skipRecycle, shares' recycle bins are not visited.
+    // All three walks: true when finished, cancelled or only passed over failures; false when a
+    // callback stopped it, a failure that is not passed over ended it (logged), or realDir is
+    // not an absolute path.
+    bool Walk(const std::string &userDir, const std::string &basePath, const std::string &realDir,
+              NvoDirectoryWalkerCallBack *pre, NvoDirectoryWalkerCallBack *post, const std::string *extra,
+              bool skipRecycle);
+    // Depth first, one callback before each entry.
+    bool Walk_TopDown(const std::string &userDir, const std::string &basePath, const std::string &realDir,
+                      NvoDirectoryWalkerCallBack &cb, const std::string *extra, bool skipRecycle);
+    // The whole first folder, then (unless firstFolderOnly) each of its sub-folders top-down in
+    // reader order. Recycle bins are skipped among the first folder's entries only.
+    bool Walk_FirstFolder_First(const std::string &userDir, const std::string &basePath,
+                                const std::string &realDir, NvoDirectoryWalkerCallBack &cb,
+                                const std::string *extra, bool skipRecycle, bool firstFolderOnly);
+
+private:
+    _enum_ignore_err_ mode_;
+    int *cancel_;
+};

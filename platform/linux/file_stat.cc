@@ -26,6 +26,28 @@ QUIBTIME ToQuibTime(const struct statx_timestamp &t) {
     return QUIBTIME{static_cast<int32_t>(seconds), t.tv_nsec};
 }
 
+int Fill(const struct statx &info, bool wantCrtime, PQUIBSTAT st) {
+    QUIBSTAT out{};
+    out.st_mode = info.stx_mode;
+    out.st_uid = info.stx_uid;
+    out.st_gid = info.stx_gid;
+    out.st_size = static_cast<int64_t>(info.stx_size);
+    out.st_atim = ToQuibTime(info.stx_atime);
+    out.st_mtim = ToQuibTime(info.stx_mtime);
+    out.st_ctim = ToQuibTime(info.stx_ctime);
+    // A file system that keeps no birth time (FAT through FUSE, some network ones) leaves the
+    // bit out of the answer; zero then says "unknown" rather than passing off another time.
+    if (wantCrtime && (info.stx_mask & STATX_BTIME) != 0) {
+        out.st_crtim = ToQuibTime(info.stx_btime);
+    }
+    *st = out;
+    return 0;
+}
+
+unsigned FieldsFor(bool wantCrtime) {
+    return kBasicFields | (wantCrtime ? STATX_BTIME : 0u);
+}
+
 }  // namespace
 }  // namespace norvo::platform
 
@@ -45,25 +67,21 @@ extern "C" int VLIBCFileLStat(const char *path, int flags, PQUIBSTAT st) {
         if (const int err = np::PassEntryStat(pass, name, &info); err != 0) {
             return NORVO_FAIL_ERRNO(err);
         }
-    } else {
-        const unsigned mask = np::kBasicFields | (wantCrtime ? STATX_BTIME : 0u);
-        if (statx(AT_FDCWD, path, AT_SYMLINK_NOFOLLOW | AT_NO_AUTOMOUNT, mask, &info) != 0) {
-            return NORVO_FAIL_ERRNO(errno);
-        }
+    } else if (statx(AT_FDCWD, path, AT_SYMLINK_NOFOLLOW | AT_NO_AUTOMOUNT, np::FieldsFor(wantCrtime),
+                     &info) != 0) {
+        return NORVO_FAIL_ERRNO(errno);
     }
-    QUIBSTAT out{};
-    out.st_mode = info.stx_mode;
-    out.st_uid = info.stx_uid;
-    out.st_gid = info.stx_gid;
-    out.st_size = static_cast<int64_t>(info.stx_size);
-    out.st_atim = np::ToQuibTime(info.stx_atime);
-    out.st_mtim = np::ToQuibTime(info.stx_mtime);
-    out.st_ctim = np::ToQuibTime(info.stx_ctime);
-    // A file system that keeps no birth time (FAT through FUSE, some network ones) leaves the
-    // bit out of the answer; zero then says "unknown" rather than passing off another time.
-    if (wantCrtime && (info.stx_mask & STATX_BTIME) != 0) {
-        out.st_crtim = np::ToQuibTime(info.stx_btime);
+    return np::Fill(info, wantCrtime, st);
+}
+
+extern "C" int VLIBCFileLStatAt(int dirFd, const char *name, int flags, PQUIBSTAT st) {
+    if (name == nullptr || name[0] == '\0' || st == nullptr || (flags & ~np::kKnownFlags) != 0) {
+        return NORVO_FAIL_ERRNO(EINVAL);
     }
-    *st = out;
-    return 0;
+    const bool wantCrtime = (flags & QUIB_STAT_CRTIME) != 0;
+    struct statx info;
+    if (statx(dirFd, name, AT_SYMLINK_NOFOLLOW | AT_NO_AUTOMOUNT, np::FieldsFor(wantCrtime), &info) != 0) {
+        return NORVO_FAIL_ERRNO(errno);
+    }
+    return np::Fill(info, wantCrtime, st);
 }

@@ -61,6 +61,8 @@ SEAM_PLATFORM(int, QUIBShareIsShareRecycle, -1, (const char *realPath), (realPat
 SEAM_PLATFORM(int, QUIBACLPermGet, -1, (const char *path, unsigned int *mask), (path, mask))
 SEAM_PLATFORM(int, QUIBACLIsSupport, -1, (const char *path, int fd, int flags), (path, fd, flags))
 SEAM_PLATFORM(int, VLIBCFileLStat, -1, (const char *path, int flags, PQUIBSTAT st), (path, flags, st))
+SEAM_PLATFORM(int, VLIBCFileLStatAt, -1, (int dirFd, const char *name, int flags, PQUIBSTAT st),
+              (dirFd, name, flags, st))
 SEAM_PLATFORM(int, VLIBCFileGetKeyValue, -1,
               (const char *file, const char *key, char *buf, size_t size, int flags),
               (file, key, buf, size, flags))
