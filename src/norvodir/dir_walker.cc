@@ -215,11 +215,11 @@ private:
         if (failed != Failed::kNone) {
             *passed = Passes(mode_, err) ? 1 : 0;
             if (*passed == 0 && failed == Failed::kChdir) {
-                NVO_LOG_AT(norvo::kNorvoDir, visit.lines.chdir, "%s:%d Failed to chdir %s. [%s]", real_.c_str(),
-                           strerror(err));
+                NVO_LOG_AT(norvo::kNorvoDir, visit.lines.chdir, "%s:%d Failed to chdir %s. [%s]",
+                           real_.c_str(), strerror(err));
             } else if (*passed == 0) {
-                NVO_LOG_AT(norvo::kNorvoDir, visit.lines.open, "%s:%d Failed to open %s, error %s", real_.c_str(),
-                           strerror(err));
+                NVO_LOG_AT(norvo::kNorvoDir, visit.lines.open, "%s:%d Failed to open %s, error %s",
+                           real_.c_str(), strerror(err));
             }
             return false;
         }
@@ -261,9 +261,9 @@ private:
         int err = errno;
         struct stat st;
         if (parent->dir.IsOpen()) {
-            err = fstat(parent->dir.Get(), &st) != 0 ? errno : (st.st_dev != parent->dev || st.st_ino != parent->ino)
-                                                                   ? ESTALE
-                                                                   : 0;
+            err = fstat(parent->dir.Get(), &st) != 0                       ? errno
+                  : (st.st_dev != parent->dev || st.st_ino != parent->ino) ? ESTALE
+                                                                           : 0;
         }
         if (err == 0) {
             return true;
@@ -273,8 +273,8 @@ private:
         if (Passes(mode_, err)) {
             return true;
         }
-        NVO_LOG_AT(norvo::kNorvoDir, visit.lines.open, "%s:%d Failed to open %s, error %s", parentPath.c_str(),
-                   strerror(err));
+        NVO_LOG_AT(norvo::kNorvoDir, visit.lines.open, "%s:%d Failed to open %s, error %s",
+                   parentPath.c_str(), strerror(err));
         return false;
     }
 
@@ -293,7 +293,8 @@ auto OpenStart(const std::string &userDir, const std::string &realDir) {
     std::string top;
     const bool beneath = norvo::TopOf(userDir, realDir, &top);
     return [beneath, top, &realDir](int flags) {
-        return beneath ? norvo::OpenBeneath(top, realDir, flags) : OwnedFd(open(realDir.c_str(), flags | O_CLOEXEC));
+        return beneath ? norvo::OpenBeneath(top, realDir, flags)
+                       : OwnedFd(open(realDir.c_str(), flags | O_CLOEXEC));
     };
 }
 
@@ -311,15 +312,16 @@ NvoDirectoryWalkerCallBack::~NvoDirectoryWalkerCallBack() = default;
 
 NvoDirectoryWalker::NvoDirectoryWalker(_enum_ignore_err_ mode, int *cancel) : mode_(mode), cancel_(cancel) {}
 
-bool NvoDirectoryWalker::Walk(const std::string &userDir, const std::string &basePath, const std::string &realDir,
-                              NvoDirectoryWalkerCallBack *pre, NvoDirectoryWalkerCallBack *post,
-                              const std::string *extra, bool skipRecycle) {
+bool NvoDirectoryWalker::Walk(const std::string &userDir, const std::string &basePath,
+                              const std::string &realDir, NvoDirectoryWalkerCallBack *pre,
+                              NvoDirectoryWalkerCallBack *post, const std::string *extra, bool skipRecycle) {
     return norvo::Guarded(false, [&] {
         if (BadStart(realDir, kWalkLines)) {
             return false;
         }
         ::Walk walk(mode_, cancel_, basePath, extra);
-        return walk.Run(userDir, realDir, OpenStart(userDir, realDir), Visit{pre, post, kWalkLines, skipRecycle});
+        return walk.Run(userDir, realDir, OpenStart(userDir, realDir),
+                        Visit{pre, post, kWalkLines, skipRecycle});
     });
 }
 

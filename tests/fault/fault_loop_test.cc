@@ -16,6 +16,7 @@
 #include <fstream>
 #include <functional>
 #include <map>
+#include <set>
 #include <sstream>
 
 #include <gtest/gtest.h>
@@ -328,6 +329,22 @@ const Op kOps[] = {
          return Expect(bin >= 0 && deeper >= 0, bin == 1 && deeper == 0);
      },
      kPlatformSlot},
+    {"Walk",  // the walker reports through its log only
+     [] {
+         struct Names : NvoDirectoryWalkerCallBack {
+             std::set<std::string> seen;
+             bool operator()(const std::string &, const std::string &, const std::string &, const std::string &name,
+                             _tag_QUIBSTAT_ &, const std::string *) override {
+                 seen.insert(name);
+                 return true;
+             }
+         } pre, post;
+         NvoDirectoryWalker walker(IGNORE_ERR_NONE, nullptr);
+         const bool ok = walker.Walk("/public", "/public", "/volume1/public", &pre, &post, nullptr, true);
+         const std::set<std::string> all{"dir", "a.txt", "sub"};
+         return Expect(ok, pre.seen == all && post.seen == all);
+     },
+     kNoSlot},
 };
 
 // Runs op with call n failing with err for n = 1, 2, ... until a run gets through.

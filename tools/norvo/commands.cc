@@ -167,6 +167,28 @@ std::vector<CommandDef> MakeCommands() {
           {"name", "TERMS", false, "name terms as norvo conditions --name takes them; not at /"}},
          {{"PATH", "a user-visible path (/share/dir, /home/...), or / for the shares"}},
          RunLs},
+        {"walk",
+         "every entry below a folder, as the directory walker hands it to its callback",
+         "Resolves PATH for USER (NvoFullPathGet), refuses it unless USER may list its share\n"
+         "(CheckShareListPrivilege), then walks it as USER (initgroups, setegid, seteuid: needs root)\n"
+         "with NvoDirectoryWalker. Each callback prints one line: the type (d folder, f file, l link,\n"
+         "? other), the size, the user path and the real path; --json prints one object per line\n"
+         "with \"user_path\", \"real_path\", \"name\", \"type\" and \"size\" (and \"phase\" with\n"
+         "--order both). Links are reported, never followed; hidden names are not reported.\n"
+         "\n"
+         "Orders: top-down (Walk_TopDown, the default); pre and post (Walk with only that callback);\n"
+         "both (Walk with both, each line marked pre or post); first-folder (Walk_FirstFolder_First:\n"
+         "the whole folder first, then each sub-folder top-down; --first-only stops after the\n"
+         "folder). --ignore says which failures are passed over silently: permission (EACCES and\n"
+         "EPERM, the default), all, or none; one that is not ends the walk (exit 1, logged).\n"
+         "Ctrl-C sets the walker's cancel flag: the walk stops before the next entry (exit 1).",
+         {{"user", "USER", true, kUserHelp},
+          {"order", "ORDER", false, "top-down (default), pre, post, both or first-folder"},
+          {"first-only", nullptr, false, "with --order first-folder: the folder alone"},
+          {"ignore", "MODE", false, "permission (default), all or none"},
+          {"skip-recycle", nullptr, false, "do not visit shares' recycle bins"}},
+         {{"PATH", "a folder's user-visible path (/share/dir, /home/...)"}},
+         RunWalk},
     };
 }
 
