@@ -84,6 +84,14 @@ show "The read-only volume: its share's volume status, as the web interface rece
     --json ls --user bob --info volume_status --sort name --offset 0 --limit 1 /
 show "A file entry as the web interface receives it" \
     --json ls --user bob --info size,owner,perm --name sunset /photo/2024
+show "Every entry below a folder, as the walker hands it to its callback: type, size, user and real path" \
+    walk --user alice /photo
+show "The same walk without the share's recycle bin" \
+    walk --user alice --skip-recycle /photo
+show "bob may not enter photo/private: passed over silently by default, the end of the walk with --ignore none" \
+    walk --user bob --ignore none /photo
+show "The first folder whole, then each sub-folder; with --first-only the first folder alone, in JSON lines" \
+    --json walk --user alice --order first-folder --first-only /photo
 
 step=$((step + 1))
 printf '\n== %d. %s\n' "$step" "A domain account logs in; the sid is kept for the next calls"
