@@ -227,6 +227,10 @@ TEST_F(NorvoCliTest, UsageErrorsExitTwoAndSayWhy) {
         {{"mounts", "--escaped", "--path", "/\\xq1"}, "norvo mounts: option --path is not in the escaped form"},
         {{"whois", "--uid", "1", "--gid", "1"}, "norvo whois: give exactly one of --uid, --gid and --user"},
         {{"whois", "--uid", "4294967296"}, "norvo whois: --uid takes a decimal id up to 4294967295"},
+        {{"walk", "--user", "alice", "--order", "sideways", "/photo"}, "norvo walk: --order wants top-down, pre"},
+        {{"walk", "--user", "alice", "--first-only", "/photo"}, "norvo walk: --first-only goes with --order"},
+        {{"walk", "--user", "alice", "--ignore", "some", "/photo"}, "norvo walk: --ignore wants permission"},
+        {{"walk", "--user", "alice", "/"}, "norvo walk: PATH must be a folder's user-visible path"},
     };
     for (const auto &[args, message] : cases) {
         Strings withJson = args;
@@ -237,6 +241,38 @@ TEST_F(NorvoCliTest, UsageErrorsExitTwoAndSayWhy) {
         EXPECT_EQ(result.out, "");
         EXPECT_EQ(result.err.rfind(message, 0), 0u) << result.err;
     }
+}
+
+// Ctrl-C sets the walker's cancel flag: the walk stops before the next entry, says so, exits 1.
+TEST_F(NorvoCliTest, WalkStopsCleanlyOnInterrupt) {
+    for (int i = 0; i < 20000; ++i) {
+        close(open(("/volume1/photo/file" + std::to_string(i)).c_str(), O_CREAT | O_WRONLY, 0644));
+    }
+    int out[2], err[2];
+    ASSERT_EQ(pipe(out), 0);
+    ASSERT_EQ(pipe(err), 0);
+    const pid_t pid = fork();
+    if (pid == 0) {
+        dup2(out[1], 1);
+        dup2(err[1], 2);
+        execl(NorvoCliPath().c_str(), "norvo", "walk", "--user", "alice", "/photo", nullptr);
+        _exit(127);
+    }
+    close(out[1]);
+    close(err[1]);
+    char buf[65536];
+    ASSERT_GT(read(out[0], buf, 1), 0);  // walking; soon blocked on the full pipe
+    kill(pid, SIGINT);
+    size_t lines = 0;
+    for (ssize_t got; (got = read(out[0], buf, sizeof buf)) > 0;) {
+        lines += std::count(buf, buf + got, '\n');
+    }
+    const ssize_t said = read(err[0], buf, sizeof buf - 1);
+    int status = 0;
+    waitpid(pid, &status, 0);
+    EXPECT_EQ(WEXITSTATUS(status), 1);
+    EXPECT_LT(lines, 20000u);
+    EXPECT_EQ(std::string(buf, said > 0 ? static_cast<size_t>(said) : 0).rfind("norvo walk: cancelled after ", 0), 0u);
 }
 
 TEST_F(NorvoCliTest, HostileArgumentsKeepJsonValidAndLossless) {

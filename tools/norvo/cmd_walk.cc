@@ -50,8 +50,9 @@ public:
             line["size"] = static_cast<Json::Int64>(st.st_size);
             std::cout << Json::writeString(compact_, line) << '\n';
         } else {
-            std::cout << (phase_ != nullptr ? std::string(phase_) + " " : std::string()) << TypeLetter(st.st_mode)
-                      << ' ' << st.st_size << ' ' << TerminalSafe(userPath) << "  " << TerminalSafe(realPath) << '\n';
+            std::cout << (phase_ != nullptr ? std::string(phase_) + " " : std::string())
+                      << TypeLetter(st.st_mode) << ' ' << st.st_size << ' ' << TerminalSafe(userPath) << "  "
+                      << TerminalSafe(realPath) << '\n';
         }
         return static_cast<bool>(std::cout);
     }
@@ -74,8 +75,11 @@ struct Order {
     bool pre;
     bool post;
 };
-constexpr Order kOrders[] = {
-    {"top-down", true, false}, {"pre", true, false}, {"post", false, true}, {"both", true, true}, {"first-folder", true, false}};
+constexpr Order kOrders[] = {{"top-down", true, false},
+                             {"pre", true, false},
+                             {"post", false, true},
+                             {"both", true, true},
+                             {"first-folder", true, false}};
 
 }  // namespace
 
@@ -86,7 +90,8 @@ int RunWalk(const Invocation &inv) {
         path.pop_back();
     }
     if (path == "/" || !IsWellFormedUserPath(path.c_str()) || HasDotComponent(path)) {
-        return ReportUsageError(inv.command, "PATH must be a folder's user-visible path (/share/dir), not " + path);
+        return ReportUsageError(inv.command,
+                                "PATH must be a folder's user-visible path (/share/dir), not " + path);
     }
     const std::string orderWord = inv.Value("order") ? *inv.Value("order") : "top-down";
     const Order *order = nullptr;
@@ -94,8 +99,8 @@ int RunWalk(const Invocation &inv) {
         order = orderWord == known.word ? &known : order;
     }
     if (order == nullptr) {
-        return ReportUsageError(inv.command, "--order wants top-down, pre, post, both or first-folder, not " +
-                                                 orderWord);
+        return ReportUsageError(inv.command,
+                                "--order wants top-down, pre, post, both or first-folder, not " + orderWord);
     }
     const bool firstFolder = orderWord == "first-folder";
     if (inv.Has("first-only") && !firstFolder) {
@@ -128,7 +133,8 @@ int RunWalk(const Invocation &inv) {
     NvoLibSetErr(NVO_ERR_NONE);
     if (CheckShareListPrivilege(userName.c_str(), nullptr, path.c_str()) != 1) {
         const int code = NvoLibGetErr();
-        return ReportFailure(inv, code != NVO_ERR_NONE ? code : NVO_ERR_PRIVILEGE, userName + " may not list " + path);
+        return ReportFailure(inv, code != NVO_ERR_NONE ? code : NVO_ERR_PRIVILEGE,
+                             userName + " may not list " + path);
     }
 
     std::string error;
@@ -146,12 +152,13 @@ int RunWalk(const Invocation &inv) {
     const bool skipRecycle = inv.Has("skip-recycle");
     bool finished = false;
     if (firstFolder) {
-        finished = walker.Walk_FirstFolder_First(path, path, realPath, pre, nullptr, skipRecycle, inv.Has("first-only"));
+        finished = walker.Walk_FirstFolder_First(path, path, realPath, pre, nullptr, skipRecycle,
+                                                 inv.Has("first-only"));
     } else if (orderWord == "top-down") {
         finished = walker.Walk_TopDown(path, path, realPath, pre, nullptr, skipRecycle);
     } else {
-        finished = walker.Walk(path, path, realPath, order->pre ? &pre : nullptr, order->post ? &post : nullptr,
-                               nullptr, skipRecycle);
+        finished = walker.Walk(path, path, realPath, order->pre ? &pre : nullptr,
+                               order->post ? &post : nullptr, nullptr, skipRecycle);
     }
     identity.reset();
     std::cout.flush();
