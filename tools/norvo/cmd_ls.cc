@@ -13,6 +13,7 @@
 #include "exit_status.h"
 #include "handlers.h"
 #include "identity.h"
+#include "listable.h"
 #include "norvo/errors.h"
 #include "norvo/norvodir.h"
 #include "norvo/norvoenum.h"
@@ -272,21 +273,8 @@ int RunLs(const Invocation &inv) {
         }
     }
     std::string realPath;
-    if (!shares) {
-        std::string share;
-        std::string volumePath;
-        std::string sharePath;
-        NvoLibSetErr(NVO_ERR_NONE);
-        if (!NvoFullPathGet(path.c_str(), realPath, share, volumePath, sharePath, userName)) {
-            return ReportLibraryFailure(inv, "resolving " + path);
-        }
-        NvoLibSetErr(NVO_ERR_NONE);
-        if (CheckShareListPrivilege(userName.c_str(), nullptr, path.c_str()) != 1) {
-            // The check refuses without a code of its own; the web interface shows 407 then.
-            const int code = NvoLibGetErr();
-            return ReportFailure(inv, code != NVO_ERR_NONE ? code : NVO_ERR_PRIVILEGE,
-                                 userName + " may not list " + path);
-        }
+    if (!shares && (realPath = ListableRealPath(inv, userName, path, &status)).empty()) {
+        return status;
     }
 
     // As the user from here on: modes and ACL masks are judged for the user's identity.

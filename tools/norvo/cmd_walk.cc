@@ -11,6 +11,7 @@
 #include "exit_status.h"
 #include "handlers.h"
 #include "identity.h"
+#include "listable.h"
 #include "norvo/errors.h"
 #include "norvo/norvodir.h"
 #include "norvo/norvomisc.h"
@@ -122,19 +123,9 @@ int RunWalk(const Invocation &inv) {
     if (!user) {
         return status;
     }
-    std::string realPath;
-    std::string share;
-    std::string volumePath;
-    std::string sharePath;
-    NvoLibSetErr(NVO_ERR_NONE);
-    if (!NvoFullPathGet(path.c_str(), realPath, share, volumePath, sharePath, userName)) {
-        return ReportLibraryFailure(inv, "resolving " + path);
-    }
-    NvoLibSetErr(NVO_ERR_NONE);
-    if (CheckShareListPrivilege(userName.c_str(), nullptr, path.c_str()) != 1) {
-        const int code = NvoLibGetErr();
-        return ReportFailure(inv, code != NVO_ERR_NONE ? code : NVO_ERR_PRIVILEGE,
-                             userName + " may not list " + path);
+    const std::string realPath = ListableRealPath(inv, userName, path, &status);
+    if (realPath.empty()) {
+        return status;
     }
 
     std::string error;
