@@ -84,6 +84,8 @@ show "The read-only volume: its share's volume status, as the web interface rece
     --json ls --user bob --info volume_status --sort name --offset 0 --limit 1 /
 show "A file entry as the web interface receives it" \
     --json ls --user bob --info size,owner,perm --name sunset /photo/2024
+show "The folder tree's view of photo: folders only, the dead network mount kept as unreachable" \
+    subdirs --user alice /volume1/photo
 
 step=$((step + 1))
 printf '\n== %d. %s\n' "$step" "A domain account logs in; the sid is kept for the next calls"
