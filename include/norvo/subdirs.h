@@ -12,8 +12,8 @@ struct _tag_SUBDIR_ENTRY_INFO_ {
     std::string name;
     std::string path;  // the listed directory's path, "/", the name
     uint64_t size = 0;
-    uint32_t mode = 0;   // the stat mode word
-    int32_t mtime = 0;   // seconds
+    uint32_t mode = 0;  // the stat mode word
+    int32_t mtime = 0;  // seconds
     uint32_t uid = 0;
     uint32_t gid = 0;
     bool isMountPoint = false;

@@ -45,21 +45,24 @@ Json::Value FolderJson(const _tag_SUBDIR_ENTRY_INFO_ &folder) {
     return item;
 }
 
+std::string MountCell(const _tag_SUBDIR_ENTRY_INFO_ &folder) {
+    return folder.isMountPoint ? TerminalSafe(folder.mountType) : "-";
+}
+
 // posix, owner, modified, mount and name columns; an unreachable mount has no facts to show.
 std::vector<std::string> Cells(const _tag_SUBDIR_ENTRY_INFO_ &folder, NorvoUserEnum &names) {
     const bool unreachable = folder.mountType == "remotefail";
     const std::string owner = names.GetUserNameByUID(folder.uid);
     return {unreachable ? "?" : GetPrivilegeStr(folder.mode),
             unreachable ? "?" : TerminalSafe(owner.empty() ? std::to_string(folder.uid) : owner),
-            unreachable ? "?" : Date(folder.mtime),
-            unreachable ? "unreachable" : folder.isMountPoint ? TerminalSafe(folder.mountType) : "-",
+            unreachable ? "?" : Date(folder.mtime), unreachable ? "unreachable" : MountCell(folder),
             TerminalSafe(folder.name) + "/"};
 }
 
 // Columns in characters, not bytes: a UTF-8 owner name counts once per character.
 size_t Width(const std::string &text) {
-    return static_cast<size_t>(
-        std::count_if(text.begin(), text.end(), [](char c) { return (static_cast<unsigned char>(c) & 0xC0) != 0x80; }));
+    return static_cast<size_t>(std::count_if(
+        text.begin(), text.end(), [](char c) { return (static_cast<unsigned char>(c) & 0xC0) != 0x80; }));
 }
 
 void PrintTable(const std::vector<_tag_SUBDIR_ENTRY_INFO_> &folders) {
