@@ -122,7 +122,7 @@ TEST(SubDirs, GeneratedFolderAsFindAndStatSeeIt) {
     SCOPED_TRACE("seed " + std::to_string(seed));
     std::mt19937 random(seed);
     const auto pick = [&](const auto &items) { return items[random() % std::size(items)]; };
-    const char *stems[] = {"Foo", "foo", "FOO", "Straße", "STRASSE", "a\nb", "d\xff", "\xe2\x80\xae" "gpj.exe",
+    const char *stems[] = {"Foo", "foo", "FOO", "Straße", "STRASSE", "a\nb", "d\xff", "\xe2\x80\xaegpj.exe",
                            "tab\t", "@eaDir", "@tmp", "#snapshot", ".DS_Store", "#recycle", ".hidden", "x|y",
                            "\xc3\xbc", "\xc3\x9c", "-n", "*", "\\x41"};
     const char *owners[] = {"root", "alice", "bob"};
@@ -180,17 +180,17 @@ TEST(SubDirs, RefusalsAndAnUnreachableMount) {
         {"", 0, NVO_ERR_GENERAL, "", {bad}},
         {"volume1/public", 0, NVO_ERR_GENERAL, "", {bad}},  // relative: never against the working directory
         {pub + '\0' + "/x", 0, NVO_ERR_GENERAL, "", {bad}},
-        {pub + "/missing", 0, NVO_ERR_NO_PATH},
-        {pub + "/file", 0, NVO_ERR_NO_PATH},
-        {pub + "/file/x", 0, NVO_ERR_NO_PATH},
-        {pub + "/closed", 0, NVO_ERR_PRIVILEGE},
-        {pub + "/noread", 0, NVO_ERR_PRIVILEGE},
-        {pub + "/noenter", 0, NVO_ERR_PRIVILEGE},
-        {pub + "/loop", 0, NVO_ERR_ACCESS},
-        {pub + "/remote/nas2", 0, NVO_ERR_ACCESS},  // EIO
-        {pub + "/remote", 1, 0, "a nas2:remotefail "},
-        {pub + "/link", 1, 0, "a "},    // followed; the mount table knows nas2 by its own path only
-        {pub + "/only", 1, 0, "Q q "},  // either order would do: compared as a set below
+        {pub + "/missing", 0, NVO_ERR_NO_PATH, "", {}},
+        {pub + "/file", 0, NVO_ERR_NO_PATH, "", {}},
+        {pub + "/file/x", 0, NVO_ERR_NO_PATH, "", {}},
+        {pub + "/closed", 0, NVO_ERR_PRIVILEGE, "", {}},
+        {pub + "/noread", 0, NVO_ERR_PRIVILEGE, "", {}},
+        {pub + "/noenter", 0, NVO_ERR_PRIVILEGE, "", {}},
+        {pub + "/loop", 0, NVO_ERR_ACCESS, "", {}},
+        {pub + "/remote/nas2", 0, NVO_ERR_ACCESS, "", {}},  // EIO
+        {pub + "/remote", 1, 0, "a nas2:remotefail ", {}},
+        {pub + "/link", 1, 0, "a ", {}},    // followed; the mount table knows nas2 by its own path only
+        {pub + "/only", 1, 0, "Q q ", {}},  // either order would do: compared as a set below
     };
     for (const Row &row : rows) {
         SCOPED_TRACE(row.path);
