@@ -92,6 +92,8 @@ show "bob may not enter photo/private: passed over silently by default, the end 
     walk --user bob --ignore none /photo
 show "The first folder whole, then each sub-folder; with --first-only the first folder alone, in JSON lines" \
     --json walk --user alice --order first-folder --first-only /photo
+show "The folder tree's view of photo: folders only, the dead network mount kept as unreachable" \
+    subdirs --user alice /volume1/photo
 
 step=$((step + 1))
 printf '\n== %d. %s\n' "$step" "A domain account logs in; the sid is kept for the next calls"

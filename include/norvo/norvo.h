@@ -7,3 +7,4 @@
 #include "norvo/norvosearch.h"
 #include "norvo/nvoman.h"
 #include "norvo/pathinfo.h"
+#include "norvo/subdirs.h"

@@ -120,6 +120,7 @@ std::function<std::string()> OldOrNew(std::string before, std::string after) {
 
 const std::string kDir = "/volume1/public/dir";
 char g_sid[64];
+Appliance *g_app;
 bool g_created;
 
 void Login(const char *user) {
@@ -345,6 +346,19 @@ const Op kOps[] = {
          return Expect(ok, pre.seen == all && post.seen == all);
      },
      kNoSlot},
+    {"SubDirs",  // among the folders a live mount and a dead one
+     [] {
+         std::vector<_tag_SUBDIR_ENTRY_INFO_> out(1);
+         out[0].name = "B";
+         const int rc = NvoLibEnumSubDir("/volume1/photo", out);
+         std::string names;
+         for (const auto &folder : out) names += folder.name + ":" + folder.mountType + " ";
+         return Expect(rc == 1, names == "B: nas2:remotefail vol:tmpfs ");
+     },
+     kLibrarySlot,
+     [] {
+         if (!fs::exists("/volume1/photo/vol")) g_app->AddVolume("/volume1/photo/vol").MountDeadRemote("/volume1/photo/nas2");
+     }},
 };
 
 // Runs op with call n failing with err for n = 1, 2, ... until a run gets through.
@@ -391,6 +405,7 @@ protected:
 // ENOMEM stands for every failure; EACCES takes the branches where a refusal is an answer. (With
 // EIO a listing deliberately ends without a library code.)
 TEST_P(Faults, ReleaseEverythingAndSayWhy) {
+    g_app = &app_;
     app_.Basic().WriteFile(kDir + "/a.txt", "hello", "alice").MakeDir(kDir + "/sub");
     app_.MakeDir("/volume1/homes/alice", "alice").SetDomain("CORP").AddUser("CORP\\dave");
     app_.SetAppPrivilege("QUIB.Fault.Loop", "@staff");

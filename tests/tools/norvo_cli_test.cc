@@ -153,6 +153,15 @@ TEST_F(NorvoCliTest, SharesCheckPathAndFailures) {
     EXPECT_EQ(text.err, "error 418 (error:error_reserved_name)\n");
 }
 
+TEST_F(NorvoCliTest, SubdirsListsFoldersAsTheUser) {
+    appliance_.MakeDir("/volume1/photo/d\xFF", "alice").MakeDir("/volume1/photo/B", "bob", 0700).WriteFile("/volume1/photo/c");
+    const Json::Value folders = RunJson({"subdirs", "--user", "alice", "/volume1/photo"})["data"]["folders"];
+    ASSERT_EQ(folders.size(), 2u);
+    EXPECT_EQ(folders[0]["uid"].asUInt(), appliance_.Uid("bob"));
+    EXPECT_EQ(folders[1]["path_escaped"].asString(), "/volume1/photo/d\\xFF");
+    EXPECT_EQ(RunJson({"subdirs", "--user", "alice", "/volume1/photo/B"}, 1)["error"]["code"].asInt(), 407);
+}
+
 // The records of the conditions joined as a CLI author would see them, and the verdict on real
 // files.
 TEST_F(NorvoCliTest, ConditionsShowTheJoinedRecordsAndJudgeFiles) {

@@ -77,6 +77,7 @@ SEAM_CALL(DIR *, fdopendir, nullptr, (int fd), (fd))
 SEAM_CALL(int, statx, -1, (int dir, const char *path, int flags, unsigned mask, struct statx *out),
           (dir, path, flags, mask, out))
 SEAM_CALL(int, chdir, -1, (const char *path), (path))
+SEAM_CALL(int, fchdir, -1, (int fd), (fd))
 SEAM_CALL(int, mkdir, -1, (const char *path, mode_t mode), (path, mode))
 SEAM_CALL(int, mkdirat, -1, (int dir, const char *path, mode_t mode), (dir, path, mode))
 SEAM_CALL(int, mkostemp, -1, (char *pattern, int flags), (pattern, flags))

@@ -189,6 +189,17 @@ std::vector<CommandDef> MakeCommands() {
           {"skip-recycle", nullptr, false, "do not visit shares' recycle bins"}},
          {{"PATH", "a folder's user-visible path (/share/dir, /home/...)"}},
          RunWalk},
+        {"subdirs",
+         "the sub-folders of a real directory, as the folder tree gets them",
+         "Lists the sub-folders of the real directory PATH as USER (initgroups, setegid, seteuid:\n"
+         "needs root), as the folder tree does (NvoLibEnumSubDir): sorted by name without regard\n"
+         "to case, hidden names, files and links to folders left out. A folder on a network mount\n"
+         "whose server is gone is listed as \"unreachable\" (mount type \"remotefail\" in JSON).\n"
+         "PATH is taken as it is: no share is looked up and no share privilege checked, only\n"
+         "USER's own right to enter and read it; it must be absolute.",
+         {{"user", "USER", true, kUserHelp}},
+         {{"PATH", "an absolute real directory, e.g. /volume1/photo"}},
+         RunSubdirs},
     };
 }
 

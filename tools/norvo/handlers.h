@@ -15,5 +15,6 @@ int RunWhois(const Invocation &inv);       // cmd_enum.cc
 int RunConditions(const Invocation &inv);  // cmd_conditions.cc
 int RunLs(const Invocation &inv);          // cmd_ls.cc
 int RunWalk(const Invocation &inv);        // cmd_walk.cc
+int RunSubdirs(const Invocation &inv);     // cmd_subdirs.cc
 
 }  // namespace norvo::cli

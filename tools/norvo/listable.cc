@@ -22,7 +22,8 @@ std::string ListableRealPath(const Invocation &inv, const std::string &user, con
     if (CheckShareListPrivilege(user.c_str(), nullptr, userPath.c_str()) != 1) {
         // The check refuses without a code of its own; the web interface shows 407 then.
         const int code = NvoLibGetErr();
-        *status = ReportFailure(inv, code != NVO_ERR_NONE ? code : NVO_ERR_PRIVILEGE, user + " may not list " + userPath);
+        *status = ReportFailure(inv, code != NVO_ERR_NONE ? code : NVO_ERR_PRIVILEGE,
+                                user + " may not list " + userPath);
         return "";
     }
     return realPath;
