@@ -4,7 +4,7 @@
 // descriptor that fills the callback's stat record (no final link followed, the same fields,
 // birth time included); its name is tested with fnmatch; folders are walked into. Names a walk
 // never shows ("@eaDir" and the like) are passed over as the walker passes them.
-// With --naive: the way the text of the walker reads, for comparison: chdir into each folder by
+// With --naive: the classic walk, for comparison: chdir into each folder by
 // its absolute path, opendir and readdir it, and stat each entry by its absolute path.
 //   walk_floor [--naive] DIR PATTERN     prints the number of names that match
 #include <dirent.h>

@@ -33,15 +33,17 @@ int OpenDescriptors() {
 
 class Count : public NvoDirectoryWalkerCallBack {
 public:
-    Count(const char *pattern, bool diag, size_t topDepth) : pattern_(pattern), diag_(diag), topDepth_(topDepth) {}
+    Count(const char *pattern, bool diag, size_t topDepth)
+        : pattern_(pattern), diag_(diag), topDepth_(topDepth) {}
 
-    bool operator()(const std::string &userPath, const std::string &, const std::string &, const std::string &name,
-                    QUIBSTAT &, const std::string *) override {
+    bool operator()(const std::string &userPath, const std::string &, const std::string &,
+                    const std::string &name, QUIBSTAT &, const std::string *) override {
         if (fnmatch(pattern_, name.c_str(), 0) == 0) {
             ++matches_;
         }
         if (diag_) {
-            const size_t depth = static_cast<size_t>(std::count(userPath.begin(), userPath.end(), '/')) - topDepth_;
+            const size_t depth =
+                static_cast<size_t>(std::count(userPath.begin(), userPath.end(), '/')) - topDepth_;
             if (depth > deepest_) {
                 deepest_ = depth;
                 descriptors_ = OpenDescriptors();

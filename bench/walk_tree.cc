@@ -4,7 +4,8 @@
 // and Videos with nested project folders; files per folder heavy-tailed (a few folders hold
 // thousands of photos, most a handful). On top of that a few hidden "@eaDir" folders (which a
 // walk passes over, so they are not in ENTRIES), and a few symbolic links to folders and files.
-// The same ENTRIES and SEED make the same tree. Everything is created relative to descriptors.
+// The deepest entries are 12 levels below DIR. The same ENTRIES and SEED make the same tree. Everything is
+// created relative to descriptors.
 //   walk_tree DIR [ENTRIES [SEED]]      (DIR must not exist)
 // Prints one line: entries, folders, files, links, hidden folders, deepest level.
 #include <errno.h>
@@ -25,7 +26,7 @@
 
 namespace {
 
-constexpr int kMaxDepth = 12;
+constexpr int kMaxDepth = 11;  // of folders; their entries are one level deeper
 constexpr int kFirstYear = 2005;
 constexpr int kYears = 20;
 
@@ -65,9 +66,9 @@ private:
     std::mt19937_64 engine_;
 };
 
-const char *const kEvents[] = {"Birthday Anna", "Beach",     "Christmas", "Wedding Tom & Lisa", "Hiking",
-                               "Zoo",           "Garden",    "Paris",     "School concert",     "Easter",
-                               "Ski trip",      "New house", "Grandma",   "Football"};
+const char *const kEvents[] = {
+    "Birthday Anna", "Beach",          "Christmas", "Wedding Tom & Lisa", "Hiking",    "Zoo",     "Garden",
+    "Paris",         "School concert", "Easter",    "Ski trip",           "New house", "Grandma", "Football"};
 const char *const kEventParts[] = {"Edited", "RAW", "Selected", "Export", "Print", "Phone", "Camera 2"};
 const char *const kProjects[] = {"Projects", "Archive", "Contracts",     "Drafts",  "Old",    "Final",
                                  "Invoices", "Letters", "Meeting notes", "Reports", "Images", "Misc"};
@@ -94,13 +95,14 @@ std::string FolderName(const Folder &f, Rng &rng) {
     char buffer[128];
     switch (f.kind) {
         case Kind::kEvent:
-            snprintf(buffer, sizeof buffer, "%04d-%02d-%02d %s", f.year, f.month, 1 + static_cast<int>(rng.Below(28)),
-                     rng.Pick(kEvents));
+            snprintf(buffer, sizeof buffer, "%04d-%02d-%02d %s", f.year, f.month,
+                     1 + static_cast<int>(rng.Below(28)), rng.Pick(kEvents));
             return buffer;
         case Kind::kEventPart:
             return rng.Pick(kEventParts);
         case Kind::kScans:
-            snprintf(buffer, sizeof buffer, "Scans %04d", f.year);
+            snprintf(buffer, sizeof buffer, f.depth == 2 ? "Scans %04d" : "Batch %03d",
+                     f.depth == 2 ? f.year : static_cast<int>(rng.Below(1000)));
             return buffer;
         default:
             switch (rng.Below(4)) {
@@ -137,8 +139,8 @@ std::string FileName(const Folder &f, Rng &rng) {
         snprintf(buffer, sizeof buffer, "Scan %04d.%s", static_cast<int>(rng.Below(10000)),
                  rng.Below(2) == 0 ? "pdf" : "docx");
     } else {
-        snprintf(buffer, sizeof buffer, "%s Q%d %04d%s", rng.Pick(kDocumentStems), 1 + static_cast<int>(rng.Below(4)),
-                 f.year, rng.Pick(kDocumentExtensions));
+        snprintf(buffer, sizeof buffer, "%s Q%d %04d%s", rng.Pick(kDocumentStems),
+                 1 + static_cast<int>(rng.Below(4)), f.year, rng.Pick(kDocumentExtensions));
     }
     return buffer;
 }
@@ -191,7 +193,7 @@ public:
             } else if (!files.empty() && i % 3 == 1) {
                 target = files[rng_.Below(files.size())];
             }
-            const std::string name = Unique(i % 3 == 2 ? "Up" : "Shortcut to " + target, &used);
+            const std::string name = Unique(target == ".." ? "Up" : "Shortcut to " + target, &used);
             if (symlinkat(target.c_str(), fd, name.c_str()) != 0) {
                 Die("link", name);
             }
@@ -227,7 +229,8 @@ private:
             if (mkdirat(hidden, files[i].c_str(), 0755) != 0) {
                 Die("mkdir", files[i]);
             }
-            const int thumbs = openat(hidden, files[i].c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC);
+            const int thumbs =
+                openat(hidden, files[i].c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC);
             for (const char *name : {"thumb_small.jpg", "thumb_large.jpg"}) {
                 const int file = thumbs < 0 ? -1 : openat(thumbs, name, O_CREAT | O_WRONLY | O_CLOEXEC, 0644);
                 if (file < 0) {
@@ -279,13 +282,14 @@ int main(int argc, char **argv) {
         }
     }
     for (const char *name : kTopLevel) {
-        add(0, strcmp(name, "Scans") == 0 ? Kind::kScans : Kind::kDocuments, kFirstYear + kYears - 1, 1, name);
+        add(0, strcmp(name, "Scans") == 0 ? Kind::kScans : Kind::kDocuments, kFirstYear + kYears - 1, 1,
+            name);
     }
 
     // The rest of the folders: a depth drawn from what real shares show (most at 4 to 7), under
     // a folder one level up drawn at random; the photo years take no new children of their own.
     const long wantFolders = std::max<long>(entries * 6 / 100, static_cast<long>(folders.size()) + kMaxDepth);
-    const double depthWeights[kMaxDepth + 1] = {0, 0, 3, 8, 16, 20, 18, 13, 9, 6, 4, 2, 1};
+    const double depthWeights[kMaxDepth + 1] = {0, 0, 3, 8, 16, 20, 18, 13, 9, 6, 4, 2};
     std::vector<std::vector<int>> parentsAt(kMaxDepth + 1);
     for (size_t i = 1; i < folders.size(); ++i) {
         if (folders[i].kind != Kind::kPhotos && folders[i].kind != Kind::kYear) {
@@ -294,14 +298,16 @@ int main(int argc, char **argv) {
     }
     auto grow = [&](int parent) {
         const Folder &p = folders[parent];
-        const int year = p.kind == Kind::kDocuments ? kFirstYear + static_cast<int>(rng.Below(kYears)) : p.year;
+        const bool dated = p.kind == Kind::kDocuments || p.kind == Kind::kScans;
+        const int year = dated ? kFirstYear + static_cast<int>(rng.Below(kYears)) : p.year;
         const int child = add(parent, ChildKind(p.kind), year, p.month, "");
         if (folders[child].depth < kMaxDepth) {
             parentsAt[folders[child].depth].push_back(child);
         }
     };
     // One chain down to the deepest level first, so every depth has somewhere to grow.
-    for (int at = parentsAt[1].back(); folders[at].depth < kMaxDepth; at = static_cast<int>(folders.size()) - 1) {
+    for (int at = parentsAt[1].back(); folders[at].depth < kMaxDepth;
+         at = static_cast<int>(folders.size()) - 1) {
         grow(at);
     }
     double depthTotal = 0;
@@ -358,7 +364,7 @@ int main(int argc, char **argv) {
     for (const Folder &f : folders) {
         deepest = std::max(deepest, f.depth);
     }
-    printf("walk_tree: %ld entries: %ld folders, %ld files, %ld links; %ld hidden folders; depth %d\n",
-           folderCount + fileCount + links, folderCount, fileCount, links, hidden, deepest);
+    printf("walk_tree: %ld entries: %ld folders, %ld files, %ld links; %ld hidden folders; %d levels\n",
+           folderCount + fileCount + links, folderCount, fileCount, links, hidden, deepest + 1);
     return 0;
 }

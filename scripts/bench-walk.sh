@@ -4,11 +4,12 @@
 # hyperfine against:
 #   floor   bench/walk_floor.cc: getdents64 and one statx per entry relative to the directory's
 #           descriptor, fnmatch: only the calls the walker's callback can't do without;
-#   naive   the same program walking as the text of the walker reads (chdir and opendir by
+#   naive   the same program walking the classic way (chdir and opendir by
 #           absolute path, a stat of each entry's absolute path);
 #   bfs, find (-name, no stat needed), and find printing a stat field of every entry.
 # Checks that all of them count the same matches; prints the ratios of the medians, and the peak
-# memory of each (one run apart) and the walker's descriptors at its deepest level.
+# memory of each (one run apart) and the walker's descriptors at its deepest level; time ratios
+# of the medians and, steadier on a busy machine, of the mean CPU times.
 #   bench-walk.sh [BUILD-DIR] [ENTRIES]   (default build-bench, built optimised when missing;
 #                                         1000000 entries)
 set -euo pipefail
@@ -49,7 +50,7 @@ commands=(
   "$as find $tree -name @eaDir -prune -o -name '$pattern' -print"
   "$as find $tree -name @eaDir -prune -o -printf '%s\n' -name '$pattern' -printf 'm\n'"
 )
-python3 "$work/check.py" "$bin" "$tree" "/public/walk" "$pattern" "${names[@]}" -- "${commands[@]}" | tee "$work/check.txt"
+python3 "$work/check.py" "${names[@]}" -- "${commands[@]}" | tee "$work/check.txt"
 args=()
 for i in "${!names[@]}"; do
   args+=(-n "${names[$i]}" "${commands[$i]}")
@@ -58,28 +59,29 @@ hyperfine -N --style basic --warmup 2 --min-runs 10 --export-json "$work/result.
 SH
 
 # Runs each command once: the counts must agree (ours print the count; bfs and find print one
-# line per match, "find -printf" one "m" line per match), and wait4 gives each peak memory.
+# line per match, "find -printf" one "m" line per match). GNU time gives each peak memory: a
+# child of this Python would carry Python's own peak over its exec.
 cat > "$work/check.py" <<'PY'
-import os, shlex, subprocess, sys
-bin, tree, user, pattern = sys.argv[1:5]
+import shlex, subprocess, sys, tempfile
 cut = sys.argv.index("--")
-names, commands = sys.argv[5:cut], sys.argv[cut + 1:]
+names, commands = sys.argv[1:cut], sys.argv[cut + 1:]
+
+def run(command):
+    with tempfile.NamedTemporaryFile("r") as peak:
+        out = subprocess.run(["/usr/bin/time", "-f", "%M", "-o", peak.name] + shlex.split(command),
+                             stdout=subprocess.PIPE, check=True).stdout.decode(errors="replace")
+        return out.splitlines(), int(peak.read().split()[-1]) / 1024
+
 counts = {}
 for name, command in zip(names, commands):
-    child = subprocess.Popen(shlex.split(command), stdout=subprocess.PIPE)
-    out = child.stdout.read().decode(errors="replace")
-    _, status, usage = os.wait4(child.pid, 0)
-    if status != 0:
-        sys.exit(f"{name} failed: {status}")
-    lines = out.splitlines()
+    lines, mib = run(command)
     counts[name] = (int(lines[0]) if name in ("walker", "floor", "naive")
                     else lines.count("m") if name == "find -printf" else len(lines))
-    print(f"{name:13} {counts[name]:8} matches, peak memory {usage.ru_maxrss / 1024:6.1f} MiB")
+    print(f"{name:13} {counts[name]:8} matches, peak memory {mib:6.1f} MiB")
 if len(set(counts.values())) != 1:
     sys.exit(f"the counts differ: {counts}")
-diag = subprocess.run(shlex.split(commands[0].replace("/walk_norvo ", "/walk_norvo --diag ", 1)),
-                      stdout=subprocess.PIPE, check=True).stdout.decode().splitlines()
-print(f"walker: {diag[1]}")
+lines, _ = run(commands[0].replace("/walk_norvo ", "/walk_norvo --diag ", 1))
+print(f"walker: {lines[1]}")
 PY
 
 "$sandbox" --no-log "$work/walk.appliance" -- bash "$work/run.sh" "$bin" "$work" "$entries"
@@ -87,8 +89,9 @@ PY
 python3 - "$work/result.json" "$entries" <<'PY'
 import json, sys
 median = {r["command"]: r["median"] for r in json.load(open(sys.argv[1]))["results"]}
-print(f"{int(sys.argv[2])} entries, ratios of the medians:")
+cpu = {r["command"]: r["user"] + r["system"] for r in json.load(open(sys.argv[1]))["results"]}
+print(f"{int(sys.argv[2])} entries: ratios of the median times (and of the mean CPU times, user + system)")
 for a, b in (("walker", "floor"), ("walker", "bfs"), ("walker", "find"), ("walker", "find -printf"),
              ("naive", "floor")):
-    print(f"  {a} / {b}: {median[a] / median[b]:.2f}")
+    print(f"  {a + ' / ' + b:22} {median[a] / median[b]:5.2f}  (CPU {cpu[a] / cpu[b]:.2f})")
 PY
