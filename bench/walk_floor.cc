@@ -17,6 +17,7 @@
 
 #include <memory>
 #include <string>
+#include <vector>
 
 namespace {
 
@@ -36,15 +37,22 @@ bool Hidden(const char *name) {
     return false;
 }
 
-void Floor(int fd) {
-    std::unique_ptr<char[]> buffer(new char[kReadBuffer]);
+// One read buffer per level, kept: a fresh one per directory costs page faults when free
+// gives the top of the heap back and the next directory takes it again.
+std::vector<std::unique_ptr<char[]>> g_buffers;
+
+void Floor(int fd, size_t depth) {
+    if (g_buffers.size() <= depth) {
+        g_buffers.emplace_back(new char[kReadBuffer]);
+    }
+    char *const buffer = g_buffers[depth].get();
     for (;;) {
-        const ssize_t got = getdents64(fd, buffer.get(), kReadBuffer);
+        const ssize_t got = getdents64(fd, buffer, kReadBuffer);
         if (got <= 0) {
             break;
         }
         for (ssize_t at = 0; at < got;) {
-            const auto *entry = reinterpret_cast<const struct dirent64 *>(buffer.get() + at);
+            const auto *entry = reinterpret_cast<const struct dirent64 *>(buffer + at);
             at += entry->d_reclen;
             if (Hidden(entry->d_name)) {
                 continue;
@@ -59,7 +67,7 @@ void Floor(int fd) {
             if (S_ISDIR(st.stx_mode)) {
                 const int child = openat(fd, entry->d_name, O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC);
                 if (child >= 0) {
-                    Floor(child);
+                    Floor(child, depth + 1);
                     close(child);
                 }
             }
@@ -112,7 +120,7 @@ int main(int argc, char **argv) {
             perror(dir);
             return 1;
         }
-        Floor(fd);
+        Floor(fd, 0);
         close(fd);
     }
     printf("%ld\n", g_matches);
