@@ -8,7 +8,7 @@ packages=(
   libfuse3-dev fuse3 fusefat dosfstools fuseiso genisoimage
   googletest libgtest-dev libgmock-dev libbenchmark-dev
 )
-[ "${1:-}" = "--bench" ] && packages+=(hyperfine)
+[ "${1:-}" = "--bench" ] && packages+=(hyperfine bfs time)
 
 missing=()
 for p in "${packages[@]}"; do
