@@ -24,7 +24,8 @@ int QUIBEAIsHiddenDir(const char *name) {
 }
 
 int QUIBEAIsHiddenFile(const char *name) {
-    if (name == nullptr) {
+    // Every hidden name starts with one of these: most names are judged by their first byte.
+    if (name == nullptr || (name[0] != '.' && name[0] != '@' && name[0] != '#')) {
         return 0;
     }
     for (const char *hidden : kHiddenNames) {

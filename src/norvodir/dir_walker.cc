@@ -51,7 +51,7 @@ bool Passes(_enum_ignore_err_ mode, int err) {
 // and the lengths the walk's two path strings have while it is the current directory.
 struct Level {
     OwnedFd dir;  // not open while the level is parked deep above the current one
-    dev_t dev = 0;
+    dev_t dev = 0;  // the directory's identity, taken when it is parked
     ino_t ino = 0;
     std::string names;
     size_t next = 0;
@@ -101,13 +101,10 @@ Failed Enter(OpenDir &&openDir, Level *level, int *err) {
         }
         return Failed::kOpen;
     }
-    struct stat st;
-    if (fchdir(level->dir.Get()) != 0 || fstat(level->dir.Get(), &st) != 0) {
+    if (fchdir(level->dir.Get()) != 0) {
         *err = errno;
         return Failed::kChdir;
     }
-    level->dev = st.st_dev;
-    level->ino = st.st_ino;
     if ((*err = ReadNames(level->dir.Get(), level)) != 0) {
         return Failed::kOpen;
     }
@@ -227,9 +224,20 @@ private:
         level->userLength = user_.size();
         levels_.push_back(std::move(level));
         if (levels_.size() > kOpenLevels) {
-            levels_[levels_.size() - kOpenLevels - 1]->dir.Reset();  // parked; found again on the way up
+            Park(levels_[levels_.size() - kOpenLevels - 1].get());
         }
         return true;
+    }
+
+    // Closes a shallow level's descriptor, keeping what tells the directory again on the way up.
+    // Should even fstat fail, the identity left zero matches nothing, and the way up fails safe.
+    static void Park(Level *level) {
+        struct stat st;
+        if (fstat(level->dir.Get(), &st) == 0) {
+            level->dev = st.st_dev;
+            level->ino = st.st_ino;
+        }
+        level->dir.Reset();
     }
 
     // Leaves the current level: reopens its parent if parked, then calls post for the entry
