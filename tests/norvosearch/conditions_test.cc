@@ -1,6 +1,7 @@
 // The file-index records each condition builds, the chains linking makes, and the factory's
 // results: records are read by walking their links, as the index would. Which fields are
-// refused with which code, and what each condition decides, the find_factory fuzzer asserts.
+// refused with which code, and what each condition decides, the find_factory fuzzer asserts; how a
+// search joins them, the command's conditions test.
 #include <limits.h>
 
 #include <functional>
@@ -92,21 +93,6 @@ TEST(Chains, AlternativesHeadTheirChainNewestFirst) {
     b->orComp(head.get());
     head->orComp(new FindNameComp("c"));
     EXPECT_EQ(Chain(head->getFirstCond()), "{0 ~ *c* |{0 ~ *b* |{0 ~ *a*}}}");
-}
-
-TEST(Chains, ConjunctionLinksFromTheLastRecordOfEachCondition) {
-    std::vector<std::unique_ptr<FindComp>> list;
-    list.emplace_back(new FindUserComp("alice", 1026));
-    list.emplace_back(new FindSizeComp("equal", 100));
-    list.emplace_back(new FindNameComp("x"));
-    list.emplace_back(new FindGroupComp("staff", 7));
-    list.emplace_back(new FindTypeComp(false));
-    for (size_t i = 1; i < list.size(); ++i) {
-        (*list[i - 1])(list[i].get());
-    }
-    (*list.back())(nullptr);
-    EXPECT_EQ(Chain(list[0]->getFirstCond()),
-              "{15 = 1026 |{17 ~ alice &{7 < 105 &{7 >= 95 &{0 ~ *x* &{16 = 7 |{18 ~ staff &{6 = 0}}}}}}}}");
 }
 
 class Factory : public ::testing::Test {
