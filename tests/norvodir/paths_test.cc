@@ -141,18 +141,11 @@ TEST(Resolution, PathsThatWouldLeaveTheirShareAreRefusedEverywhere) {
     EXPECT_EQ(Resolve("/ab/x", "carol").full, "/volume1/ab/x");
 }
 
-TEST(UserHome, ResolvesTheCallersHomeAndCreatesIt) {
+// The caller's home resolved and made with its owner and mode is the fault loop's row and the
+// path_resolve fuzzer's; here a user without an account.
+TEST(UserHome, AnUnknownUserHasNone) {
     Appliance app;
     app.Basic();
-    Resolved r = Resolve("/home/x", "bob");
-    ASSERT_EQ(r.ok, 1);
-    EXPECT_EQ(r.full, "/volume1/homes/bob/x");
-    EXPECT_EQ(r.share, "home");
-    EXPECT_EQ(r.volume, "/volume1");
-    struct stat st;
-    ASSERT_EQ(stat("/volume1/homes/bob", &st), 0);
-    EXPECT_EQ(st.st_mode & 07777, 0755u);
-    EXPECT_EQ(st.st_uid, app.Uid("bob"));
     EXPECT_EQ(Resolve("/home/a", "ghost").ok, 0);
     EXPECT_EQ(NvoLibGetErr(), 403);
     EXPECT_EQ(app.ErrorLines(),
