@@ -1,6 +1,5 @@
 #include <stdlib.h>
 #include <sys/stat.h>
-#include <unistd.h>
 
 #include <memory>
 #include <string>

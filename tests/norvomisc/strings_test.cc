@@ -1,7 +1,6 @@
 // Replacement, case, extensions, sizes, UTF-8 form, hex, splitting and path lists; and the
 // wildcard matcher: its case folding against ICU, the described cases and hostile inputs (its
 // agreement with the recursive definition is the like_compare fuzzer's).
-#include <stdint.h>
 #include <stdlib.h>
 
 #include <algorithm>

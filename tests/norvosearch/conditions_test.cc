@@ -6,7 +6,6 @@
 #include <fcntl.h>
 #include <limits.h>
 #include <stdint.h>
-#include <sys/stat.h>
 #include <time.h>
 #include <unistd.h>
 
