@@ -56,20 +56,10 @@ protected:
         AddToSection("plain", "ftp privilege = ro\n\tsynced = no");
     }
     void AddToSection(const std::string &share, const std::string &lines) {
-        std::string text = ReadAll(QUIB_SHARE_CONF);
+        std::string text = ReadFile(QUIB_SHARE_CONF);
         const std::string head = "[" + share + "]\n";
         text.insert(text.find(head) + head.size(), "\t" + lines + "\n");
         app_.WriteFile(QUIB_SHARE_CONF, text);
-    }
-    static std::string ReadAll(const char *path) {
-        std::string text;
-        if (FILE *f = fopen(path, "r")) {
-            char buf[4096];
-            size_t n;
-            while ((n = fread(buf, 1, sizeof buf, f)) > 0) text.append(buf, n);
-            fclose(f);
-        }
-        return text;
     }
     Appliance app_;
 };

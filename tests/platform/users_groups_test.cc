@@ -8,7 +8,6 @@
 #include <unistd.h>
 
 #include <fstream>
-#include <iterator>
 #include <string>
 #include <tuple>
 #include <utility>
@@ -250,9 +249,7 @@ TEST_F(UsersAndGroups, BadArgumentsAndBrokenDatabases) {
 
     // An entry beyond the first buffer is offered again in a bigger one (up to 16 MiB; the
     // library's tests show a bigger one failing the open).
-    std::ifstream in("/etc/passwd");
-    const std::string passwd((std::istreambuf_iterator<char>(in)), std::istreambuf_iterator<char>());
-    app_.WriteFile("/etc/passwd", passwd + "wide:x:5555:100:" + std::string(100000, 'g') + ":/:/bin/sh\nlast:x:5556:100::/:/bin/sh\n");
+    app_.WriteFile("/etc/passwd", norvo::testing::ReadFile("/etc/passwd") + "wide:x:5555:100:" + std::string(100000, 'g') + ":/:/bin/sh\nlast:x:5556:100::/:/bin/sh\n");
     const Strings names = UserNames(AUTH_LOCAL);
     EXPECT_EQ(Strings(names.end() - 2, names.end()), (Strings{"wide", "last"}));
 }
