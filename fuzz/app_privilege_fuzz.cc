@@ -6,7 +6,6 @@
 #include <stdint.h>
 #include <stdlib.h>
 
-#include <map>
 #include <string>
 #include <string_view>
 #include <vector>

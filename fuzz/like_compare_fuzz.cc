@@ -6,7 +6,6 @@
 // when their default case foldings are equal, whatever byte sequence encoded it.
 #include <stddef.h>
 #include <stdint.h>
-#include <stdlib.h>
 
 #include <string>
 #include <vector>

@@ -10,7 +10,6 @@
 #include <stddef.h>
 #include <stdint.h>
 #include <string.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>

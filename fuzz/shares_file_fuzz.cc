@@ -7,7 +7,6 @@
 #include <stdint.h>
 #include <stdlib.h>
 
-#include <map>
 #include <set>
 #include <string>
 #include <string_view>

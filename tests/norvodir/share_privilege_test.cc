@@ -1,6 +1,5 @@
 #include <unistd.h>
 
-#include <memory>
 #include <string>
 #include <vector>
 

@@ -125,41 +125,38 @@ TEST(ShareChecks, ListDownloadAndUpload) {
     app.AddShare({.name = "nomod", .readWrite = "alice", .restrict = SHARE_RESTRICT_NO_MODIFY});
     app.WriteFile("/volume1/photo/exists.jpg");
 
-    EXPECT_EQ(CheckShareListPrivilege("alice", nullptr, "/photo/x"), 1);
-    EXPECT_EQ(CheckShareListPrivilege("alice", nullptr, "/dropbox"), 0);
-    EXPECT_EQ(CheckShareListPrivilege("admin", nullptr, "/dropbox"), 1);
-    EXPECT_EQ(CheckShareListPrivilege("alice", nullptr, "/nodl"), 1);
-    EXPECT_EQ(CheckShareListPrivilege("bob", nullptr, "/secret"), 0);
-    EXPECT_EQ(CheckShareListPrivilege("ghost", nullptr, "/home/x"), 1);  // homes need no lookup
-    EXPECT_EQ(CheckShareListPrivilege("alice", nullptr, nullptr), 0);
-
-    NvoLibSetErr(0);
-    EXPECT_EQ(CheckShareDownloadPrivilege("alice", nullptr, "/nodl/a"), 0);
-    EXPECT_EQ(NvoLibGetErr(), 407);
-    EXPECT_EQ(CheckShareDownloadPrivilege("alice", nullptr, "/dropbox/a"), 0);
-    EXPECT_EQ(CheckShareDownloadPrivilege("alice", nullptr, "/nomod/a"), 1);
-    EXPECT_EQ(CheckShareDownloadPrivilege("bob", nullptr, "/photo/a"), 1);
-    EXPECT_EQ(CheckShareDownloadPrivilege("alice", nullptr, nullptr), 0);
-    EXPECT_EQ(NvoLibGetErr(), 400);
-
-    int type = 0;
-    EXPECT_EQ(CheckShareUploadPrivilege("bob", nullptr, "/photo/new.jpg", &type), 0);  // read-only
-    EXPECT_EQ(NvoLibGetErr(), 407);
-    EXPECT_EQ(CheckShareUploadPrivilege("alice", nullptr, "/photo/new.jpg", &type), 1);
-    EXPECT_EQ(CheckShareUploadPrivilege("alice", nullptr, "/photo/exists.jpg", &type), 0);
-    EXPECT_EQ(NvoLibGetErr(), 414);
-    type = 1;
-    EXPECT_EQ(CheckShareUploadPrivilege("alice", nullptr, "/photo/exists.jpg", &type), 1);
-    type = 0;
-    EXPECT_EQ(CheckShareUploadPrivilege("alice", nullptr, "/nomod/exists.jpg", &type), 1);
-    EXPECT_EQ(type, 2);
-    // A home path skips the share but not the existence test.
-    type = 0;
-    EXPECT_EQ(CheckShareUploadPrivilege("alice", nullptr, "/home/new.txt", &type), 1);
     app.WriteFile("/volume1/homes/alice/old.txt");
-    EXPECT_EQ(CheckShareUploadPrivilege("alice", nullptr, "/home/old.txt", &type), 0);
-    EXPECT_EQ(NvoLibGetErr(), 414);
-
+    // L: list, D: download, U: upload with the overwrite type given (and what it becomes).
+    const struct {
+        char check;
+        const char *user, *path;
+        int result;
+        int err = 0;  // the library code, when not 0
+        int type = 0, typeAfter = -1;
+    } rows[] = {
+        {'L', "alice", "/photo/x", 1}, {'L', "alice", "/dropbox", 0}, {'L', "admin", "/dropbox", 1},
+        {'L', "alice", "/nodl", 1}, {'L', "bob", "/secret", 0},
+        {'L', "ghost", "/home/x", 1},  // homes need no lookup
+        {'L', "alice", nullptr, 0},
+        {'D', "alice", "/nodl/a", 0, 407}, {'D', "alice", "/dropbox/a", 0}, {'D', "alice", "/nomod/a", 1},
+        {'D', "bob", "/photo/a", 1}, {'D', "alice", nullptr, 0, 400},
+        {'U', "bob", "/photo/new.jpg", 0, 407},  // read-only
+        {'U', "alice", "/photo/new.jpg", 1}, {'U', "alice", "/photo/exists.jpg", 0, 414},
+        {'U', "alice", "/photo/exists.jpg", 1, 0, 1}, {'U', "alice", "/nomod/exists.jpg", 1, 0, 0, 2},
+        // A home path skips the share but not the existence test.
+        {'U', "alice", "/home/new.txt", 1}, {'U', "alice", "/home/old.txt", 0, 414},
+    };
+    for (const auto &row : rows) {
+        NvoLibSetErr(0);
+        int type = row.type;
+        const int got = row.check == 'L'   ? CheckShareListPrivilege(row.user, nullptr, row.path)
+                        : row.check == 'D' ? CheckShareDownloadPrivilege(row.user, nullptr, row.path)
+                                           : CheckShareUploadPrivilege(row.user, nullptr, row.path, &type);
+        const std::string what = std::string(1, row.check) + " " + row.user + " " + (row.path ? row.path : "(null)");
+        EXPECT_EQ(got, row.result) << what;
+        EXPECT_EQ(NvoLibGetErr(), row.err != 0 ? row.err : NvoLibGetErr()) << what;
+        EXPECT_EQ(type, row.typeAfter >= 0 ? row.typeAfter : type) << what;
+    }
     EXPECT_EQ(app.ErrorLines(),
               (Lines{"norvomisc.cpp:# No privilege in path /dropbox",
                      "norvomisc.cpp:# No privilege in path /secret",

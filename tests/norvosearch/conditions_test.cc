@@ -1,6 +1,13 @@
 // The file-index records each condition builds, the chains linking makes, and the factory's
-// results: records are read by walking their links, as the index would.
+// results: records are read by walking their links, as the index would. Then the conditions
+// asked about real files as a walk reads them. Which fields are refused with which code, and
+// what each condition decides on any record, the find_factory fuzzer asserts; how a search
+// joins them, the command's conditions test.
+#include <fcntl.h>
 #include <limits.h>
+#include <stdint.h>
+#include <time.h>
+#include <unistd.h>
 
 #include <functional>
 #include <memory>
@@ -12,6 +19,7 @@
 #include "appliance.h"
 #include "norvo/errors.h"
 #include "norvo/norvosearch.h"
+#include "quib_stat.h"
 
 namespace {
 
@@ -93,21 +101,6 @@ TEST(Chains, AlternativesHeadTheirChainNewestFirst) {
     EXPECT_EQ(Chain(head->getFirstCond()), "{0 ~ *c* |{0 ~ *b* |{0 ~ *a*}}}");
 }
 
-TEST(Chains, ConjunctionLinksFromTheLastRecordOfEachCondition) {
-    std::vector<std::unique_ptr<FindComp>> list;
-    list.emplace_back(new FindUserComp("alice", 1026));
-    list.emplace_back(new FindSizeComp("equal", 100));
-    list.emplace_back(new FindNameComp("x"));
-    list.emplace_back(new FindGroupComp("staff", 7));
-    list.emplace_back(new FindTypeComp(false));
-    for (size_t i = 1; i < list.size(); ++i) {
-        (*list[i - 1])(list[i].get());
-    }
-    (*list.back())(nullptr);
-    EXPECT_EQ(Chain(list[0]->getFirstCond()),
-              "{15 = 1026 |{17 ~ alice &{7 < 105 &{7 >= 95 &{0 ~ *x* &{16 = 7 |{18 ~ staff &{6 = 0}}}}}}}}");
-}
-
 class Factory : public ::testing::Test {
 protected:
     void SetUp() override { app.Basic(); }
@@ -162,30 +155,35 @@ TEST_F(Factory, AppendsTheConditionsOfEachField) {
     }
 }
 
-TEST_F(Factory, RefusesMissingArgumentsAndUnknownOwners) {
-    const std::string huge(10000, 'u');
-    const struct {
-        int field;
-        const char *op;
-        const char *value;
-        int error;
-    } cases[] = {
-        {0, "x", nullptr, 400},      {2, nullptr, nullptr, 400},   {1, nullptr, "dir", 400},
-        {5, nullptr, "1", 400},      {6, nullptr, "1", 400},       {7, nullptr, "1", 400},
-        {8, nullptr, "1", 400},      {9, nullptr, nullptr, 400},   {3, nullptr, nullptr, 400},
-        {3, nullptr, "nobody-here", 403}, {3, nullptr, "", 403},   {3, nullptr, huge.c_str(), 403},
-        {3, nullptr, "\xff\xfe", 403},    {3, nullptr, "staff", 403},
-        {4, nullptr, "no-such-group", 404}, {4, nullptr, "alice", 404}, {4, nullptr, "\xc3", 404},
-    };
-    for (const auto &c : cases) {
-        SCOPED_TRACE(std::to_string(c.field) + " " + (c.value ? std::string(c.value).substr(0, 20) : "(null)"));
-        Owned out;
-        NvoLibSetErr(NVO_ERR_NONE);
-        EXPECT_FALSE(FindFactory::createFindOp(static_cast<Field>(c.field), c.op, c.value, out.list));
-        EXPECT_EQ(NvoLibGetErr(), c.error);
-        EXPECT_TRUE(out.list.empty());
-    }
-    EXPECT_TRUE(app.ErrorLines().empty());
+// Whether the condition lets path through, as a walk asks it: what the records of real files
+// hold, birth times, times beyond 32 bits, folders and links as lstat sees them.
+bool Asks(const std::function<FindComp *()> &make, const std::string &path) {
+    std::unique_ptr<FindComp> condition(make());
+    QUIBSTAT st{};
+    EXPECT_EQ(VLIBCFileLStat(path.c_str(), QUIB_STAT_BASIC | QUIB_STAT_CRTIME, &st), 0) << path;
+    return (*condition)(path.c_str(), st);
+}
+
+TEST(Match, RealFilesAsTheWalkReadsThem) {
+    norvo::testing::Appliance app;
+    app.Basic();
+    const std::string file = "/volume1/public/d/f.txt";
+    app.WriteFile(file, "x").WriteFile("/volume1/public/d/sub/inside", std::string(4096, 'x'));
+    ASSERT_EQ(symlink("/volume1/public/d", "/volume1/public/to-dir"), 0);
+    const long now = static_cast<long>(time(nullptr));
+    EXPECT_TRUE(Asks([=] { return new FindCRTimeComp("after", now - 60); }, file));
+    EXPECT_FALSE(Asks([=] { return new FindCRTimeComp("before", now - 60); }, file));
+    // A folder has a size of its own on disk, but counts as empty; a link to one is no folder.
+    EXPECT_TRUE(Asks([] { return new FindSizeComp("equal", 0); }, "/volume1/public/d/sub"));
+    EXPECT_TRUE(Asks([] { return new FindTypeComp(true); }, "/volume1/public/d/sub/"));
+    EXPECT_FALSE(Asks([] { return new FindTypeComp(true); }, "/volume1/public/to-dir"));
+
+    // Times beyond 32 bits saturate; they never wrap round.
+    const timespec far[2] = {{-(1LL << 33), 0}, {1LL << 33, 0}};  // atime, mtime
+    ASSERT_EQ(utimensat(AT_FDCWD, file.c_str(), far, 0), 0);
+    EXPECT_TRUE(Asks([] { return new FindMTimeComp("after", INT32_MAX); }, file));
+    EXPECT_TRUE(Asks([] { return new FindATimeComp("before", INT32_MIN + 1); }, file));
+    EXPECT_FALSE(FindNameComp("abc")(nullptr, QUIBSTAT{}));
 }
 
 }  // namespace

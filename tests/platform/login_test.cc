@@ -1,6 +1,6 @@
 // Login records: password check against a real crypt hash in shadow, sid issue, the sliding
 // expiry, purging, rollback of failed writes, and refusal of hostile input and of a database
-// that is not ours.
+// that is not ours; and the login state of a CGI request.
 #include <ctype.h>
 #include <stdio.h>
 #include <stdlib.h>
@@ -224,6 +224,76 @@ TEST_F(LoginRecords, ExpiredLoginsArePurgedUnlessTheWriteFails) {
     EXPECT_EQ(Get(old.c_str()), Failed(QUIB_ERR_ACCESS_DENIED));
     EXPECT_EQ(Sql("SELECT count(*) FROM login_session"), "1");
     EXPECT_EQ(UserOf(live), "bob");
+}
+
+// Every byte as %XX, as a client may encode it.
+std::string EncodeAll(const std::string &text) {
+    std::string out;
+    for (unsigned char c : text) out += std::string("%") + "0123456789ABCDEF"[c >> 4] + "0123456789ABCDEF"[c & 0xF];
+    return out;
+}
+
+// The login state of a CGI request: the sid from the cookie "id" or the query parameter "_sid",
+// parsed as browsers and clients really send them, and the account-kind mask.
+class WebManTest : public Login {
+protected:
+    WebManTest() { appliance_.AddUser("CORP\\dave").AddUser("erin@corp.example"); }
+
+    // The sid IsAuthorized accepts for this request ("": unset), "" when refused.
+    std::string Authorize(const std::string &cookie, const std::string &query, int mask = 15) {
+        cookie.empty() ? unsetenv("HTTP_COOKIE") : setenv("HTTP_COOKIE", cookie.c_str(), 1);
+        query.empty() ? unsetenv("QUERY_STRING") : setenv("QUERY_STRING", query.c_str(), 1);
+        WebMan request;
+        if (!request.IsAuthorized("test", mask, 1)) {
+            EXPECT_EQ(VLIBCErrGet(), QUIB_ERR_ACCESS_DENIED);
+            EXPECT_EQ(request.GetLoginUserName() + request.GetLoginSid(), "");
+            return "";
+        }
+        char user[64] = "";
+        EXPECT_EQ(QUIBLoginGet(request.GetLoginSid().c_str(), user, sizeof user), 0);
+        EXPECT_EQ(request.GetLoginUserName(), user);
+        return request.GetLoginSid();
+    }
+};
+
+TEST_F(WebManTest, TheSidComesFromTheIdCookieOrElseTheSidParameter) {
+    const std::string alice = LogIn("alice"), bob = LogIn("bob"), stale = LogIn("admin");
+    ASSERT_EQ(QUIBLoginRemove(stale.c_str()), 0);
+    const std::string huge(100000, 'A');
+    // How the cookie and the query are read the request fuzzer checks against the rules; here
+    // what reaches the login records: attacks on the lookup, and which of two sids is live.
+    struct Case { std::string cookie, query, sid; } cases[] = {
+        {"lang=en; id=" + alice, "", alice}, {"id=" + alice.substr(1), "", ""}, {"id=" + alice + "x", "", ""},
+        {"id=" + alice + "' OR '1'='1", "", ""}, {"id=" + huge, "", ""},
+        {"", "api=x&_sid=" + bob + "&version=1", bob}, {"", "_sid=" + EncodeAll(bob), bob},
+        {"", "_sid=" + bob + "%00", ""}, {"", "_sid=" + bob.substr(0, 31) + "%2", ""},
+        // A browser may still send a stale cookie while the page passes a live sid.
+        {"id=" + stale, "_sid=" + bob, bob}, {"id=garbage'--", "_sid=" + bob, bob}, {"id=" + bob, "_sid=" + stale, bob},
+    };
+    for (const Case &c : cases) {
+        EXPECT_EQ(Authorize(c.cookie, c.query), c.sid) << c.cookie.substr(0, 60) << " | " << c.query.substr(0, 60);
+    }
+    EXPECT_EQ(Authorize("id=" + alice, ""), alice) << "the live login is untouched by all that";
+
+    WebMan request;
+    EXPECT_EQ(request.GetLoginUserName() + request.GetLoginSid(), "");
+    setenv("HTTP_COOKIE", ("id=" + alice).c_str(), 1);
+    ASSERT_TRUE(request.IsAuthorized(nullptr, 15, 0));
+    unsetenv("HTTP_COOKIE");
+    EXPECT_FALSE(request.IsAuthorized(nullptr, 15, 0));
+    EXPECT_EQ(request.GetLoginUserName() + " " + request.GetLoginSid(), "alice " + alice) << "a refusal keeps them";
+}
+
+TEST_F(WebManTest, TheMaskSelectsKindsOfAccount) {
+    const std::string alice = "id=" + LogIn("alice"), admin = "id=" + LogIn("admin");
+    const std::string dave = "id=" + LogIn("CORP\\dave"), erin = "id=" + LogIn("erin@corp.example");
+    struct Case { const std::string &cookie; int mask; bool allowed; } cases[] = {
+        {alice, 0x1, true}, {alice, 0xE, false}, {admin, 0x8, true}, {admin, 0x1, true}, {admin, 0x6, false},
+        {dave, 0x2, true}, {dave, 0xD, false}, {erin, 0x4, true}, {erin, 0xB, false}, {erin, 15, true},
+    };
+    for (const Case &c : cases) {
+        EXPECT_EQ(!Authorize(c.cookie, "", c.mask).empty(), c.allowed) << c.cookie << " mask " << c.mask;
+    }
 }
 
 }  // namespace

@@ -3,7 +3,10 @@
 
 #include <errno.h>
 
+#include <fstream>
+#include <iterator>
 #include <ostream>
+#include <string>
 
 #include "vlibc_err.h"
 
@@ -30,6 +33,12 @@ Outcome OutcomeOf(F &&call) {
     VLIBCErrSetEx(QUIB_ERR_NONE, "", 0);
     const long rc = static_cast<long>(call());
     return {rc, VLIBCErrGet(), errno};
+}
+
+// The whole of a file, byte for byte; "" when it can't be read.
+inline std::string ReadFile(const std::string &path) {
+    std::ifstream in(path, std::ios::binary);
+    return std::string(std::istreambuf_iterator<char>(in), {});
 }
 
 }  // namespace norvo::testing

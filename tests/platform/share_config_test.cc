@@ -1,6 +1,5 @@
 // The shared-folder configuration: smb.conf syntax as administrators write it, the sections
 // that must be skipped rather than half-read, lookups by name and by path, and the cursor.
-#include <errno.h>
 #include <unistd.h>
 
 #include <string>

@@ -1,4 +1,5 @@
-// String lists, their sort orders (against a plain insertion sort) and the tokenizer.
+// String lists, their sort orders (against a plain insertion sort) and the tokenizer; and the
+// error slot: its start, the place it records, and what success leaves in it.
 #include <stdlib.h>
 #include <string.h>
 #include <strings.h>
@@ -13,6 +14,33 @@
 #include "vlibc_szlist.h"
 
 namespace {
+
+// First: a fresh process's slot is empty.
+TEST(ErrorSlot, StartsEmptyAndKeepsTheCallersPlace) {
+    EXPECT_EQ(VLIBCErrGet(), 0);
+    EXPECT_STREQ(VLIBCErrorGetFile(), "");
+    EXPECT_EQ(VLIBCErrorGetLine(), 0);
+
+    int line = __LINE__ + 1;
+    QUIB_SET_ERR(QUIB_ERR_NO_SUCH_USER);
+    EXPECT_EQ(VLIBCErrGet(), QUIB_ERR_NO_SUCH_USER);
+    EXPECT_STREQ(VLIBCErrorGetFile(), "szlist_test.cc");
+    EXPECT_EQ(VLIBCErrorGetLine(), line);
+    VLIBCErrSetEx(QUIB_ERR_NO_SUCH_FILE, nullptr, 7);
+    EXPECT_STREQ(VLIBCErrorGetFile(), "");
+    EXPECT_EQ(VLIBCErrorGetLine(), 7);
+}
+
+TEST(ErrorSlot, PlatformFailureNamesItsSourceAndSuccessKeepsIt) {
+    PSZLIST list = VLIBCSzListAlloc(1);
+    ASSERT_NE(list, nullptr);
+    EXPECT_EQ(VLIBCSzListPush(nullptr, "x"), -1);
+    EXPECT_STREQ(VLIBCErrorGetFile(), "szlist.cc") << "the name, not the build path";
+    EXPECT_GT(VLIBCErrorGetLine(), 0);
+    EXPECT_EQ(VLIBCSzListPush(&list, "ok"), 0);
+    EXPECT_EQ(VLIBCErrGet(), QUIB_ERR_BAD_PARAMETER);
+    VLIBCSzListFree(list);
+}
 
 using Strings = std::vector<std::string>;
 

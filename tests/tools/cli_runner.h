@@ -8,8 +8,8 @@
 
 #include <fcntl.h>
 #include <limits.h>
-#include <poll.h>
 #include <signal.h>
+#include <sys/mman.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -43,91 +43,52 @@ inline std::string NorvoCliPath() {
 
 namespace internal {
 
-// Writes input to fd and reads both output pipes until they close, so neither side can block
-// on a full pipe.
-inline void Pump(int inFd, const std::string &input, int outFd, int errFd, CliResult *result) {
-    size_t written = 0;
-    if (input.empty()) {
-        close(inFd);
-        inFd = -1;
+inline std::string ReadWhole(int fd) {
+    std::string text;
+    char buf[65536];
+    for (ssize_t got; (got = pread(fd, buf, sizeof buf, static_cast<off_t>(text.size()))) > 0;) {
+        text.append(buf, static_cast<size_t>(got));
     }
-    while (outFd >= 0 || errFd >= 0) {
-        pollfd fds[3] = {{outFd, POLLIN, 0}, {errFd, POLLIN, 0}, {inFd, POLLOUT, 0}};
-        if (poll(fds, 3, -1) < 0) {
-            if (errno == EINTR) continue;
-            break;
-        }
-        char buf[65536];
-        int *readFds[2] = {&outFd, &errFd};
-        std::string *sinks[2] = {&result->out, &result->err};
-        for (int i = 0; i < 2; ++i) {
-            if (*readFds[i] >= 0 && fds[i].revents != 0) {
-                const ssize_t got = read(*readFds[i], buf, sizeof buf);
-                if (got > 0) {
-                    sinks[i]->append(buf, static_cast<size_t>(got));
-                } else if (got == 0 || errno != EINTR) {
-                    close(*readFds[i]);
-                    *readFds[i] = -1;
-                }
-            }
-        }
-        if (inFd >= 0 && fds[2].revents != 0) {
-            const ssize_t put = write(inFd, input.data() + written, input.size() - written);
-            if (put > 0) written += static_cast<size_t>(put);
-            if (put < 0 || written == input.size()) {
-                close(inFd);
-                inFd = -1;
-            }
-        }
-    }
-    if (inFd >= 0) close(inFd);
+    return text;
 }
 
 }  // namespace internal
 
-// Runs norvo with args (argv[0] is added) and input on its stdin.
+// Runs norvo with args (argv[0] is added) and input on its stdin. The command's streams are
+// files in memory: neither side can block on a full pipe, and a command that leaves its input
+// unread is no matter.
 inline CliResult RunNorvo(const std::vector<std::string> &args, const std::string &input = "") {
     CliResult result;
-    const std::string binary = NorvoCliPath();
-    std::vector<std::string> owned;
-    owned.push_back(binary);
+    std::vector<std::string> owned{NorvoCliPath()};
     owned.insert(owned.end(), args.begin(), args.end());
     std::vector<char *> argv;
     for (std::string &arg : owned) argv.push_back(arg.data());
     argv.push_back(nullptr);
 
-    int in[2], out[2], err[2];
-    if (pipe2(in, O_CLOEXEC) != 0 || pipe2(out, O_CLOEXEC) != 0 || pipe2(err, O_CLOEXEC) != 0) {
-        result.err = "pipe failed";
-        return result;
-    }
-    signal(SIGPIPE, SIG_IGN);  // a command that stops reading its stdin must not kill the test
-    const pid_t pid = fork();
+    const int fds[3] = {memfd_create("in", MFD_CLOEXEC), memfd_create("out", MFD_CLOEXEC),
+                        memfd_create("err", MFD_CLOEXEC)};
+    const bool ready = fds[0] >= 0 && fds[1] >= 0 && fds[2] >= 0 &&
+                       pwrite(fds[0], input.data(), input.size(), 0) == static_cast<ssize_t>(input.size());
+    const pid_t pid = ready ? fork() : -1;
     if (pid == 0) {
-        dup2(in[0], 0);
-        dup2(out[1], 1);
-        dup2(err[1], 2);
+        for (int i = 0; i < 3; ++i) dup2(fds[i], i);
         execv(argv[0], argv.data());
         _exit(127);
     }
-    close(in[0]);
-    close(out[1]);
-    close(err[1]);
-    if (pid < 0) {
-        close(in[1]);
-        close(out[0]);
-        close(err[0]);
-        result.err = "fork failed";
-        return result;
-    }
-    internal::Pump(in[1], input, out[0], err[0], &result);
     int status = 0;
-    while (waitpid(pid, &status, 0) < 0 && errno == EINTR) {
+    while (pid > 0 && waitpid(pid, &status, 0) < 0 && errno == EINTR) {
     }
-    if (WIFEXITED(status)) {
+    if (pid < 0) {
+        result.err = "memfd or fork failed";
+    } else if (WIFEXITED(status)) {
         result.exitStatus = WEXITSTATUS(status);
     } else if (WIFSIGNALED(status)) {
         result.signal = WTERMSIG(status);
+    }
+    result.out = fds[1] >= 0 ? internal::ReadWhole(fds[1]) : "";
+    result.err += fds[2] >= 0 ? internal::ReadWhole(fds[2]) : "";
+    for (int fd : fds) {
+        if (fd >= 0) close(fd);
     }
     return result;
 }
