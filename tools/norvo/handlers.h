@@ -14,5 +14,6 @@ int RunMounts(const Invocation &inv);      // cmd_enum.cc
 int RunWhois(const Invocation &inv);       // cmd_enum.cc
 int RunConditions(const Invocation &inv);  // cmd_conditions.cc
 int RunLs(const Invocation &inv);          // cmd_ls.cc
+int RunTasks(const Invocation &inv);       // cmd_tasks.cc
 
 }  // namespace norvo::cli
