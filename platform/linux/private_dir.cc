@@ -42,7 +42,11 @@ int OpenOrMake(int parent, const std::string &name, bool mayCreate, mode_t mode,
         fd.Reset(openat(parent, name.c_str(), DirFlags()));
     }
     if (!fd.IsOpen()) {
-        return CodeOfOpen(errno);
+        const int err = errno;
+        if (*made) {
+            unlinkat(parent, name.c_str(), AT_REMOVEDIR);  // never left behind half made
+        }
+        return CodeOfOpen(err);
     }
     *out = std::move(fd);
     return QUIB_ERR_NONE;
