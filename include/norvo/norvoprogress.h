@@ -18,7 +18,8 @@ NORVO_API bool WaitForTaskDataReady(OBX::Task *task, const char *key, unsigned l
 // Waits until mgr knows taskId (a null mgr sleeps through the limit), then waits for the
 // property with the whole limit again. The task object it reads is never deleted (intended:
 // callers have always relied on nothing more).
-NORVO_API bool WaitForMgrTaskDataReady(OBX::TaskMgr *mgr, const char *taskId, const char *key, unsigned limit);
+NORVO_API bool WaitForMgrTaskDataReady(OBX::TaskMgr *mgr, const char *taskId, const char *key,
+                                       unsigned limit);
 // As WaitForTaskDataReady, except that a null value is then asked for member, which a null value
 // never has; so in effect this waits for the property alone. Intended: kept as callers know it.
 NORVO_API bool WaitForTaskDataKeyReady(OBX::Task *task, const char *key, const char *member, unsigned limit);

@@ -123,8 +123,8 @@ bool Fail(int code) {
 
 // Opens the owner's store, creating directory and database when the caller is root.
 int OpenStore(const char *owner, TaskStore *store) {
-    if (!norvo::platform::IsAcceptableName(owner) || strchr(owner, '/') != nullptr || strcmp(owner, ".") == 0 ||
-        strcmp(owner, "..") == 0) {
+    if (!norvo::platform::IsAcceptableName(owner) || strchr(owner, '/') != nullptr ||
+        strcmp(owner, ".") == 0 || strcmp(owner, "..") == 0) {
         return QUIB_ERR_BAD_PARAMETER;
     }
     norvo::platform::NssUser user;
@@ -150,8 +150,8 @@ int OpenStore(const char *owner, TaskStore *store) {
     if (code != QUIB_ERR_NONE) {
         return code;
     }
-    return norvo::platform::OpenSqlite(std::string(QUIB_TASK_DIR "/") + user.name + "/" QUIB_TASK_DB_NAME, kSchema,
-                                       &store->db);
+    return norvo::platform::OpenSqlite(std::string(QUIB_TASK_DIR "/") + user.name + "/" QUIB_TASK_DB_NAME,
+                                       kSchema, &store->db);
 }
 
 }  // namespace
@@ -235,9 +235,8 @@ bool Task::reload() {
 }
 
 Json::Value Task::getProperty(const char *key) const {
-    return Guarded(Json::Value(), [&] {
-        return key == nullptr ? Json::Value() : impl_->props.get(key, Json::Value());
-    });
+    return Guarded(Json::Value(),
+                   [&] { return key == nullptr ? Json::Value() : impl_->props.get(key, Json::Value()); });
 }
 
 bool Task::beginUpdate() {

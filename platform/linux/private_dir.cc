@@ -28,7 +28,8 @@ int DirFlags() {
 
 // Opens name in parent, making it with mode when mayCreate and it is missing. The mode is set
 // with fchmod on what this call made: mkdir's is cut by the umask. *made says whether it did.
-int OpenOrMake(int parent, const std::string &name, bool mayCreate, mode_t mode, FileDescriptor *out, bool *made) {
+int OpenOrMake(int parent, const std::string &name, bool mayCreate, mode_t mode, FileDescriptor *out,
+               bool *made) {
     *made = false;
     FileDescriptor fd(openat(parent, name.c_str(), DirFlags()));
     if (!fd.IsOpen() && errno == ENOENT && mayCreate) {
@@ -159,7 +160,8 @@ int CheckPrivateDatabase(int dir, const std::string &name, bool create) {
     return CheckDatabase(dir, name, 0, 0, create);
 }
 
-int OpenOwnerDir(int parent, const std::string &name, uid_t uid, gid_t gid, bool create, FileDescriptor *dir) {
+int OpenOwnerDir(int parent, const std::string &name, uid_t uid, gid_t gid, bool create,
+                 FileDescriptor *dir) {
     if (name.empty() || name == "." || name == ".." || name.find('/') != std::string::npos ||
         name.find('\0') != std::string::npos) {
         return QUIB_ERR_BAD_PARAMETER;

@@ -48,13 +48,15 @@ std::string Compact(const Json::Value &value) {
 
 // The worker of "start": becomes the user for good, then reports steps of progress into its
 // own record and marks it finished. It never returns.
-[[noreturn]] void Work(const std::string &user, const std::string &id, int steps, uid_t uid, gid_t gid, int ready) {
+[[noreturn]] void Work(const std::string &user, const std::string &id, int steps, uid_t uid, gid_t gid,
+                       int ready) {
     char go = 0;
     const bool told = read(ready, &go, 1) == 1;
     close(ready);
     const int null = open("/dev/null", O_RDWR | O_CLOEXEC);
     if (!told || null < 0 || setsid() < 0 || dup2(null, 0) < 0 || dup2(null, 1) < 0 || dup2(null, 2) < 0 ||
-        initgroups(user.c_str(), gid) != 0 || setresgid(gid, gid, gid) != 0 || setresuid(uid, uid, uid) != 0) {
+        initgroups(user.c_str(), gid) != 0 || setresgid(gid, gid, gid) != 0 ||
+        setresuid(uid, uid, uid) != 0) {
         _exit(1);
     }
     OBX::TaskMgr mgr(user.c_str());
@@ -157,8 +159,8 @@ int RunTasks(const Invocation &inv) {
     const std::string &action = inv.arguments[0];
     const std::vector<std::string> rest(inv.arguments.begin() + 1, inv.arguments.end());
     const size_t wanted = action == "show" || action == "kill" || action == "start" ? 1
-                          : action == "wait"                                         ? 2
-                                                                                     : 0;
+                          : action == "wait"                                        ? 2
+                                                                                    : 0;
     if (action != "list" && action != "clean" && wanted == 0) {
         return ReportUsageError(inv.command, "unknown action '" + action + "'");
     }
