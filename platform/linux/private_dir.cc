@@ -10,8 +10,11 @@
 namespace norvo::platform {
 namespace {
 
+// A file with a second name may be someone else's file linked in (without protected_hardlinks):
+// refused, as SQLite would write through it.
 bool IsOwnedOnly(const struct stat &st, mode_t type, uid_t uid, mode_t othersMay) {
-    return (st.st_mode & S_IFMT) == type && st.st_uid == uid && (st.st_mode & othersMay) == 0;
+    return (st.st_mode & S_IFMT) == type && st.st_uid == uid && (st.st_mode & othersMay) == 0 &&
+           (type != S_IFREG || st.st_nlink == 1);
 }
 
 // A link or a non-directory where a directory must be is a refusal, not a system failure.
@@ -136,7 +139,7 @@ int CheckDatabase(int dir, const std::string &name, uid_t uid, gid_t gid, bool c
             }
             return VLIBCErrFromErrno(errno);
         }
-        if (!IsOwnedOnly(st, S_IFREG, uid, 077) && !IsOwnedOnly(st, S_IFREG, 0, 077)) {
+        if (!IsOwnedOnly(st, S_IFREG, uid, 077)) {
             return QUIB_ERR_ACCESS_DENIED;
         }
     }

@@ -37,9 +37,10 @@ namespace norvo::platform {
 [[nodiscard]] int OpenOwnerDir(int parent, const std::string &name, uid_t uid, gid_t gid, bool create,
                                FileDescriptor *dir);
 
-// CheckPrivateDatabase for a database of uid's in a directory of OpenOwnerDir: the database is
-// uid's (made uid:gid 0600 when create is set), a companion uid's or root's (SQLite run by root
-// hands the journal it makes to the database's owner, but a crash may leave one behind first).
+// CheckPrivateDatabase for a database of uid's in a directory of OpenOwnerDir: the database and
+// its companions are uid's (SQLite run by root hands the journal it makes to the database's
+// owner); root makes the database uid:gid 0600 when create is set. Files with a second name
+// are refused by both checks.
 [[nodiscard]] int CheckOwnerDatabase(int dir, const std::string &name, uid_t uid, gid_t gid, bool create);
 
 }  // namespace norvo::platform

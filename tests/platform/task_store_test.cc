@@ -76,9 +76,11 @@ TEST_F(TaskStore, TheOwnersDirectoryIsTheOwnersAlone) {
         {"a database others may read", "chmod 0640 " QUIB_TASK_DIR "/alice/tasks.db"},
         {"a journal of bob's", "touch " QUIB_TASK_DIR "/alice/tasks.db-journal && chown bob " QUIB_TASK_DIR "/alice/tasks.db-journal"},
         {"a top others may write", "chmod 0733 " QUIB_TASK_DIR},
+        {"a database with a second name", "ln " QUIB_TASK_DIR "/alice/tasks.db /run/x"},
+        {"a journal of root's", "install -m 600 /dev/null " QUIB_TASK_DIR "/alice/tasks.db-journal"},
     };
     for (const Case &c : cases) {
-        ASSERT_EQ(system("rm -rf /run/b " QUIB_TASK_DIR), 0);
+        ASSERT_EQ(system("rm -rf /run/b /run/x " QUIB_TASK_DIR), 0);
         ASSERT_TRUE(OBX::TaskMgr("alice").isOpen());
         ASSERT_EQ(system(c.command), 0) << c.what;
         EXPECT_EQ(OUTCOME(OBX::TaskMgr("alice").isOpen()), (Outcome{0, QUIB_ERR_ACCESS_DENIED})) << c.what;
