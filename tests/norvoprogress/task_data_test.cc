@@ -115,7 +115,7 @@ TEST_F(TaskData, WaitsCountPassesAndSeeAnotherProcessWrite) {
     };
     for (const Case &c : cases) {
         const std::string name = std::to_string(c.fn) + "/" + std::to_string(c.limit) + "/" + c.before + "/" + c.after;
-        OBX::TaskMgr("alice").getTask(kId) ? (void)Tasks(OBX::TaskMgr("alice").getTask(kId))->remove() : void();
+        if (Tasks old{OBX::TaskMgr("alice").getTask(kId)}) old->remove();
         Writer writer(app_.Uid("alice"), app_.Gid("users"));
         for (const char *command = c.before; *command != '\0'; ++command) ASSERT_TRUE(writer.Do(*command)) << name;
         // The waiter is a process of its own: the manager's wait keeps the task it read.
