@@ -122,4 +122,11 @@ mkdir -p /volume1/public/names
 touch "/volume1/public/names/a${newline}b" '/volume1/public/names/a\x0Ab'
 show "A name with a real line break prints escaped, apart from the four characters \\x0A" \
     ls --user alice /public/names
+show "A background task of alice's reports progress into her task store" \
+    tasks --user alice start Tovana_demo --steps 3
+show "Another request waits until the task has written its progress (limit 300: up to 3 s)" \
+    tasks --user alice wait Tovana_demo progress --limit 300
+sleep 1
+show "The task has finished; a clean-up keeps it until it is two days old" \
+    tasks --user alice clean
 printf '\nEnd of the tour.\n'

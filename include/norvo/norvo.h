@@ -4,6 +4,7 @@
 #include "norvo/norvodir.h"
 #include "norvo/norvoenum.h"
 #include "norvo/norvomisc.h"
+#include "norvo/norvoprogress.h"
 #include "norvo/norvosearch.h"
 #include "norvo/nvoman.h"
 #include "norvo/pathinfo.h"

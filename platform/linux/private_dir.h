@@ -2,6 +2,8 @@
 // rollback journal is rolled in by the next writer), so a database of ours may only live in a
 // directory nobody but root can write, and only files root made there are used.
 #pragma once
+#include <sys/types.h>
+
 #include <string>
 
 #include "locked_file.h"
@@ -22,5 +24,23 @@ namespace norvo::platform {
 // missing (and not created); QUIB_ERR_ACCESS_DENIED for a file of the wrong type, owner or
 // mode; another platform code on failure.
 [[nodiscard]] int CheckPrivateDatabase(int dir, const std::string &name, bool create);
+
+// The same walk for a directory that everyone may pass through but only root may change (the
+// parent of per-user directories): any caller may open it; made root:root 0711 when create is
+// set (by root only; the mode is set exactly, whatever the umask).
+[[nodiscard]] int OpenPassageDir(const std::string &path, bool create, FileDescriptor *dir);
+
+// The directory name (one component) in parent that belongs to uid alone: a directory, not a
+// link, owned by uid with no group or other bits. When create is set and it is missing, root
+// makes it uid:gid 0700; another caller gets QUIB_ERR_NO_SUCH_FILE. Callers other than root and
+// uid get QUIB_ERR_ACCESS_DENIED. Codes as OpenPrivateDir.
+[[nodiscard]] int OpenOwnerDir(int parent, const std::string &name, uid_t uid, gid_t gid, bool create,
+                               FileDescriptor *dir);
+
+// CheckPrivateDatabase for a database of uid's in a directory of OpenOwnerDir: the database and
+// its companions are uid's (SQLite run by root hands the journal it makes to the database's
+// owner); root makes the database uid:gid 0600 when create is set. Files with a second name
+// are refused by both checks.
+[[nodiscard]] int CheckOwnerDatabase(int dir, const std::string &name, uid_t uid, gid_t gid, bool create);
 
 }  // namespace norvo::platform

@@ -7,4 +7,5 @@ inline constexpr char kNvoMan[] = "nvoman.cpp";
 inline constexpr char kNorvoMisc[] = "norvomisc.cpp";
 inline constexpr char kNorvoEnum[] = "norvoenum.cpp";
 inline constexpr char kNorvoSearch[] = "norvosearch.cpp";
+inline constexpr char kNorvoProgress[] = "norvoprogress";
 }  // namespace norvo

@@ -50,7 +50,7 @@ bool Passes(_enum_ignore_err_ mode, int err) {
 // One directory being read: its names (NUL-separated, in reader order), the next one to visit,
 // and the lengths the walk's two path strings have while it is the current directory.
 struct Level {
-    OwnedFd dir;  // not open while the level is parked deep above the current one
+    OwnedFd dir;    // not open while the level is parked deep above the current one
     dev_t dev = 0;  // the directory's identity, taken when it is parked
     ino_t ino = 0;
     std::string names;

@@ -16,6 +16,7 @@
 #include <fstream>
 #include <functional>
 #include <map>
+#include <memory>
 #include <set>
 #include <sstream>
 
@@ -24,6 +25,7 @@
 #include "appliance.h"
 #include "faults.h"
 #include "norvo/norvo.h"
+#include "obx_task.h"
 #include "quib_fs.h"
 #include "quib_login.h"
 #include "quib_paths.h"
@@ -133,6 +135,19 @@ std::string Names(const std::list<DIRENTRY_INFO> &entries) {
         names += entry.name + " ";
     }
     return names;
+}
+
+// Tovana_1: two days old, data "d" at 0.25, finished or not.
+void TaskReady(bool finished) {
+    OBX::TaskMgr mgr("alice");
+    std::unique_ptr<OBX::Task> task(mgr.getTask("Tovana_1"));
+    if (task == nullptr) {
+        task.reset(mgr.createTask("Tovana_1", getpid()));
+    }
+    ASSERT_TRUE(task && task->setCreateTime(time(nullptr) - 200000) && SaveTaskData(task.get(), Json::Value("d"), 0.25f));
+    if (finished) {
+        ASSERT_TRUE(task->setFinished());
+    }
 }
 
 const Op kOps[] = {
@@ -359,6 +374,48 @@ const Op kOps[] = {
      [] {
          if (!fs::exists("/volume1/photo/vol")) g_app->AddVolume("/volume1/photo/vol").MountDeadRemote("/volume1/photo/nas2");
      }},
+    {"TaskMgrOpen",  // root makes the owner's directory and database on first use
+     [] {
+         OBX::TaskMgr mgr("alice");
+         return Expect(mgr.isOpen(), !mgr.hasTask("Tovana_1"));
+     },
+     kPlatformSlot, [] { fs::remove_all(QUIB_TASK_DIR); },
+     [] {
+         // Made whole or not at all: never a directory left as root's.
+         struct stat st;
+         return stat(QUIB_TASK_DIR "/alice", &st) != 0 || st.st_uid == getpwnam("alice")->pw_uid
+                    ? std::string()
+                    : "directory of uid " + std::to_string(st.st_uid);
+     }},
+    {"TaskGet",
+     [] {
+         OBX::TaskMgr mgr("alice");
+         const std::unique_ptr<OBX::Task> task(mgr.getTask("Tovana_1"));
+         return Expect(task != nullptr, task && task->getProperty("data") == "d" && task->isFinished());
+     },
+     kPlatformSlot, [] { TaskReady(true); }},
+    {"SaveTaskData",
+     [] {
+         OBX::TaskMgr mgr("alice");
+         const std::unique_ptr<OBX::Task> task(mgr.getTask("Tovana_1"));
+         const bool ok = SaveTaskData(task.get(), Json::Value("new"), 0.5f);
+         const std::unique_ptr<OBX::Task> saved(OBX::TaskMgr("alice").getTask("Tovana_1"));
+         return Expect(ok, saved && saved->getProperty("data") == "new");
+     },
+     kPlatformSlot, [] { TaskReady(false); },
+     [] {
+         // Both properties or neither.
+         const std::unique_ptr<OBX::Task> task(OBX::TaskMgr("alice").getTask("Tovana_1"));
+         const std::string data = task ? task->getProperty("data").asString() : "";
+         const double progress = task ? task->getProperty("progress").asDouble() : 0;
+         return (data == "d" && progress == 0.25) || (data == "new" && progress == 0.5) ? "" : "torn: " + data;
+     }},
+    {"CleanTimeOutTasks",
+     [] {
+         CleanTimeOutTasks("alice");
+         return Expect(true, !OBX::TaskMgr("alice").hasTask("Tovana_1"));
+     },
+     kNoSlot, [] { TaskReady(true); }},
 };
 
 // Runs op with call n failing with err for n = 1, 2, ... until a run gets through.

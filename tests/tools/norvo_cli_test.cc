@@ -208,6 +208,25 @@ TEST_F(NorvoCliTest, LoginGivesASidThatDomainPrivilegesAccept) {
     EXPECT_FALSE(RunJson({"login", "--user", "alice", "--password", "wrong"}, 1)["success"].asBool());
 }
 
+TEST_F(NorvoCliTest, TasksStartWaitKillAndList) {
+    const auto finished = [&](const std::string &id) {
+        for (int tries = 0; tries < 400; ++tries, usleep(25000))
+            if (RunJson({"tasks", "--user", "alice", "show", id})["data"]["finished"].asBool()) return true;
+        return false;
+    };
+    EXPECT_GT(RunJson({"tasks", "--user", "alice", "start", "Tovana_1", "--steps", "2"})["data"]["pid"].asInt(), 0);
+    EXPECT_TRUE(RunJson({"tasks", "--user", "alice", "wait", "Tovana_1", "progress", "--limit", "3000"})["data"]["ready"].asBool());
+    ASSERT_TRUE(finished("Tovana_1"));
+    EXPECT_EQ(RunJson({"tasks", "--user", "alice", "show", "Tovana_1"})["data"]["progress"].asDouble(), 1.0);
+    EXPECT_EQ(RunNorvo({"tasks", "--user", "alice", "kill", "Tovana_1"}).exitStatus, 1) << "finished: never signalled";
+    RunJson({"tasks", "--user", "alice", "start", "Tovana_2", "--steps", "1000"});
+    EXPECT_EQ(RunNorvo({"tasks", "--user", "alice", "kill", "Tovana_2"}).exitStatus, 0);
+    EXPECT_TRUE(finished("Tovana_2")) << "its worker is gone";
+    EXPECT_EQ(RunJson({"tasks", "--user", "alice", "clean"})["data"]["tasks"].size(), 2u) << "both too young";
+    EXPECT_EQ(RunNorvo({"tasks", "--user", "../alice", "list"}).exitStatus, 1);
+    EXPECT_EQ(RunNorvo({"tasks", "--user", "alice", "frob"}).exitStatus, 2);
+}
+
 TEST_F(NorvoCliTest, UsageErrorsExitTwoAndSayWhy) {
     const std::vector<std::pair<Strings, std::string>> cases = {
         {{}, "norvo: no command given"},

@@ -200,6 +200,21 @@ std::vector<CommandDef> MakeCommands() {
          {{"user", "USER", true, kUserHelp}},
          {{"PATH", "an absolute real directory, e.g. /volume1/photo"}},
          RunSubdirs},
+        {"tasks",
+         "a user's background tasks: list, show, wait, kill, clean, start",
+         "Works on USER's task records (the task store). ACTION is one of:\n"
+         "  list             every task: finished or running, and its progress\n"
+         "  show ID          the record: pid, creation time, finished, \"progress\" and \"data\"\n"
+         "  wait ID KEY      WaitForMgrTaskDataReady with --limit (10 a pass of 100 ms)\n"
+         "  kill ID          DoKill of the task's process; a finished task is never signalled\n"
+         "  clean            CleanTimeOutTasks: finished \"Tovana_\" tasks two days old go\n"
+         "  start ID         a demo worker that runs as USER and saves --steps steps of progress\n"
+         "A task whose process has gone counts as finished.",
+         {{"user", "USER", true, kUserHelp},
+          {"limit", "N", false, "the wait limit (default 100, about a second)"},
+          {"steps", "N", false, "the demo worker's steps, 200 ms each (default 5)"}},
+         {{"ACTION", "list, show, wait, kill, clean or start"}, {"ARG...", "ID, or ID KEY for wait"}},
+         RunTasks},
     };
 }
 

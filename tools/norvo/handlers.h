@@ -16,5 +16,6 @@ int RunConditions(const Invocation &inv);  // cmd_conditions.cc
 int RunLs(const Invocation &inv);          // cmd_ls.cc
 int RunWalk(const Invocation &inv);        // cmd_walk.cc
 int RunSubdirs(const Invocation &inv);     // cmd_subdirs.cc
+int RunTasks(const Invocation &inv);       // cmd_tasks.cc
 
 }  // namespace norvo::cli
