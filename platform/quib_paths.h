@@ -9,4 +9,6 @@
 #define QUIB_LOGIN_DIR "/run/norvo"                                 // root's own, 0700
 #define QUIB_LOGIN_DB_NAME "quib_login.db"                          // login records (SQLite)
 #define QUIB_LOGIN_DB QUIB_LOGIN_DIR "/" QUIB_LOGIN_DB_NAME
+#define QUIB_AUTOBLOCK_DB_NAME "autoblock.db"                          // failed logins per address (SQLite)
+#define QUIB_AUTOBLOCK_DB QUIB_LOGIN_DIR "/" QUIB_AUTOBLOCK_DB_NAME
 #define QUIB_ADMIN_GROUP "administrators"

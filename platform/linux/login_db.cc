@@ -1,98 +1,17 @@
 // SQLite plumbing of the login records.
 #include "login_db.h"
 
-#include "locked_file.h"
-#include "private_dir.h"
 #include "quib_paths.h"
 #include "vlibc_err.h"
 
 namespace norvo::platform {
 namespace {
 
-constexpr int kBusyTimeoutMs = 5000;
-
 constexpr char kSchema[] =
     "CREATE TABLE IF NOT EXISTS login_session("
     "sid TEXT PRIMARY KEY NOT NULL, user TEXT NOT NULL, remote_addr TEXT NOT NULL, "
     "created INTEGER NOT NULL, last_active INTEGER NOT NULL, expires INTEGER NOT NULL);"
     "CREATE INDEX IF NOT EXISTS login_session_expires ON login_session(expires);";
-
-struct StatementFinalizer {
-    void operator()(sqlite3_stmt *statement) const { sqlite3_finalize(statement); }
-};
-using Statement = std::unique_ptr<sqlite3_stmt, StatementFinalizer>;
-
-// The one translation of SQLite result codes into platform codes.
-int CodeOfSqlite(int rc) {
-    switch (rc & 0xFF) {
-        case SQLITE_OK:
-        case SQLITE_DONE:
-        case SQLITE_ROW:
-            return QUIB_ERR_NONE;
-        case SQLITE_NOMEM:
-            return QUIB_ERR_NO_MEMORY;
-        case SQLITE_FULL:
-            return QUIB_ERR_NO_SPACE;
-        case SQLITE_READONLY:
-            return QUIB_ERR_READ_ONLY_FS;
-        case SQLITE_PERM:
-        case SQLITE_AUTH:
-            return QUIB_ERR_ACCESS_DENIED;
-        default:
-            return QUIB_ERR_FAILED;
-    }
-}
-
-int Prepare(sqlite3 *db, const char *sql, Statement *out) {
-    sqlite3_stmt *raw = nullptr;
-    const int rc = sqlite3_prepare_v2(db, sql, -1, &raw, nullptr);
-    out->reset(raw);
-    return CodeOfSqlite(rc);
-}
-
-int BindText(sqlite3_stmt *statement, int index, const std::string &text) {
-    return CodeOfSqlite(
-        sqlite3_bind_text(statement, index, text.c_str(), static_cast<int>(text.size()), SQLITE_TRANSIENT));
-}
-
-// Runs a statement that returns no rows.
-int RunToEnd(sqlite3_stmt *statement) {
-    const int rc = sqlite3_step(statement);
-    return rc == SQLITE_DONE ? QUIB_ERR_NONE : CodeOfSqlite(rc);
-}
-
-int Exec(sqlite3 *db, const char *sql) {
-    return CodeOfSqlite(sqlite3_exec(db, sql, nullptr, nullptr, nullptr));
-}
-
-// A write transaction that rolls back unless committed.
-class Transaction {
-public:
-    explicit Transaction(sqlite3 *db) : db_(db) {}
-    ~Transaction() {
-        if (open_) {
-            sqlite3_exec(db_, "ROLLBACK", nullptr, nullptr, nullptr);
-        }
-    }
-    Transaction(const Transaction &) = delete;
-    Transaction &operator=(const Transaction &) = delete;
-
-    // IMMEDIATE: take the write lock before reading, so a refresh never races a purge.
-    int Begin() {
-        const int code = Exec(db_, "BEGIN IMMEDIATE");
-        open_ = code == QUIB_ERR_NONE;
-        return code;
-    }
-    int Commit() {
-        const int code = Exec(db_, "COMMIT");
-        open_ = code != QUIB_ERR_NONE;
-        return code;
-    }
-
-private:
-    sqlite3 *db_;
-    bool open_ = false;
-};
 
 int PurgeExpired(sqlite3 *db, time_t now) {
     Statement purge;
@@ -106,25 +25,7 @@ int PurgeExpired(sqlite3 *db, time_t now) {
 }  // namespace
 
 int OpenLoginDb(bool create, LoginDb *db) {
-    // The database is made here rather than by SQLite so that it is born 0600 whatever the
-    // umask; see private_dir.h for why its directory is checked every time.
-    FileDescriptor dir;
-    int code = OpenPrivateDir(QUIB_LOGIN_DIR, create, &dir);
-    if (code == QUIB_ERR_NONE) {
-        code = CheckPrivateDatabase(dir.Get(), QUIB_LOGIN_DB_NAME, create);
-    }
-    if (code != QUIB_ERR_NONE) {
-        return code;
-    }
-    sqlite3 *raw = nullptr;
-    const int rc =
-        sqlite3_open_v2(QUIB_LOGIN_DB, &raw, SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOFOLLOW, nullptr);
-    db->reset(raw);
-    if (rc != SQLITE_OK) {
-        return CodeOfSqlite(rc);
-    }
-    sqlite3_busy_timeout(raw, kBusyTimeoutMs);
-    return Exec(raw, kSchema);
+    return OpenPrivateSqlite(QUIB_LOGIN_DIR, QUIB_LOGIN_DB_NAME, create, kSchema, db);
 }
 
 int InsertLogin(sqlite3 *db, const LoginRecord &record, time_t now) {

@@ -7,18 +7,15 @@
 // Times are seconds since the epoch. Each call opens the database and closes it again: CGI
 // processes live for one request.
 #pragma once
-#include <sqlite3.h>
 #include <time.h>
 
-#include <memory>
 #include <string>
+
+#include "sqlite_db.h"
 
 namespace norvo::platform {
 
-struct SqliteCloser {
-    void operator()(sqlite3 *db) const { sqlite3_close_v2(db); }
-};
-using LoginDb = std::unique_ptr<sqlite3, SqliteCloser>;
+using LoginDb = SqliteDb;
 
 struct LoginRecord {
     std::string sid;
