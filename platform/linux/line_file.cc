@@ -47,7 +47,7 @@ int VLIBCFileAddLine(const char *file, const char *line) {
             return -1;
         }
         FileDescriptor fd;
-        if (const int code = norvo::platform::OpenOwnFile(file, O_WRONLY | O_CREAT, &fd)) {
+        if (const int code = norvo::platform::OpenOwnFile(file, O_RDWR | O_CREAT, &fd)) {
             QUIB_SET_ERR(code);
             return -1;
         }
