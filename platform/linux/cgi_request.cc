@@ -31,7 +31,9 @@ int HexValue(char c) {
 bool PercentDecode(std::string_view text, std::string *out) {
     out->clear();
     for (size_t i = 0; i < text.size(); ++i) {
-        if (text[i] == '+') {
+        if (text[i] == '\0') {
+            return false;  // as an escaped one below
+        } else if (text[i] == '+') {
             *out += ' ';
         } else if (text[i] != '%') {
             *out += text[i];

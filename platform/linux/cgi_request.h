@@ -17,8 +17,8 @@ using NameValues = std::vector<std::pair<std::string, std::string>>;
 // Splits an application/x-www-form-urlencoded text (a query string or a POST body) at '&' into
 // percent-decoded name and value pairs, in order ('+' is a space; a piece without '=' has the
 // value ""; empty pieces are skipped). false, with *pairs cleared, when any piece holds a '%'
-// without two hex digits or an escaped NUL (it would cut the value short wherever it is used
-// as a C string).
+// without two hex digits or a NUL, escaped or raw (it would cut the value short wherever it is
+// used as a C string).
 [[nodiscard]] bool ParseUrlEncoded(std::string_view text, NameValues *pairs);
 
 // The cookies of a Cookie header whose names are tokens, in order, each value with blanks and

@@ -76,6 +76,7 @@ TEST_F(WebCgiTest, ParametersComeFromTheQueryThenTheBody) {
         {{.method = "POST", .type = kForm, .length = "3a", .body = "a=1"}, Failed(QUIB_ERR_BAD_PARAMETER), {}},
         {{.method = "POST", .type = kForm, .length = "-3", .body = "a=1"}, Failed(QUIB_ERR_BAD_PARAMETER), {}},
         {{.method = "POST", .type = kForm, .length = "3", .body = "a%0"}, Failed(QUIB_ERR_BAD_PARAMETER), {}},
+        {{.method = "POST", .type = kForm, .length = "5", .body = std::string("a=x\0y", 5)}, Failed(QUIB_ERR_BAD_PARAMETER), {}},
         {{.method = "POST", .type = kForm, .length = std::to_string(big.size() + 1), .body = big + "x"},
          Failed(QUIB_ERR_NAME_TOO_LONG), {}},
         {{.method = "POST", .type = kForm, .length = "99999999999999999999999", .body = ""},
