@@ -56,7 +56,7 @@ public:
     WebCGI(const WebCGI &) = delete;
     WebCGI &operator=(const WebCGI &) = delete;
 
-    // Reads the request: the parameters of QUERY_STRING, then, for a POST of
+    // Reads the request (before it, the request has no parameters or cookies): the parameters of QUERY_STRING, then, for a POST of
     // application/x-www-form-urlencoded, CONTENT_LENGTH bytes of body from bodyFd; and the
     // cookies of HTTP_COOKIE. The response header goes to outFd. 0; -1 with 0x0D00 when a
     // parameter has a broken escape or an escaped NUL, CONTENT_LENGTH is not decimal digits, or
@@ -75,11 +75,11 @@ public:
 
     // Queues "Set-Cookie: name=value; Path=path; HttpOnly; SameSite=Lax" (and "; Secure" when
     // HTTPS is "on") for WriteHeader. 0; -1 with 0x0D00 when name or value is not a token or
-    // path is not "/"-led visible ASCII without ';', or when the header was written already.
+    // path is not "/"-led visible ASCII without ';', or before Init or after WriteHeader.
     int AddCookieToHeader(const char *path, const char *name, const char *value);
     // Writes "Content-Type: <type>\r\n", the queued cookies and the blank line, once: later
     // calls write nothing and return 0. -1 with 0x0D00 for a type with a control character,
-    // the errno's code when writing fails (the header then counts as written).
+    // the errno's code when writing fails (the header then counts as written); 0x0D00 before Init.
     int WriteHeader(const char *contentType = "application/json; charset=utf-8");
 
 private:

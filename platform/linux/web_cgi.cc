@@ -146,8 +146,7 @@ struct CgiCookies {
 namespace QUIB {
 
 struct WebCGI::Impl {
-    bool initialised = false;
-    int initResult = 0;
+    int initResult = -1;  // until Init has read the whole request
     int outFd = 1;
     NameValues params;
     NameValues cookies;
@@ -155,22 +154,24 @@ struct WebCGI::Impl {
     bool headerWritten = false;
 };
 
-WebCGI::WebCGI() : impl_(new Impl) {}
+// The state is made by Init, so that the constructor can't throw.
+WebCGI::WebCGI() = default;
 WebCGI::~WebCGI() = default;
 
 int WebCGI::Init(int bodyFd, int outFd) {
     return Guarded(-1, [&] {
-        Impl &impl = *impl_;
-        if (impl.initialised) {
-            return impl.initResult;
+        if (impl_ != nullptr) {
+            return impl_->initResult;
         }
-        impl.initialised = true;
+        impl_ = std::make_unique<Impl>();
+        Impl &impl = *impl_;
         impl.outFd = outFd;
+        norvo::platform::ScopeExit forget([&impl] { impl.params.clear(), impl.cookies.clear(); });
         int code = ReadParameters(bodyFd, &impl.params);
         if (code == QUIB_ERR_NONE) {
             impl.cookies = norvo::platform::ParseCookies(EnvOr("HTTP_COOKIE", ""));
+            forget.Dismiss();
         } else {
-            impl.params.clear();
             QUIB_SET_ERR(code);
         }
         impl.initResult = code == QUIB_ERR_NONE ? 0 : -1;
@@ -179,18 +180,18 @@ int WebCGI::Init(int bodyFd, int outFd) {
 }
 
 const char *WebCGI::In(const char *name) const {
-    const std::string *value = FirstOf(impl_->params, name);
+    const std::string *value = impl_ != nullptr ? FirstOf(impl_->params, name) : nullptr;
     return value != nullptr ? value->c_str() : nullptr;
 }
 
 const char *WebCGI::GetCookie(const char *name) const {
-    const std::string *value = TokenCookie(impl_->cookies, name);
+    const std::string *value = impl_ != nullptr ? TokenCookie(impl_->cookies, name) : nullptr;
     return value != nullptr ? value->c_str() : nullptr;
 }
 
 int WebCGI::AddCookieToHeader(const char *path, const char *name, const char *value) {
     return Guarded(-1, [&] {
-        if (impl_->headerWritten || path == nullptr || name == nullptr || value == nullptr || path[0] != '/' ||
+        if (impl_ == nullptr || impl_->headerWritten || path == nullptr || name == nullptr || value == nullptr || path[0] != '/' ||
             !IsVisibleAscii(path, false) || !IsToken(name) || !IsToken(value)) {
             QUIB_SET_ERR(QUIB_ERR_BAD_PARAMETER);
             return -1;
@@ -206,10 +207,10 @@ int WebCGI::AddCookieToHeader(const char *path, const char *name, const char *va
 
 int WebCGI::WriteHeader(const char *contentType) {
     return Guarded(-1, [&] {
-        if (impl_->headerWritten) {
+        if (impl_ != nullptr && impl_->headerWritten) {
             return 0;
         }
-        if (contentType == nullptr || !IsVisibleAscii(contentType, true)) {
+        if (impl_ == nullptr || contentType == nullptr || !IsVisibleAscii(contentType, true)) {
             QUIB_SET_ERR(QUIB_ERR_BAD_PARAMETER);
             return -1;
         }

@@ -145,6 +145,9 @@ TEST_F(WebCgiTest, TheHeaderIsWrittenOnceWithTheQueuedCookies) {
         int out[2];
         ASSERT_EQ(pipe(out), 0);
         QUIB::WebCGI cgi;
+        EXPECT_EQ(cgi.AddCookieToHeader("/", "sharing", "v"), -1) << "not before Init";
+        EXPECT_EQ(OUTCOME(cgi.WriteHeader()), Failed(QUIB_ERR_BAD_PARAMETER));
+        EXPECT_EQ(cgi.In("a"), nullptr) << "not before Init";
         ASSERT_EQ(cgi.Init(0, out[1]), 0);
         EXPECT_EQ(cgi.AddCookieToHeader("/", "sharing", "Ab.9/x"), -1) << "'/' is no token";
         for (const char *bad : {"a\r\nSet-Cookie: x=1", "a;b", "a b", "", "\"q\""}) {
