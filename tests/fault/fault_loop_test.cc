@@ -311,7 +311,8 @@ const Op kOps[] = {
          char id[8] = "";
          const bool ok = cgi != nullptr && QuibCgiGetInCookies(cgi, "id", id, sizeof id) == 0;
          QuibCgiFree(cgi);
-         return Expect(ok, std::string(id) == "xyz");
+         const int timeout = ok ? VLIBCConfGetOBXTimeout() : -1;
+         return Expect(timeout > 0, std::string(id) == "xyz" && timeout == 30);
      },
      kPlatformSlot},
     {"SessionLines",  // a line goes in under the lock, whole or not at all, and is found again
@@ -450,6 +451,7 @@ TEST_P(Faults, ReleaseEverythingAndSayWhy) {
     app_.Basic().WriteFile(kDir + "/a.txt", "hello", "alice").MakeDir(kDir + "/sub");
     app_.MakeDir("/volume1/homes/alice", "alice").SetDomain("CORP").AddUser("CORP\\dave");
     app_.SetAppPrivilege("QUIB.Fault.Loop", "@staff").SetSetting("auto_block_attempts", "1");
+    app_.SetSetting("obx_timeout_minutes", "30");
     g_settings = Read(QUIB_INFO_CONF);
     g_sid[0] = '\0';
     openlog(nullptr, LOG_NDELAY, LOG_USER);  // the log connection is the process's, not a run's
