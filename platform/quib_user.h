@@ -111,4 +111,9 @@ QUIB_API int QUIBServiceHomePathGet(const char *user, char *buf, int size);
 // for unknown users, a missing file, and on failure (the error slot then says why).
 QUIB_API int VLIBUserPrivilegeHas(const char *user, const char *priv);
 
+// A character of the crypt salt alphabet ("./0-9A-Za-z") made from num and bits of the kernel's
+// random source, so that a salt made from a guessable number (the uptime) is not guessable.
+// '\0' with 0x8100 when the random source fails: a salt with it makes crypt fail.
+QUIB_API char QUIBUserRandomNumMap2Seed(long num);
+
 QUIB_END_C

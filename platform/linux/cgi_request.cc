@@ -31,7 +31,9 @@ int HexValue(char c) {
 bool PercentDecode(std::string_view text, std::string *out) {
     out->clear();
     for (size_t i = 0; i < text.size(); ++i) {
-        if (text[i] == '+') {
+        if (text[i] == '\0') {
+            return false;  // as an escaped one below
+        } else if (text[i] == '+') {
             *out += ' ';
         } else if (text[i] != '%') {
             *out += text[i];
@@ -50,6 +52,66 @@ bool PercentDecode(std::string_view text, std::string *out) {
 }
 
 }  // namespace
+
+bool IsToken(std::string_view text) {
+    constexpr std::string_view kSeparators = "()<>@,;:\\\"/[]?={}";
+    for (const char c : text) {
+        if (c <= ' ' || c >= 0x7F || kSeparators.find(c) != std::string_view::npos) {
+            return false;
+        }
+    }
+    return !text.empty();
+}
+
+bool ParseUrlEncoded(std::string_view text, NameValues *pairs) {
+    pairs->clear();
+    size_t pos = 0;
+    while (pos < text.size()) {
+        size_t end = text.find('&', pos);
+        if (end == std::string_view::npos) {
+            end = text.size();
+        }
+        const std::string_view piece = text.substr(pos, end - pos);
+        pos = end + 1;
+        if (piece.empty()) {
+            continue;
+        }
+        const size_t equals = piece.find('=');
+        std::string name;
+        std::string value;
+        if (!PercentDecode(piece.substr(0, equals), &name) ||
+            (equals != std::string_view::npos && !PercentDecode(piece.substr(equals + 1), &value))) {
+            pairs->clear();
+            return false;
+        }
+        pairs->emplace_back(std::move(name), std::move(value));
+    }
+    return true;
+}
+
+NameValues ParseCookies(std::string_view header) {
+    NameValues cookies;
+    size_t pos = 0;
+    while (pos < header.size()) {
+        size_t end = header.find(';', pos);
+        if (end == std::string_view::npos) {
+            end = header.size();
+        }
+        const std::string_view pair = header.substr(pos, end - pos);
+        pos = end + 1;
+        const size_t equals = pair.find('=');
+        const std::string_view name = TrimBlanks(pair.substr(0, equals));
+        if (equals == std::string_view::npos || !IsToken(name)) {
+            continue;
+        }
+        std::string_view value = TrimBlanks(pair.substr(equals + 1));
+        if (value.size() >= 2 && value.front() == '"' && value.back() == '"') {
+            value = value.substr(1, value.size() - 2);
+        }
+        cookies.emplace_back(name, value);
+    }
+    return cookies;
+}
 
 bool FindCookie(std::string_view header, std::string_view name, std::string *value) {
     size_t pos = 0;

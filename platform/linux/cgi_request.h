@@ -2,9 +2,28 @@
 #pragma once
 #include <string>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 namespace norvo::platform {
+
+using NameValues = std::vector<std::pair<std::string, std::string>>;
+
+// An RFC 7230 token: one or more visible ASCII characters other than the separators
+// ()<>@,;:\"/[]?={}. Cookie names and values are held to it: nothing else can reach a
+// Set-Cookie header or a line file through them.
+[[nodiscard]] bool IsToken(std::string_view text);
+
+// Splits an application/x-www-form-urlencoded text (a query string or a POST body) at '&' into
+// percent-decoded name and value pairs, in order ('+' is a space; a piece without '=' has the
+// value ""; empty pieces are skipped). false, with *pairs cleared, when any piece holds a '%'
+// without two hex digits or a NUL, escaped or raw (it would cut the value short wherever it is
+// used as a C string).
+[[nodiscard]] bool ParseUrlEncoded(std::string_view text, NameValues *pairs);
+
+// The cookies of a Cookie header whose names are tokens, in order, each value with blanks and
+// one pair of double quotes removed (the value is not checked: a reader refuses it later).
+[[nodiscard]] NameValues ParseCookies(std::string_view header);
 
 // The value of the first cookie called name in a Cookie header ("a=1; id=xyz"), with
 // surrounding blanks and one pair of double quotes removed. false when there is none.

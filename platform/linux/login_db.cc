@@ -1,8 +1,6 @@
 // SQLite plumbing of the login records.
 #include "login_db.h"
 
-#include "locked_file.h"
-#include "private_dir.h"
 #include "quib_paths.h"
 #include "sqlite_db.h"
 #include "vlibc_err.h"
@@ -28,17 +26,7 @@ int PurgeExpired(sqlite3 *db, time_t now) {
 }  // namespace
 
 int OpenLoginDb(bool create, LoginDb *db) {
-    // The database is made here rather than by SQLite so that it is born 0600 whatever the
-    // umask; see private_dir.h for why its directory is checked every time.
-    FileDescriptor dir;
-    int code = OpenPrivateDir(QUIB_LOGIN_DIR, create, &dir);
-    if (code == QUIB_ERR_NONE) {
-        code = CheckPrivateDatabase(dir.Get(), QUIB_LOGIN_DB_NAME, create);
-    }
-    if (code != QUIB_ERR_NONE) {
-        return code;
-    }
-    return OpenSqlite(QUIB_LOGIN_DB, kSchema, db);
+    return OpenPrivateSqlite(QUIB_LOGIN_DIR, QUIB_LOGIN_DB_NAME, create, kSchema, db);
 }
 
 int InsertLogin(sqlite3 *db, const LoginRecord &record, time_t now) {

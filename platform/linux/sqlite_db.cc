@@ -1,5 +1,7 @@
 #include "sqlite_db.h"
 
+#include "locked_file.h"
+#include "private_dir.h"
 #include "vlibc_err.h"
 
 namespace norvo::platform {
@@ -72,6 +74,18 @@ int Transaction::Commit() {
     const int code = Exec(db_, "COMMIT");
     open_ = code != QUIB_ERR_NONE;
     return code;
+}
+
+int OpenPrivateSqlite(const char *dir, const char *name, bool create, const char *schema, SqliteDb *db) {
+    FileDescriptor dirFd;
+    int code = OpenPrivateDir(dir, create, &dirFd);
+    if (code == QUIB_ERR_NONE) {
+        code = CheckPrivateDatabase(dirFd.Get(), name, create);
+    }
+    if (code != QUIB_ERR_NONE) {
+        return code;
+    }
+    return OpenSqlite(std::string(dir) + "/" + name, schema, db);
 }
 
 }  // namespace norvo::platform

@@ -1,5 +1,6 @@
-// SQLite plumbing shared by the databases of the platform: owning handles, the one translation
-// of result codes, and the write transaction.
+// SQLite plumbing shared by the databases of the platform (login records, failed logins, task
+// records): owning handles, the one translation of result codes, the write transaction, and the
+// opening of a database in a private directory (see private_dir.h for why).
 #pragma once
 #include <sqlite3.h>
 
@@ -51,5 +52,12 @@ private:
     sqlite3 *db_;
     bool open_ = false;
 };
+
+// Opens dir/name (made 0600 by us, so whatever the umask) after checking the directory and the
+// files beside it (private_dir.h), creating them when create is set, and runs schema, as
+// OpenSqlite. 0 and *db; the codes of OpenPrivateDir and CheckPrivateDatabase, or SQLite's
+// translated.
+[[nodiscard]] int OpenPrivateSqlite(const char *dir, const char *name, bool create, const char *schema,
+                                    SqliteDb *db);
 
 }  // namespace norvo::platform

@@ -8,6 +8,8 @@
 #include <limits.h>
 #include <pwd.h>
 #include <string.h>
+#include <fcntl.h>
+#include <sys/mman.h>
 #include <sys/stat.h>
 #include <syslog.h>
 #include <unistd.h>
@@ -26,6 +28,8 @@
 #include "faults.h"
 #include "norvo/norvo.h"
 #include "obx_task.h"
+#include "quib_autoblock.h"
+#include "quib_cgi.h"
 #include "quib_fs.h"
 #include "quib_login.h"
 #include "quib_paths.h"
@@ -34,6 +38,7 @@
 #include "quib_webutils.h"
 #include "vlibc_err.h"
 #include "vlibc_file.h"
+#include "vlibc_line_file.h"
 
 namespace {
 
@@ -124,6 +129,8 @@ const std::string kDir = "/volume1/public/dir";
 char g_sid[64];
 Appliance *g_app;
 bool g_created;
+
+int g_body = -1, g_null = -1;  // a request body and the response's sink, kept open
 
 void Login(const char *user) {
     ASSERT_EQ(QUIBLoginCreate(user, "secret", "192.0.2.1", g_sid, sizeof g_sid), 0);
@@ -296,6 +303,56 @@ const Op kOps[] = {
          return Expect(ok, std::string(user) == "alice");
      },
      kPlatformSlot, [] { Login("alice"); }},
+    {"CgiRequest",
+     [] {
+         QUIB::WebCGI cgi;
+         const bool ok = cgi.Init(g_body, g_null) == 0 && cgi.AddCookieToHeader("/", "s", "v") == 0 &&
+                         cgi.WriteHeader() == 0;
+         return Expect(ok, ok && std::string(cgi.In("b")) + cgi.GetCookie("id") == "2xyz");
+     },
+     kPlatformSlot,
+     [] {
+         setenv("REQUEST_METHOD", "POST", 1), setenv("CONTENT_TYPE", "application/x-www-form-urlencoded", 1);
+         setenv("CONTENT_LENGTH", "7", 1), setenv("HTTP_COOKIE", "id=xyz", 1);
+         if (g_body < 0) {
+             g_body = memfd_create("body", 0), g_null = open("/dev/null", O_WRONLY);
+             ASSERT_EQ(write(g_body, "a=1&b=2", 7), 7);
+         }
+         lseek(g_body, 0, SEEK_SET);
+     }},
+    {"CgiRecord",
+     [] {
+         setenv("HTTP_COOKIE", "id=xyz", 1);
+         QuibCgi *cgi = QuibCgiAlloc("/tmp/r", "/tmp/r.lock");
+         char id[8] = "";
+         const bool ok = cgi != nullptr && QuibCgiGetInCookies(cgi, "id", id, sizeof id) == 0;
+         QuibCgiFree(cgi);
+         const int timeout = ok ? VLIBCConfGetOBXTimeout() : -1;
+         return Expect(timeout > 0, std::string(id) == "xyz" && timeout == 30);
+     },
+     kPlatformSlot},
+    {"SessionLines",  // a line goes in under the lock, whole or not at all, and is found again
+     [] {
+         const int lock = QuibCgiBeginCriticalSection("/tmp/fault.lock", 1000);
+         bool ok = lock >= 0 && VLIBCFileAddLine("/tmp/fault.users", "b,2") == 0;
+         ok = (lock < 0 || QuibCgiEndCriticalSection(lock) == 0) && ok;
+         return Expect(ok && VLIBCFileGetLine("/tmp/fault.users", "b,", nullptr, 0) == 2, true);
+     },
+     kPlatformSlot, [] { Write("/tmp/fault.users", "a,1\n"); },
+     [] {
+         const std::string text = Read("/tmp/fault.users");
+         const int lock = QuibCgiBeginCriticalSection("/tmp/fault.lock", 0);
+         const bool free = lock >= 0 && QuibCgiEndCriticalSection(lock) == 0;
+         return (text == "a,1\n" || text == "a,1\nb,2\n" ? "" : "torn text: " + text) + (free ? "" : " lock held");
+     }},
+    {"AutoBlock",
+     [] {
+         const bool ok = AutoBlockFailLoginSet("192.0.2.9", "FOLDER_SHARING") == 0;
+         const int blocked = ok ? QuibCgiIsDeniedIP("192.0.2.9") : -1;
+         const bool reset = blocked >= 0 && QUIBAutoBlockResetByIP("192.0.2.9") == 0;
+         return Expect(reset && QuibCgiIsDeniedIP("::ffff:192.0.2.9") == 0, blocked == 1);
+     },
+     kPlatformSlot, [] { QUIBAutoBlockResetByIP("192.0.2.9"); }},
     {"Conditions",
      [] {
          std::vector<FileSearch::FindComp *> out;
@@ -465,7 +522,8 @@ TEST_P(Faults, ReleaseEverythingAndSayWhy) {
     g_app = &app_;
     app_.Basic().WriteFile(kDir + "/a.txt", "hello", "alice").MakeDir(kDir + "/sub");
     app_.MakeDir("/volume1/homes/alice", "alice").SetDomain("CORP").AddUser("CORP\\dave");
-    app_.SetAppPrivilege("QUIB.Fault.Loop", "@staff");
+    app_.SetAppPrivilege("QUIB.Fault.Loop", "@staff").SetSetting("auto_block_attempts", "1");
+    app_.SetSetting("obx_timeout_minutes", "30");
     g_settings = Read(QUIB_INFO_CONF);
     g_sid[0] = '\0';
     openlog(nullptr, LOG_NDELAY, LOG_USER);  // the log connection is the process's, not a run's

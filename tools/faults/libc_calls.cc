@@ -83,6 +83,8 @@ SEAM_CALL(int, mkdirat, -1, (int dir, const char *path, mode_t mode), (dir, path
 SEAM_CALL(int, mkostemp, -1, (char *pattern, int flags), (pattern, flags))
 SEAM_CALL(int, mkostemp64, -1, (char *pattern, int flags), (pattern, flags))
 SEAM_CALL(ssize_t, write, -1, (int fd, const void *data, size_t size), (fd, data, size))
+SEAM_CALL(ssize_t, pwrite, -1, (int fd, const void *data, size_t size, off_t at), (fd, data, size, at))
+SEAM_CALL(ssize_t, pwrite64, -1, (int fd, const void *data, size_t size, off64_t at), (fd, data, size, at))
 SEAM_CALL(int, fsync, -1, (int fd), (fd))
 SEAM_CALL(int, fchown, -1, (int fd, uid_t uid, gid_t gid), (fd, uid, gid))
 SEAM_CALL(int, fchmod, -1, (int fd, mode_t mode), (fd, mode))

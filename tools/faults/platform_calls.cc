@@ -6,6 +6,9 @@
 
 #include <json/value.h>
 
+#include "quib_autoblock.h"
+#include "quib_cgi.h"
+
 #include "quib_dir_pass.h"
 #include "quib_fs.h"
 #include "quib_login.h"
@@ -18,6 +21,7 @@
 #include "quib_webapi.h"
 #include "quib_webutils.h"
 #include "vlibc_file.h"
+#include "vlibc_line_file.h"
 #include "vlibc_support.h"
 #include "vlibc_szlist.h"
 
@@ -73,6 +77,17 @@ SEAM_PLATFORM(int, VLIBCFileCheckKeyValue, -1,
               (const char *file, const char *key, const char *value, int flags), (file, key, value, flags))
 SEAM_PLATFORM(int, VLIBCSupportGet, -1, (const char *key), (key))
 SEAM_PLATFORM(int, VLIBCSzListSortItems, -1, (PSZLIST list, int flags), (list, flags))
+SEAM_PLATFORM(int, VLIBCFileAddLine, -1, (const char *file, const char *line), (file, line))
+SEAM_PLATFORM(int, VLIBCFileGetLine, -1, (const char *file, const char *text, char *buf, int size),
+              (file, text, buf, size))
+SEAM_PLATFORM(int, VLIBCSysRename, -1, (const char *from, const char *to), (from, to))
+SEAM_PLATFORM(int, VLIBCConfGetOBXTimeout, -1, (void), ())
+SEAM_PLATFORM(int, QuibCgiBeginCriticalSection, -1, (const char *name, int timeoutMs), (name, timeoutMs))
+SEAM_PLATFORM(int, QuibCgiGetInCookies, -1, (QuibCgi * cgi, const char *name, char *buf, int size),
+              (cgi, name, buf, size))
+SEAM_PLATFORM(int, QuibCgiIsDeniedIP, -1, (const char *ip), (ip))
+SEAM_PLATFORM(int, AutoBlockFailLoginSet, -1, (const char *ip, const char *service), (ip, service))
+SEAM_PLATFORM(int, QUIBAutoBlockResetByIP, -1, (const char *ip), (ip))
 
 int QUIBFSMkdirP(const char *path, char *stopAt, int stopAtSize, int recursive, uid_t uid, gid_t gid,
                  mode_t mode) {
@@ -126,6 +141,7 @@ SEAM_OPENER(PSZLIST, QuibCgiDomValidShareGen, (const char *context, const char *
 SEAM_OPENER(PSZLIST, QuibCgiLDAPValidShareGen,
             (const char *context, const char *user, int sort, int writable), (context, user, sort, writable))
 SEAM_OPENER(QUIBDirPass *, QUIBDirPassBegin, (const char *dirPath), (dirPath))
+SEAM_OPENER(QuibCgi *, QuibCgiAlloc, (const char *recordFile, const char *lockName), (recordFile, lockName))
 
 // Calls that release one.
 #define SEAM_RELEASER(type, fn) \
@@ -142,6 +158,7 @@ SEAM_RELEASER(PQUIBUSER_DB, QUIBUserDBClose)
 SEAM_RELEASER(PQUIBGROUP_DB, QUIBGroupDBClose)
 SEAM_RELEASER(PSZLIST, VLIBCSzListFree)
 SEAM_RELEASER(QUIBDirPass *, QUIBDirPassEnd)
+SEAM_RELEASER(QuibCgi *, QuibCgiFree)
 
 // Calls that refill a caller's slot (a cursor's record, a list that may move as it grows).
 #define SEAM_REFILL(fn, slot, params, args)                     \
@@ -189,6 +206,25 @@ int QUIB::WebAPIUtil::ParseToArray(const char *value, Json::Value &array) {
     static const auto real = reinterpret_cast<int (*)(const char *, Json::Value &)>(
         seam::Next("_ZN4QUIB10WebAPIUtil12ParseToArrayEPKcRN4Json5ValueE"));
     return ShouldFailPlatform("QUIB::WebAPIUtil::ParseToArray") ? -1 : real(value, array);
+}
+
+int QUIB::WebCGI::Init(int bodyFd, int outFd) {
+    static const auto real =
+        reinterpret_cast<int (*)(QUIB::WebCGI *, int, int)>(seam::Next("_ZN4QUIB6WebCGI4InitEii"));
+    return ShouldFailPlatform("QUIB::WebCGI::Init") ? -1 : real(this, bodyFd, outFd);
+}
+
+int QUIB::WebCGI::AddCookieToHeader(const char *path, const char *name, const char *value) {
+    static const auto real =
+        reinterpret_cast<int (*)(QUIB::WebCGI *, const char *, const char *, const char *)>(
+            seam::Next("_ZN4QUIB6WebCGI17AddCookieToHeaderEPKcS2_S2_"));
+    return ShouldFailPlatform("QUIB::WebCGI::AddCookieToHeader") ? -1 : real(this, path, name, value);
+}
+
+int QUIB::WebCGI::WriteHeader(const char *contentType) {
+    static const auto real = reinterpret_cast<int (*)(QUIB::WebCGI *, const char *)>(
+        seam::Next("_ZN4QUIB6WebCGI11WriteHeaderEPKc"));
+    return ShouldFailPlatform("QUIB::WebCGI::WriteHeader") ? -1 : real(this, contentType);
 }
 
 std::string WebUtils::getMountType(const std::string &path) {
