@@ -15,7 +15,6 @@
 #include "vlibc_err.h"
 
 using norvo::platform::DbOwner;
-using norvo::platform::FileIdxCodeOfSqlite;
 using norvo::platform::FileIdxDb;
 using norvo::platform::FileIdxStatement;
 using norvo::platform::Guarded;
@@ -46,13 +45,14 @@ int64_t Clamp(const unsigned long long *value, int64_t absent) {
 }
 
 int Exec(sqlite3 *db, const char *sql) {
-    return FileIdxCodeOfSqlite(sqlite3_exec(db, sql, nullptr, nullptr, nullptr));
+    return norvo::platform::FileIdxCodeOf(db, sqlite3_exec(db, sql, nullptr, nullptr, nullptr));
 }
 
 // Runs a statement that returns no rows.
 int RunToEnd(sqlite3_stmt *statement) {
     const int rc = sqlite3_step(statement);
-    return rc == SQLITE_DONE ? QUIB_ERR_NONE : FileIdxCodeOfSqlite(rc == SQLITE_ROW ? SQLITE_ERROR : rc);
+    return rc == SQLITE_DONE ? QUIB_ERR_NONE
+                             : norvo::platform::FileIdxCodeOf(sqlite3_db_handle(statement), rc == SQLITE_ROW ? SQLITE_ERROR : rc);
 }
 
 // A write statement on a database opened for this call.
@@ -84,7 +84,7 @@ int SelectInto(sqlite3 *db, const SqlText &sql, FILEIDX_SELECT_CB callback, void
             return QUIB_ERR_NONE;
         }
         if (rc != SQLITE_ROW) {
-            return FileIdxCodeOfSqlite(rc);
+            return norvo::platform::FileIdxCodeOf(db, rc);
         }
         norvo::platform::ReadRecord(statement.get(), record.get());
         if (callback(record.get(), arg) == 0) {
@@ -224,7 +224,7 @@ int FILEIDXCountGet(const char *dbPath, const FI_QUERY *query, unsigned long lon
         }
         if (code == QUIB_ERR_NONE) {
             const int rc = sqlite3_step(statement.get());
-            code = rc == SQLITE_ROW ? QUIB_ERR_NONE : FileIdxCodeOfSqlite(rc == SQLITE_DONE ? SQLITE_ERROR : rc);
+            code = rc == SQLITE_ROW ? QUIB_ERR_NONE : norvo::platform::FileIdxCodeOf(db.get(), rc == SQLITE_DONE ? SQLITE_ERROR : rc);
         }
         if (code != QUIB_ERR_NONE) {
             return FILEIDX_FAIL(code);

@@ -377,7 +377,7 @@ int Open(const char *path, FileIdxDb *db) {
     const int rc = sqlite3_open_v2(path, &raw, SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOFOLLOW, nullptr);
     db->reset(raw);
     if (rc != SQLITE_OK) {
-        return (rc & 0xFF) == SQLITE_CANTOPEN ? QUIB_ERR_ACCESS_DENIED : FileIdxCodeOfSqlite(rc);
+        return sqlite3_extended_errcode(raw) == SQLITE_CANTOPEN_SYMLINK ? QUIB_ERR_ACCESS_DENIED : FileIdxCodeOf(raw, rc);
     }
     sqlite3_busy_timeout(raw, kBusyTimeoutMs);
     return RegisterFunctions(raw);
@@ -409,6 +409,16 @@ int FileIdxCodeOfSqlite(int rc) {
     }
 }
 
+int FileIdxCodeOf(sqlite3 *db, int rc) {
+    const int primary = rc & 0xFF;
+    if (db != nullptr && (primary == SQLITE_CANTOPEN || primary == SQLITE_IOERR || primary == SQLITE_FULL)) {
+        if (const int err = sqlite3_system_errno(db)) {
+            return VLIBCErrFromErrno(err);
+        }
+    }
+    return FileIdxCodeOfSqlite(rc);
+}
+
 int CreateFileIdxDb(const char *path) {
     FileDescriptor dir;
     std::string name;
@@ -433,7 +443,7 @@ int CreateFileIdxDb(const char *path) {
         code = Open(path, &db);
     }
     if (code == QUIB_ERR_NONE) {
-        code = FileIdxCodeOfSqlite(sqlite3_exec(db.get(), kSchema, nullptr, nullptr, nullptr));
+        code = FileIdxCodeOf(db.get(), sqlite3_exec(db.get(), kSchema, nullptr, nullptr, nullptr));
     }
     if (code == QUIB_ERR_NONE) {
         code = FileIdxCodeOfSqlite(sqlite3_close(db.release()));
@@ -521,7 +531,7 @@ int PrepareBound(sqlite3 *db, const SqlText &sql, FileIdxStatement *out) {
     const int rc = sqlite3_prepare_v2(db, sql.text.c_str(), static_cast<int>(sql.text.size()), &raw, nullptr);
     out->reset(raw);
     if (rc != SQLITE_OK) {
-        return FileIdxCodeOfSqlite(rc);
+        return FileIdxCodeOf(db, rc);
     }
     int index = 0;
     for (const SqlText::Value &value : sql.values) {

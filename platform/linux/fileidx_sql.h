@@ -24,6 +24,8 @@ using FileIdxStatement = std::unique_ptr<sqlite3_stmt, FileIdxStatementFinalizer
 
 // The one translation of SQLite result codes into platform codes.
 [[nodiscard]] int FileIdxCodeOfSqlite(int rc);
+// The same, but a failure to open or read a file says the system's reason (ENOSPC, EACCES...).
+[[nodiscard]] int FileIdxCodeOf(sqlite3 *db, int rc);
 
 // Who may own a database that is opened.
 enum class DbOwner {
