@@ -158,7 +158,8 @@ QUIB_API int FILEIDXCountGet(const char *dbPath, const FI_QUERY *query, unsigned
 // Sets columns of every hit that where selects. setList is a chain through orNext of records
 // (column, FI_OP_EQ, new value as text; "%llu" for numbers), andNext null. Setting share or
 // path so that two hits would share a key fails and changes nothing.
-QUIB_API int FILEIDXDBUpdate(const char *dbPath, const __tag_FI_SQL_COND *setList, const __tag_FI_SQL_COND *where);
+QUIB_API int FILEIDXDBUpdate(const char *dbPath, const __tag_FI_SQL_COND *setList,
+                             const __tag_FI_SQL_COND *where);
 
 // Deletes every hit that where selects; a null where is refused (0x0D00).
 QUIB_API int FILEIDXDBDel(const char *dbPath, const __tag_FI_SQL_COND *where);

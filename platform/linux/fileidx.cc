@@ -52,7 +52,8 @@ int Exec(sqlite3 *db, const char *sql) {
 int RunToEnd(sqlite3_stmt *statement) {
     const int rc = sqlite3_step(statement);
     return rc == SQLITE_DONE ? QUIB_ERR_NONE
-                             : norvo::platform::FileIdxCodeOf(sqlite3_db_handle(statement), rc == SQLITE_ROW ? SQLITE_ERROR : rc);
+                             : norvo::platform::FileIdxCodeOf(sqlite3_db_handle(statement),
+                                                              rc == SQLITE_ROW ? SQLITE_ERROR : rc);
 }
 
 // A write statement on a database opened for this call.
@@ -224,7 +225,9 @@ int FILEIDXCountGet(const char *dbPath, const FI_QUERY *query, unsigned long lon
         }
         if (code == QUIB_ERR_NONE) {
             const int rc = sqlite3_step(statement.get());
-            code = rc == SQLITE_ROW ? QUIB_ERR_NONE : norvo::platform::FileIdxCodeOf(db.get(), rc == SQLITE_DONE ? SQLITE_ERROR : rc);
+            code = rc == SQLITE_ROW
+                       ? QUIB_ERR_NONE
+                       : norvo::platform::FileIdxCodeOf(db.get(), rc == SQLITE_DONE ? SQLITE_ERROR : rc);
         }
         if (code != QUIB_ERR_NONE) {
             return FILEIDX_FAIL(code);

@@ -37,10 +37,10 @@ struct Column {
 
 // By condition type code.
 constexpr Column kColumns[] = {
-    {"name", true},        {nullptr, false},      {"real_path", true}, {"parent_path", true}, {"share", true},
-    {"path", true},        {"is_dir", false},     {"size", false},     {"type", true},        {"crtime", false},
-    {"ctime", false},      {"atime", false},      {"mtime", false},    {"posix", true},       {"mode", false},
-    {"uid", false},        {"gid", false},        {"user_name", true}, {"group_name", true},
+    {"name", true},   {nullptr, false},  {"real_path", true}, {"parent_path", true}, {"share", true},
+    {"path", true},   {"is_dir", false}, {"size", false},     {"type", true},        {"crtime", false},
+    {"ctime", false}, {"atime", false},  {"mtime", false},    {"posix", true},       {"mode", false},
+    {"uid", false},   {"gid", false},    {"user_name", true}, {"group_name", true},
 };
 constexpr unsigned kColumnCount = sizeof kColumns / sizeof kColumns[0];
 
@@ -106,7 +106,9 @@ int AppendTerm(const __tag_FI_SQL_COND &c, SqlText *sql) {
         case FI_OP_LIKE:
         case FI_OP_PATH_LIKE:
         case FI_OP_PATH_NOT_LIKE:
-            sql->text += c.op == FI_OP_LIKE ? "fileidx_like(" : c.op == FI_OP_PATH_LIKE ? "fileidx_path_like(" : "NOT fileidx_path_like(";
+            sql->text += c.op == FI_OP_LIKE        ? "fileidx_like("
+                         : c.op == FI_OP_PATH_LIKE ? "fileidx_path_like("
+                                                   : "NOT fileidx_path_like(";
             if (const int code = BindOperand(*column, c, false, sql)) {
                 return code;
             }
@@ -205,7 +207,8 @@ std::vector<std::string_view> SplitPath(std::string_view path) {
     size_t from = 0;
     for (;;) {
         const size_t slash = path.find('/', from);
-        parts.push_back(path.substr(from, slash == std::string_view::npos ? std::string_view::npos : slash - from));
+        parts.push_back(
+            path.substr(from, slash == std::string_view::npos ? std::string_view::npos : slash - from));
         if (slash == std::string_view::npos) {
             return parts;
         }
@@ -240,7 +243,9 @@ bool PathLikeMatch(std::string_view pattern, std::string_view path) {
 
 std::string_view TextOf(sqlite3_value *value) {
     const unsigned char *text = sqlite3_value_text(value);
-    return text == nullptr ? std::string_view() : std::string_view(reinterpret_cast<const char *>(text), static_cast<size_t>(sqlite3_value_bytes(value)));
+    return text == nullptr ? std::string_view()
+                           : std::string_view(reinterpret_cast<const char *>(text),
+                                              static_cast<size_t>(sqlite3_value_bytes(value)));
 }
 
 void LikeFunction(sqlite3_context *context, int, sqlite3_value **args) {
@@ -288,13 +293,15 @@ int NoCaseCollation(void *, int size1, const void *text1, int size2, const void 
 
 int RegisterFunctions(sqlite3 *db) {
     constexpr int kFlags = SQLITE_UTF8 | SQLITE_DETERMINISTIC | SQLITE_INNOCUOUS;
-    int rc = sqlite3_create_function_v2(db, "fileidx_like", 2, kFlags, nullptr, LikeFunction, nullptr, nullptr, nullptr);
-    if (rc == SQLITE_OK) {
-        rc = sqlite3_create_function_v2(db, "fileidx_path_like", 2, kFlags, nullptr, PathLikeFunction, nullptr,
+    int rc = sqlite3_create_function_v2(db, "fileidx_like", 2, kFlags, nullptr, LikeFunction, nullptr,
                                         nullptr, nullptr);
+    if (rc == SQLITE_OK) {
+        rc = sqlite3_create_function_v2(db, "fileidx_path_like", 2, kFlags, nullptr, PathLikeFunction,
+                                        nullptr, nullptr, nullptr);
     }
     if (rc == SQLITE_OK) {
-        rc = sqlite3_create_collation_v2(db, "fileidx_nocase", SQLITE_UTF8, nullptr, NoCaseCollation, nullptr);
+        rc =
+            sqlite3_create_collation_v2(db, "fileidx_nocase", SQLITE_UTF8, nullptr, NoCaseCollation, nullptr);
     }
     return FileIdxCodeOfSqlite(rc);
 }
@@ -334,7 +341,8 @@ int OpenParent(const char *path, FileDescriptor *dir, std::string *name) {
         if (component.empty() || component == ".") {
             continue;
         }
-        FileDescriptor next(openat(dir->Get(), component.c_str(), O_PATH | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+        FileDescriptor next(
+            openat(dir->Get(), component.c_str(), O_PATH | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
         if (!next.IsOpen()) {
             return CodeOfOpen(errno);
         }
@@ -377,7 +385,8 @@ int Open(const char *path, FileIdxDb *db) {
     const int rc = sqlite3_open_v2(path, &raw, SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOFOLLOW, nullptr);
     db->reset(raw);
     if (rc != SQLITE_OK) {
-        return sqlite3_extended_errcode(raw) == SQLITE_CANTOPEN_SYMLINK ? QUIB_ERR_ACCESS_DENIED : FileIdxCodeOf(raw, rc);
+        return sqlite3_extended_errcode(raw) == SQLITE_CANTOPEN_SYMLINK ? QUIB_ERR_ACCESS_DENIED
+                                                                        : FileIdxCodeOf(raw, rc);
     }
     sqlite3_busy_timeout(raw, kBusyTimeoutMs);
     return RegisterFunctions(raw);
@@ -426,7 +435,8 @@ int CreateFileIdxDb(const char *path) {
         return code;
     }
     {
-        FileDescriptor file(openat(dir.Get(), name.c_str(), O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600));
+        FileDescriptor file(
+            openat(dir.Get(), name.c_str(), O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600));
         if (!file.IsOpen()) {
             return errno == EEXIST || errno == ELOOP ? QUIB_ERR_ACCESS_DENIED : VLIBCErrFromErrno(errno);
         }
@@ -536,8 +546,10 @@ int PrepareBound(sqlite3 *db, const SqlText &sql, FileIdxStatement *out) {
     int index = 0;
     for (const SqlText::Value &value : sql.values) {
         ++index;
-        const int bound = value.isText ? sqlite3_bind_text(raw, index, value.text.data(), static_cast<int>(value.text.size()), SQLITE_TRANSIENT)
-                                       : sqlite3_bind_int64(raw, index, value.number);
+        const int bound = value.isText
+                              ? sqlite3_bind_text(raw, index, value.text.data(),
+                                                  static_cast<int>(value.text.size()), SQLITE_TRANSIENT)
+                              : sqlite3_bind_int64(raw, index, value.number);
         if (bound != SQLITE_OK) {
             return FileIdxCodeOfSqlite(bound);
         }
@@ -550,7 +562,8 @@ int BindRecord(sqlite3_stmt *statement, const __tag_FI_FILE_INFO_DATA &r) {
     int rc = SQLITE_OK;
     auto text = [&](const char *field, size_t size) {
         if (rc == SQLITE_OK) {
-            rc = sqlite3_bind_text(statement, ++index, field, static_cast<int>(strnlen(field, size)), SQLITE_TRANSIENT);
+            rc = sqlite3_bind_text(statement, ++index, field, static_cast<int>(strnlen(field, size)),
+                                   SQLITE_TRANSIENT);
         }
     };
     auto number = [&](long long value) {
@@ -583,7 +596,8 @@ void ReadRecord(sqlite3_stmt *statement, __tag_FI_FILE_INFO_DATA *r) {
     int index = 0;
     auto text = [&](char *field, size_t size) {
         const unsigned char *value = sqlite3_column_text(statement, index);
-        const size_t length = value == nullptr ? 0 : static_cast<size_t>(sqlite3_column_bytes(statement, index));
+        const size_t length =
+            value == nullptr ? 0 : static_cast<size_t>(sqlite3_column_bytes(statement, index));
         ++index;
         const size_t kept = length < size ? length : size - 1;
         if (kept > 0) {

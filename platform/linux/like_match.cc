@@ -1,8 +1,8 @@
-// The wildcard matcher of name searches, in the platform so that the library's in-memory test
-// and the file index's SQL LIKE are one implementation. It walks both texts in place, one decoded code point at
-// a time, and backtracks only to the last star: no allocation, no recursion, and at most
-// (pattern length) x (subject length) steps, since it runs over millions of names per search
-// and a hostile pattern must not stall a request.
+// The wildcard matcher of name searches, here in the platform so that the library's in-memory
+// test and the file index's SQL LIKE are one implementation. It walks both texts in place, one
+// decoded code point at a time, and backtracks only to the last star: no allocation, no
+// recursion, and at most (pattern length) x (subject length) steps, since it runs over millions
+// of names per search and a hostile pattern must not stall a request.
 //
 // Why remembering only the last star is enough: after a star, the pattern up to the next star
 // matches a fixed number of characters, and whether the next star's block can still succeed only

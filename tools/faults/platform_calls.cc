@@ -89,14 +89,15 @@ int QUIBFSMkdirP(const char *path, char *stopAt, int stopAtSize, int recursive, 
 }
 
 SEAM_PLATFORM(int, FILEIDXDBCreate, -1, (const char *dbPath), (dbPath))
-SEAM_PLATFORM(int, FILEIDXDBInsert, -1, (const char *dbPath, const __tag_FI_FILE_INFO_DATA *records, int count),
+SEAM_PLATFORM(int, FILEIDXDBInsert, -1,
+              (const char *dbPath, const __tag_FI_FILE_INFO_DATA *records, int count),
               (dbPath, records, count))
 SEAM_PLATFORM(int, FILEIDXDBSelect, -1,
               (const char *dbPath, const FI_QUERY *query, FILEIDX_SELECT_CB callback, void *arg,
                const unsigned long long *limit, const unsigned long long *offset, int flags),
               (dbPath, query, callback, arg, limit, offset, flags))
-SEAM_PLATFORM(int, FILEIDXCountGet, -1, (const char *dbPath, const FI_QUERY *query, unsigned long long *total),
-              (dbPath, query, total))
+SEAM_PLATFORM(int, FILEIDXCountGet, -1,
+              (const char *dbPath, const FI_QUERY *query, unsigned long long *total), (dbPath, query, total))
 SEAM_PLATFORM(int, FILEIDXDBUpdate, -1,
               (const char *dbPath, const __tag_FI_SQL_COND *setList, const __tag_FI_SQL_COND *where),
               (dbPath, setList, where))
@@ -106,8 +107,9 @@ SEAM_PLATFORM(int, FILEIDXOutputDBInsert, -1, (FI_OUTPUT_DB * db, const __tag_FI
 SEAM_PLATFORM(int, FILEIDXOutputDBCommit, -1, (FI_OUTPUT_DB * db), (db))
 SEAM_PLATFORM(int, FILEIDXIsIndexEnable, -1, (const char *volume), (volume))
 SEAM_PLATFORM(int, FILEIDXResultGetAndTableGen, -1,
-              (const char *volume, const __tag_FI_SQL_COND *conditions, const __tag_FI_SQL_COND *folderConditions,
-               FILEIDX_ROW_FILTER filter, const FI_TABLE_GEN_CONTEXT *context),
+              (const char *volume, const __tag_FI_SQL_COND *conditions,
+               const __tag_FI_SQL_COND *folderConditions, FILEIDX_ROW_FILTER filter,
+               const FI_TABLE_GEN_CONTEXT *context),
               (volume, conditions, folderConditions, filter, context))
 SEAM_PLATFORM(int, VLIBCExec, -1, (const char *program, const char *const argv[]), (program, argv))
 
