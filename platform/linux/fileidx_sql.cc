@@ -140,9 +140,11 @@ void JoinBalanced(const std::vector<SqlText> &parts, size_t from, size_t to, con
     sql->text += ')';
 }
 
+// Collects the conjuncts of a chain flat (each an OR group of one record's alternatives), so
+// neither a long conjunction nor a long alternative nests deeper than log2 of its length.
 class ChainReader {
 public:
-    int Read(const __tag_FI_SQL_COND *head, SqlText *sql) {
+    int Read(const __tag_FI_SQL_COND *head, std::vector<SqlText> *conjuncts) {
         std::vector<SqlText> alternatives;
         std::vector<const __tag_FI_SQL_COND *> further;
         for (const __tag_FI_SQL_COND *c = head; c != nullptr; c = c->orNext) {
@@ -157,15 +159,13 @@ public:
                 further.push_back(c->andNext);
             }
         }
-        std::vector<SqlText> all(1);
-        JoinBalanced(alternatives, 0, alternatives.size(), " OR ", &all[0]);
+        conjuncts->emplace_back();
+        JoinBalanced(alternatives, 0, alternatives.size(), " OR ", &conjuncts->back());
         for (const __tag_FI_SQL_COND *next : further) {
-            all.emplace_back();
-            if (const int code = Read(next, &all.back())) {
+            if (const int code = Read(next, conjuncts)) {
                 return code;
             }
         }
-        JoinBalanced(all, 0, all.size(), " AND ", sql);
         return QUIB_ERR_NONE;
     }
 
@@ -486,10 +486,12 @@ int AppendWhere(const __tag_FI_SQL_COND *head, SqlText *sql) {
         sql->text += '1';
         return QUIB_ERR_NONE;
     }
-    SqlText where;
-    if (const int code = ChainReader().Read(head, &where)) {
+    std::vector<SqlText> conjuncts;
+    if (const int code = ChainReader().Read(head, &conjuncts)) {
         return code;
     }
+    SqlText where;
+    JoinBalanced(conjuncts, 0, conjuncts.size(), " AND ", &where);
     sql->text += '(' + where.text + ')';
     sql->values.insert(sql->values.end(), where.values.begin(), where.values.end());
     return QUIB_ERR_NONE;

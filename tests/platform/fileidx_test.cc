@@ -256,12 +256,24 @@ TEST_F(FileIdx, ChainShapesAndPaths) {
         r[on].andNext = &r[2];
         EXPECT_EQ(Where(&r[0]), (std::vector<std::string>{"t:a", "t:ab"})) << on;
     }
+    // The longest chains, of andNext or of orNext, work; one record more is refused.
+    unsigned long long total = 0;
+    std::vector<__tag_FI_SQL_COND> many(FILEIDX_MAX_CONDS + 1, Cond(FI_COND_SIZE, FI_OP_GE, "0"));
+    for (const bool viaOr : {false, true}) {
+        for (size_t i = 0; i + 1 < many.size(); ++i) {
+            many[i].andNext = viaOr ? nullptr : &many[i + 1];
+            many[i].orNext = viaOr ? &many[i + 1] : nullptr;
+        }
+        FI_QUERY longest{&many[1], 0, {}}, tooLong{&many[0], 0, {}};
+        EXPECT_EQ(OUTCOME(FILEIDXCountGet(kDb.c_str(), &longest, &total)).rc, 0);
+        EXPECT_EQ(total, hits.size());
+        EXPECT_EQ(OUTCOME(FILEIDXCountGet(kDb.c_str(), &tooLong, &total)), Failed(QUIB_ERR_BAD_PARAMETER));
+    }
     // Refused chains: a cycle, an unknown column or op, a malformed number.
     __tag_FI_SQL_COND bad[] = {Cond(FI_COND_PATH, FI_OP_EQ, "a"), Cond(static_cast<__tag_FI_SQL_COND_TYPE>(1), FI_OP_EQ, "a"),
                                Cond(FI_COND_PATH, static_cast<__tag_FI_SQL_COND_OP>(3), "a"),
                                Cond(FI_COND_SIZE, FI_OP_EQ, "-1"), Cond(FI_COND_SIZE, FI_OP_EQ, "18446744073709551616")};
     bad[0].orNext = &bad[0];
-    unsigned long long total = 0;
     for (__tag_FI_SQL_COND &b : bad) {
         FI_QUERY query{&b, 0, {}};
         EXPECT_EQ(OUTCOME(FILEIDXCountGet(kDb.c_str(), &query, &total)), Failed(QUIB_ERR_BAD_PARAMETER));
