@@ -73,11 +73,12 @@ void InsertFloor(const std::string &path) {
     sqlite3_stmt *insert = nullptr;
     sqlite3_open_v2(path.c_str(), &db, SQLITE_OPEN_READWRITE, nullptr);
     sqlite3_exec(db, "BEGIN", nullptr, nullptr, nullptr);
-    sqlite3_prepare_v2(db,
-                       "INSERT INTO fileinfo(name, real_path, parent_path, share, path, is_dir, size, type, crtime, "
-                       "ctime, atime, mtime, posix, mode, uid, gid, user_name, group_name) "
-                       "VALUES(?,?,?,?,?,?,?,?,?,?,?,?,?,?,?,?,?,?)",
-                       -1, &insert, nullptr);
+    sqlite3_prepare_v2(
+        db,
+        "INSERT INTO fileinfo(name, real_path, parent_path, share, path, is_dir, size, type, crtime, "
+        "ctime, atime, mtime, posix, mode, uid, gid, user_name, group_name) "
+        "VALUES(?,?,?,?,?,?,?,?,?,?,?,?,?,?,?,?,?,?)",
+        -1, &insert, nullptr);
     for (int i = 0; i < kHits; ++i) {
         MakeHit(i, &hit);
         int n = 0;
@@ -148,12 +149,13 @@ double TimePages(benchmark::State &state, const std::function<bool()> &page) {
 }
 
 void PageShellBench(benchmark::State &state) {
-    const char *argv[] = {"sqlite3",
-                          "-readonly",
-                          kPageDb.c_str(),
-                          ".output /dev/null",
-                          "SELECT * FROM fileinfo ORDER BY name COLLATE NOCASE, rowid LIMIT 100 OFFSET 50000;",
-                          nullptr};
+    const char *argv[] = {
+        "sqlite3",
+        "-readonly",
+        kPageDb.c_str(),
+        ".output /dev/null",
+        "SELECT * FROM fileinfo ORDER BY name COLLATE NOCASE, rowid LIMIT 100 OFFSET 50000;",
+        nullptr};
     g_shellSeconds = TimePages(state, [&] { return VLIBCExec("/usr/bin/sqlite3", argv) == 0; });
 }
 
@@ -177,12 +179,18 @@ int main(int argc, char **argv) {
     norvo::testing::Appliance appliance;
     appliance.Basic();
     InsertThroughOutput(FreshDb("page.db"));
-    benchmark::RegisterBenchmark("InsertFloor", InsertFloorBench)->Unit(benchmark::kMillisecond)->Iterations(5);
+    benchmark::RegisterBenchmark("InsertFloor", InsertFloorBench)
+        ->Unit(benchmark::kMillisecond)
+        ->Iterations(5);
     benchmark::RegisterBenchmark("FILEIDXOutputDBInsert", InsertOutputBench)
         ->Unit(benchmark::kMillisecond)
         ->Iterations(5);
-    benchmark::RegisterBenchmark("PageInSqliteShell", PageShellBench)->Unit(benchmark::kMillisecond)->Iterations(10);
-    benchmark::RegisterBenchmark("FILEIDXDBSelectPage", PageBench)->Unit(benchmark::kMillisecond)->Iterations(10);
+    benchmark::RegisterBenchmark("PageInSqliteShell", PageShellBench)
+        ->Unit(benchmark::kMillisecond)
+        ->Iterations(10);
+    benchmark::RegisterBenchmark("FILEIDXDBSelectPage", PageBench)
+        ->Unit(benchmark::kMillisecond)
+        ->Iterations(10);
     benchmark::RunSpecifiedBenchmarks();
     benchmark::Shutdown();
     return 0;

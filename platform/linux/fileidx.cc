@@ -8,6 +8,7 @@
 
 #include <memory>
 #include <string>
+#include <vector>
 
 #include "api_guard.h"
 #include "fileidx_sql.h"
@@ -92,6 +93,50 @@ int SelectInto(sqlite3 *db, const SqlText &sql, FILEIDX_SELECT_CB callback, void
             return QUIB_ERR_NONE;
         }
     }
+}
+
+// Reads the hits whose rowids sql selects, in its order, in one read transaction so that the
+// page is one snapshot.
+int SelectPage(sqlite3 *db, const SqlText &sql, FILEIDX_SELECT_CB callback, void *arg) {
+    if (const int code = Exec(db, "BEGIN")) {
+        return code;
+    }
+    const norvo::platform::ScopeExit end([db] { sqlite3_exec(db, "ROLLBACK", nullptr, nullptr, nullptr); });
+    std::vector<sqlite3_int64> rowids;
+    {
+        FileIdxStatement keys;
+        if (const int code = norvo::platform::PrepareBound(db, sql, &keys)) {
+            return code;
+        }
+        int rc;
+        while ((rc = sqlite3_step(keys.get())) == SQLITE_ROW) {
+            rowids.push_back(sqlite3_column_int64(keys.get(), 0));
+        }
+        if (rc != SQLITE_DONE) {
+            return norvo::platform::FileIdxCodeOf(db, rc);
+        }
+    }
+    SqlText one;
+    one.text = std::string("SELECT ") + norvo::platform::kFileIdxColumns + " FROM fileinfo WHERE rowid = ?";
+    one.values.push_back({false, 0, {}});
+    FileIdxStatement read;
+    if (const int code = norvo::platform::PrepareBound(db, one, &read)) {
+        return code;
+    }
+    auto record = std::make_unique<__tag_FI_FILE_INFO_DATA>();
+    for (const sqlite3_int64 rowid : rowids) {
+        sqlite3_reset(read.get());
+        sqlite3_bind_int64(read.get(), 1, rowid);
+        const int rc = sqlite3_step(read.get());
+        if (rc != SQLITE_ROW) {
+            return norvo::platform::FileIdxCodeOf(db, rc == SQLITE_DONE ? SQLITE_CORRUPT : rc);
+        }
+        norvo::platform::ReadRecord(read.get(), record.get());
+        if (callback(record.get(), arg) == 0) {
+            break;
+        }
+    }
+    return QUIB_ERR_NONE;
 }
 
 int OutputCommit(__tag_FI_OUTPUT_DB *out) {
@@ -187,8 +232,10 @@ int FILEIDXDBSelect(const char *dbPath, const FI_QUERY *query, FILEIDX_SELECT_CB
         if (query == nullptr || callback == nullptr || flags != 0) {
             return FILEIDX_FAIL(QUIB_ERR_BAD_PARAMETER);
         }
+        // The page is found by sorting keys and rowids only, then its hits are read one by
+        // one: sorting whole records of a deep page costs twice as much.
         SqlText sql;
-        sql.text = std::string("SELECT ") + norvo::platform::kFileIdxColumns + " FROM fileinfo WHERE ";
+        sql.text = "SELECT rowid FROM fileinfo WHERE ";
         int code = norvo::platform::AppendWhere(query->where, &sql);
         if (code == QUIB_ERR_NONE) {
             code = norvo::platform::AppendOrder(*query, &sql);
@@ -201,7 +248,7 @@ int FILEIDXDBSelect(const char *dbPath, const FI_QUERY *query, FILEIDX_SELECT_CB
             code = norvo::platform::OpenFileIdxDb(dbPath, DbOwner::kCaller, &db);
         }
         if (code == QUIB_ERR_NONE) {
-            code = SelectInto(db.get(), sql, callback, arg);
+            code = SelectPage(db.get(), sql, callback, arg);
         }
         return code == QUIB_ERR_NONE ? 0 : FILEIDX_FAIL(code);
     });
