@@ -565,7 +565,7 @@ int BindRecord(sqlite3_stmt *statement, const __tag_FI_FILE_INFO_DATA &r) {
     auto text = [&](const char *field, size_t size) {
         if (rc == SQLITE_OK) {
             rc = sqlite3_bind_text(statement, ++index, field, static_cast<int>(strnlen(field, size)),
-                                   SQLITE_TRANSIENT);
+                                   SQLITE_STATIC);
         }
     };
     auto number = [&](long long value) {

@@ -63,6 +63,8 @@ struct SqlText {
 // The columns of a hit in storage order, for SELECT and INSERT.
 extern const char kFileIdxColumns[];
 // Binds record's fields to parameters 1..18 of an INSERT of kFileIdxColumns. 0 or a code.
+// The text is not copied: step the statement before record changes, and bind again before
+// each step.
 [[nodiscard]] int BindRecord(sqlite3_stmt *statement, const __tag_FI_FILE_INFO_DATA &record);
 // Reads a row of "SELECT kFileIdxColumns" into *record.
 void ReadRecord(sqlite3_stmt *statement, __tag_FI_FILE_INFO_DATA *record);
