@@ -449,9 +449,10 @@ int CreateFileIdxDb(const char *path) {
     ScopeExit removeOnFailure([&] { unlinkat(dir.Get(), name.c_str(), 0); });
     FileIdxDb db;
     int code = CheckFiles(dir.Get(), name, DbOwner::kCaller);
-    if (code == QUIB_ERR_NONE) {
-        code = Open(path, &db);
+    if (code != QUIB_ERR_NONE) {
+        return code;  // the journals beside it are someone else's: leave them alone
     }
+    code = Open(path, &db);
     if (code == QUIB_ERR_NONE) {
         code = FileIdxCodeOf(db.get(), sqlite3_exec(db.get(), kSchema, nullptr, nullptr, nullptr));
     }
@@ -460,7 +461,7 @@ int CreateFileIdxDb(const char *path) {
     }
     if (code != QUIB_ERR_NONE) {
         db.reset();
-        for (const char *suffix : {"-wal", "-shm", "-journal"}) {
+        for (const char *suffix : {"-wal", "-shm", "-journal"}) {  // ours, or absent when checked
             unlinkat(dir.Get(), (name + suffix).c_str(), 0);
         }
         return code;

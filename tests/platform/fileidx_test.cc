@@ -462,6 +462,12 @@ TEST_F(FileIdx, ForeignLinkedOrDamagedFilesAreRefused) {
     ASSERT_EQ(app.RunAs("bob", [&] { return creat("/volume1/public/tasks/mine-wal", 0666) >= 0 ? 0 : 1; }), 0);
     EXPECT_EQ(app.RunAs("alice", [&] { return FILEIDXDBInsert(mine, &hit, 1) == -1 ? VLIBCErrGet() >> 8 : 0; }), 0x03);
     unlink("/volume1/public/tasks/mine-wal");
+    // A journal planted before the database is made: refused, and neither file left behind
+    // nor the planted one taken away.
+    ASSERT_EQ(app.RunAs("bob", [&] { return creat("/volume1/public/tasks/next-wal", 0666) >= 0 ? 0 : 1; }), 0);
+    EXPECT_EQ(app.RunAs("alice", [&] { return FILEIDXDBCreate("/volume1/public/tasks/next") == -1 ? VLIBCErrGet() >> 8 : 0; }), 0x03);
+    EXPECT_EQ(access("/volume1/public/tasks/next-wal", F_OK), 0);
+    EXPECT_NE(access("/volume1/public/tasks/next", F_OK), 0);
 
     ASSERT_EQ(symlink("/volume1/public/tasks", "/volume1/public/link"), 0);
     ASSERT_EQ(symlink(kDb.c_str(), "/volume1/public/tasks/db-link"), 0);
