@@ -264,7 +264,11 @@ void PathLikeFunction(sqlite3_context *context, int, sqlite3_value **args) {
         sqlite3_result_int(context, 0);
         return;
     }
-    sqlite3_result_int(context, PathLikeMatch(TextOf(args[0]), TextOf(args[1])) ? 1 : 0);
+    try {  // no exception may cross SQLite's C frames
+        sqlite3_result_int(context, PathLikeMatch(TextOf(args[0]), TextOf(args[1])) ? 1 : 0);
+    } catch (...) {
+        sqlite3_result_error_nomem(context);
+    }
 }
 
 // VLIBCUnicodeUTF8StrCaseCmp takes terminated strings; most names fit on the stack.
