@@ -5,6 +5,7 @@
 #include <grp.h>
 #include <stdlib.h>
 #include <string.h>
+#include <sys/mount.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -493,6 +494,39 @@ TEST_F(FileIdx, ForeignLinkedOrDamagedFilesAreRefused) {
         EXPECT_EQ(OUTCOME(FILEIDXDBInsert(k.path, &hit, 1)), Failed(k.use)) << k.path;
     }
     EXPECT_FALSE(std::ifstream("/volume1/public/tasks/new").good());
+}
+
+// A full volume: the insert that does not fit says so (0x2900) and changes nothing; what was
+// stored stays readable, and a walk's handle keeps its committed batches.
+TEST_F(FileIdx, AFullVolumeKeepsTheDatabase) {
+    const std::string dir = "/volume1/public/small", db = dir + "/hits.db";
+    app.MakeDir(dir);
+    ASSERT_EQ(mount("tmpfs", dir.c_str(), "tmpfs", 0, "size=256k"), 0);
+    ASSERT_EQ(FILEIDXDBCreate(db.c_str()), 0);
+    FI_QUERY all{};
+    unsigned long long total = 0;
+    std::vector<FI_FILE_INFO_DATA> batch(8);
+    int stored = 0;
+    for (int code = 0; code == 0; stored += 8) {
+        for (FI_FILE_INFO_DATA &hit : batch) {
+            hit = Hit("s", std::to_string(stored + (&hit - batch.data())) + "/" + std::string(4000, 'x'));
+        }
+        code = FILEIDXDBInsert(db.c_str(), batch.data(), 8);
+        if (code != 0) {
+            EXPECT_EQ(VLIBCErrGet(), QUIB_ERR_NO_SPACE);
+            break;
+        }
+    }
+    ASSERT_EQ(FILEIDXCountGet(db.c_str(), &all, &total), 0);
+    EXPECT_EQ(total, static_cast<unsigned long long>(stored));
+    FI_OUTPUT_DB *out = nullptr;
+    ASSERT_EQ(FILEIDXOutputDBOpen(db.c_str(), &out), 0);
+    const FI_FILE_INFO_DATA more = Hit("t", std::string(4000, 'y'));
+    EXPECT_EQ(OUTCOME(FILEIDXOutputDBInsert(out, &more) || FILEIDXOutputDBCommit(out)).rc, 1);
+    EXPECT_EQ(FILEIDXOutputDBClose(out), -1);
+    ASSERT_EQ(FILEIDXCountGet(db.c_str(), &all, &total), 0);
+    EXPECT_EQ(total, static_cast<unsigned long long>(stored));
+    umount2(dir.c_str(), MNT_DETACH);
 }
 
 // The sqlite3 shell reads what we wrote; VLIBCExec passes arguments untouched, with a clean
