@@ -13,3 +13,12 @@ QUIB_BEGIN_C
 QUIB_API int VLIBCUnicodeUTF8StrCaseCmp(const char *s1, const char *s2);
 
 QUIB_END_C
+
+QUIB_BEGIN_C
+
+// 1 when subject matches pattern as a whole, else 0 (also for a null pattern or subject): the
+// wildcard matcher of name searches, behind the library's NvoLibStrLikeCompare (whose comment
+// states the rules) and the file index's LIKE, so both always agree. Never sets the slot.
+QUIB_API int VLIBCUnicodeUTF8LikeMatch(const char *pattern, const char *subject, int esc);
+
+QUIB_END_C

@@ -5,7 +5,7 @@ set -euo pipefail
 packages=(
   cmake g++ clang clang-format make pkg-config binutils
   libjsoncpp-dev libicu-dev libsqlite3-dev libcrypt-dev libacl1-dev acl
-  libfuse3-dev fuse3 fusefat dosfstools fuseiso genisoimage
+  libfuse3-dev fuse3 fusefat dosfstools fuseiso genisoimage sqlite3
   googletest libgtest-dev libgmock-dev libbenchmark-dev
 )
 [ "${1:-}" = "--bench" ] && packages+=(hyperfine bfs time)

@@ -9,50 +9,9 @@
 #include <string>
 #include <vector>
 
+#include "fileidx.h"  // __tag_FI_SQL_COND
 #include "norvo/export.h"
 #include "quib_stat.h"
-
-// The file index's condition record. The layout is the wire format the platform's file index
-// exchanges, so fields, order and widths are fixed: 4,112 bytes with 4-byte pointers (the
-// appliance), 4,120 on x86-64.
-enum __tag_FI_SQL_COND_TYPE : unsigned int {
-    FI_COND_NAME = 0,         // base name
-    FI_COND_REAL_PATH = 2,    // real path of the file's share
-    FI_COND_PARENT_PATH = 3,  // share-relative path of the parent folder
-    FI_COND_SHARE = 4,        // share name
-    FI_COND_PATH = 5,         // path below the share, without a leading slash
-    FI_COND_IS_DIR = 6,       // "1" directory, "0" anything else
-    FI_COND_SIZE = 7,
-    FI_COND_TYPE = 8,  // the file type used for sorting by "type"
-    FI_COND_CRTIME = 9,
-    FI_COND_CTIME = 10,
-    FI_COND_ATIME = 11,
-    FI_COND_MTIME = 12,
-    FI_COND_POSIX = 13,  // permission text
-    FI_COND_MODE = 14,
-    FI_COND_UID = 15,
-    FI_COND_GID = 16,
-    FI_COND_USER_NAME = 17,
-    FI_COND_GROUP_NAME = 18,
-};
-
-enum __tag_FI_SQL_COND_OP : unsigned int {
-    FI_OP_EQ = 0,
-    FI_OP_LT = 2,
-    FI_OP_GT = 4,
-    FI_OP_GE = 5,
-    FI_OP_LIKE = 6,           // "*" any run, "?" one character, "\" escapes
-    FI_OP_PATH_LIKE = 8,      // a path against a pattern whose "*" stands for any rest
-    FI_OP_PATH_NOT_LIKE = 9,  // the negation of FI_OP_PATH_LIKE
-};
-
-struct __tag_FI_SQL_COND {
-    __tag_FI_SQL_COND *andNext;  // must also hold; null at the end
-    __tag_FI_SQL_COND *orNext;   // may hold instead; null at the end
-    __tag_FI_SQL_COND_TYPE type;
-    __tag_FI_SQL_COND_OP op;
-    char value[4096];  // the operand as NUL-terminated text: a pattern, a name or a decimal
-};
 
 namespace FileSearch {
 

@@ -26,6 +26,7 @@
 
 #include "appliance.h"
 #include "faults.h"
+#include "fileidx.h"
 #include "norvo/norvo.h"
 #include "obx_task.h"
 #include "quib_autoblock.h"
@@ -155,6 +156,27 @@ void TaskReady(bool finished) {
     if (finished) {
         ASSERT_TRUE(task->setFinished());
     }
+}
+
+// A result database of three hits, and what a query of it gives.
+const char kIndexDb[] = "/volume1/public/hits.db";
+void FreshIndexDb(bool withHits) {
+    for (const char *suffix : {"", "-wal", "-shm"}) {
+        unlink((std::string(kIndexDb) + suffix).c_str());
+    }
+    ASSERT_EQ(FILEIDXDBCreate(kIndexDb), 0);
+    FI_FILE_INFO_DATA hits[3] = {};
+    for (int i = 0; i < 3; ++i) {
+        snprintf(hits[i].share, sizeof hits[i].share, "public");
+        snprintf(hits[i].path, sizeof hits[i].path, "dir/%c.txt", 'a' + i);
+        snprintf(hits[i].name, sizeof hits[i].name, "%c.txt", 'a' + i);
+    }
+    ASSERT_EQ(withHits ? FILEIDXDBInsert(kIndexDb, hits, 3) : 0, 0);
+}
+long long IndexedHits() {
+    FI_QUERY all{};
+    unsigned long long total = 0;
+    return FILEIDXCountGet(kIndexDb, &all, &total) == 0 ? static_cast<long long>(total) : -1;
 }
 
 const Op kOps[] = {
@@ -402,6 +424,52 @@ const Op kOps[] = {
          return Expect(bin >= 0 && deeper >= 0, bin == 1 && deeper == 0);
      },
      kPlatformSlot},
+    {"IndexCreate",  // made whole, or not at all
+     [] {
+         const bool ok = FILEIDXDBCreate(kIndexDb) == 0;
+         return Expect(ok, IndexedHits() == 0);
+     },
+     kPlatformSlot,
+     [] { unlink(kIndexDb); },
+     [] { return access(kIndexDb, F_OK) != 0 || IndexedHits() == 0 ? "" : "a damaged database"; }},
+    {"IndexInsert",  // all three hits or none
+     [] {
+         FI_FILE_INFO_DATA hits[3] = {};
+         for (int i = 0; i < 3; ++i) {
+             snprintf(hits[i].path, sizeof hits[i].path, "%d", i);
+         }
+         const bool ok = FILEIDXDBInsert(kIndexDb, hits, 3) == 0;
+         return Expect(ok, IndexedHits() == 3);
+     },
+     kPlatformSlot, [] { FreshIndexDb(false); },
+     [] { return IndexedHits() == 0 || IndexedHits() == 3 ? "" : "torn: " + std::to_string(IndexedHits()); }},
+    {"IndexOutput",
+     [] {
+         FI_OUTPUT_DB *out = nullptr;
+         FI_FILE_INFO_DATA hit{};
+         const bool ok = FILEIDXOutputDBOpen(kIndexDb, &out) == 0 && FILEIDXOutputDBInsert(out, &hit) == 0;
+         const bool closed = FILEIDXOutputDBClose(out) == 0;
+         return Expect(closed && ok, IndexedHits() == 1);
+     },
+     kPlatformSlot, [] { FreshIndexDb(false); }},
+    {"IndexSelect",
+     [] {
+         __tag_FI_SQL_COND below{};
+         FileSearch::setSqlCond(below, FI_COND_PATH, FI_OP_PATH_LIKE, std::string("dir/*"), nullptr, nullptr);
+         FI_QUERY query{&below, 1, {{FI_COND_NAME, 1}}};
+         std::string names;
+         const auto collect = [](FI_FILE_INFO_DATA *r, void *arg) { return *static_cast<std::string *>(arg) += r->name, 1; };
+         const unsigned long long limit = 2;
+         unsigned long long total = 0;
+         const bool ok = FILEIDXCountGet(kIndexDb, &query, &total) == 0 &&
+                         FILEIDXDBSelect(kIndexDb, &query, collect, &names, &limit, nullptr, 0) == 0;
+         return Expect(ok, total == 3 && names == "c.txtb.txt");
+     },
+     kPlatformSlot, [] {
+         if (IndexedHits() != 3) {
+             FreshIndexDb(true);
+         }
+     }},
     {"Walk",  // the walker reports through its log only
      [] {
          struct Names : NvoDirectoryWalkerCallBack {

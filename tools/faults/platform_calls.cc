@@ -9,6 +9,7 @@
 #include "quib_autoblock.h"
 #include "quib_cgi.h"
 
+#include "fileidx.h"
 #include "quib_dir_pass.h"
 #include "quib_fs.h"
 #include "quib_login.h"
@@ -20,6 +21,7 @@
 #include "quib_user.h"
 #include "quib_webapi.h"
 #include "quib_webutils.h"
+#include "vlibc_exec.h"
 #include "vlibc_file.h"
 #include "vlibc_line_file.h"
 #include "vlibc_support.h"
@@ -99,6 +101,53 @@ int QUIBFSMkdirP(const char *path, char *stopAt, int stopAtSize, int recursive, 
         snprintf(stopAt, static_cast<size_t>(stopAtSize), "%s", path != nullptr ? path : "");
     }
     return -1;
+}
+
+SEAM_PLATFORM(int, FILEIDXDBCreate, -1, (const char *dbPath), (dbPath))
+SEAM_PLATFORM(int, FILEIDXDBInsert, -1,
+              (const char *dbPath, const __tag_FI_FILE_INFO_DATA *records, int count),
+              (dbPath, records, count))
+SEAM_PLATFORM(int, FILEIDXDBSelect, -1,
+              (const char *dbPath, const FI_QUERY *query, FILEIDX_SELECT_CB callback, void *arg,
+               const unsigned long long *limit, const unsigned long long *offset, int flags),
+              (dbPath, query, callback, arg, limit, offset, flags))
+SEAM_PLATFORM(int, FILEIDXCountGet, -1,
+              (const char *dbPath, const FI_QUERY *query, unsigned long long *total), (dbPath, query, total))
+SEAM_PLATFORM(int, FILEIDXDBUpdate, -1,
+              (const char *dbPath, const __tag_FI_SQL_COND *setList, const __tag_FI_SQL_COND *where),
+              (dbPath, setList, where))
+SEAM_PLATFORM(int, FILEIDXDBDel, -1, (const char *dbPath, const __tag_FI_SQL_COND *where), (dbPath, where))
+SEAM_PLATFORM(int, FILEIDXOutputDBInsert, -1, (FI_OUTPUT_DB * db, const __tag_FI_FILE_INFO_DATA *record),
+              (db, record))
+SEAM_PLATFORM(int, FILEIDXOutputDBCommit, -1, (FI_OUTPUT_DB * db), (db))
+SEAM_PLATFORM(int, FILEIDXIsIndexEnable, -1, (const char *volume), (volume))
+SEAM_PLATFORM(int, FILEIDXResultGetAndTableGen, -1,
+              (const char *volume, const __tag_FI_SQL_COND *conditions,
+               const __tag_FI_SQL_COND *folderConditions, FILEIDX_ROW_FILTER filter,
+               const FI_TABLE_GEN_CONTEXT *context),
+              (volume, conditions, folderConditions, filter, context))
+SEAM_PLATFORM(int, VLIBCExec, -1, (const char *program, const char *const argv[]), (program, argv))
+
+// An output database is a record from Open to Close; Close always frees it.
+int FILEIDXOutputDBOpen(const char *dbPath, FI_OUTPUT_DB **out) {
+    SEAM_REAL(FILEIDXOutputDBOpen);
+    if (ShouldFailPlatform("FILEIDXOutputDBOpen")) {
+        if (out != nullptr) {
+            *out = nullptr;
+        }
+        return -1;
+    }
+    const int rc = real(dbPath, out);
+    if (rc == 0) {
+        seam::Track(*out, "FILEIDXOutputDBOpen");
+    }
+    return rc;
+}
+
+int FILEIDXOutputDBClose(FI_OUTPUT_DB *db) {
+    SEAM_REAL(FILEIDXOutputDBClose);
+    seam::Untrack(db);
+    return real(db);
 }
 
 // Calls that hand out a record: entered on success.
