@@ -8,4 +8,5 @@
 #include "norvo/norvosearch.h"
 #include "norvo/nvoman.h"
 #include "norvo/pathinfo.h"
+#include "norvo/searchdb.h"
 #include "norvo/subdirs.h"
