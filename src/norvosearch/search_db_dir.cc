@@ -61,22 +61,21 @@ int OpenOwnedDir(int parent, const char *name, uid_t uid, gid_t gid, mode_t mode
     }
     Fd dir(openat(parent, name, O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
     struct stat st;
+    int err = 0;
     if (dir.get() < 0 || fstat(dir.get(), &st) != 0) {
-        return errno;
-    }
-    if (st.st_uid != uid && !(made || st.st_uid == 0)) {
+        err = errno;
+    } else if (st.st_uid != uid && !(made || st.st_uid == 0)) {
         return EPERM;
+    } else if ((st.st_uid != uid && fchown(dir.get(), uid, gid) != 0) ||
+               ((st.st_mode & 07777) != mode && fchmod(dir.get(), mode) != 0) || (*out = dup(dir.get())) < 0) {
+        err = errno;
     }
-    if ((st.st_uid != uid && fchown(dir.get(), uid, gid) != 0) ||
-        ((st.st_mode & 07777) != mode && fchmod(dir.get(), mode) != 0)) {
-        const int err = errno;
-        if (made) {
-            unlinkat(parent, name, AT_REMOVEDIR);
-        }
-        return err;
+    // Left behind, a half-made folder would stand in for the real one from then on; rmdir
+    // takes only an empty one, so nothing swapped in is lost.
+    if (err != 0 && made) {
+        unlinkat(parent, name, AT_REMOVEDIR);
     }
-    *out = dup(dir.get());
-    return *out < 0 ? errno : 0;
+    return err;
 }
 
 // The temporary folders NvoCreateTmpDir made: root's directories, reached without a link, and

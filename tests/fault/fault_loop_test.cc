@@ -179,6 +179,30 @@ long long IndexedHits() {
     return FILEIDXCountGet(kIndexDb, &all, &total) == 0 ? static_cast<long long>(total) : -1;
 }
 
+// A search task of alice's with a fixed id on /volume1, its database holding the three hits
+// of FreshIndexDb when asked.
+const char kTaskDir[] = "/volume1/@tmp/norvo/FBSearch/alice";
+const char kTaskDb[] = "/volume1/@tmp/norvo/FBSearch/alice/5F5E10A3";
+void FreshTask(bool withHits) {
+    NvoSearchDBTask task("/volume1", "alice", "5F5E10A3");
+    for (const char *suffix : {"", "-wal", "-shm"}) {
+        unlink((std::string(kTaskDb) + suffix).c_str());
+    }
+    ASSERT_EQ(FILEIDXDBCreate(kTaskDb), 0);
+    FreshIndexDb(true);
+    FI_QUERY all{};
+    const unsigned long long three = 3;
+    const auto copy = [](FI_FILE_INFO_DATA *r, void *arg) {
+        return FILEIDXDBInsert(static_cast<const char *>(arg), r, 1) == 0 ? 1 : 0;
+    };
+    ASSERT_EQ(withHits ? FILEIDXDBSelect(kIndexDb, &all, copy, const_cast<char *>(kTaskDb), &three, nullptr, 0) : 0, 0);
+}
+long long TaskHits() {
+    FI_QUERY all{};
+    unsigned long long total = 0;
+    return FILEIDXCountGet(kTaskDb, &all, &total) == 0 ? static_cast<long long>(total) : -1;
+}
+
 const Op kOps[] = {
     {"DirListing",
      [] {
@@ -541,6 +565,45 @@ const Op kOps[] = {
          return Expect(true, !OBX::TaskMgr("alice").hasTask("Tovana_1"));
      },
      kNoSlot, [] { TaskReady(true); }},
+    {"SearchTaskCreate",  // the folders and an empty database, or no folder of the wrong owner
+     [] {
+         std::unique_ptr<NvoSearchDBTask> task(NvoSearchDBTaskMgr("alice").createDBTask("/volume1", nullptr));
+         const bool ok = task && FILEIDXDBCreate(task->getDBTaskFilePath().c_str()) == 0;
+         struct stat st {};
+         return Expect(ok, stat(kTaskDir, &st) == 0 && (st.st_mode & 07777) == 0700 && st.st_uid == g_app->Uid("alice"));
+     },
+     kEitherSlot, [] { fs::remove_all("/volume1/@tmp"); },
+     [] {
+         struct stat st {};
+         return stat(kTaskDir, &st) != 0 || ((st.st_mode & 07777) == 0700 && st.st_uid == g_app->Uid("alice"))
+                    ? "" : "a task folder of the wrong mode or owner";
+     }},
+    {"SearchTaskInsert",
+     [] {
+         NvoSearchDBTask task("/volume1", "alice", "5F5E10A3");
+         _tag_QUIBSTAT_ st{};
+         st.st_mode = 0100644;
+         const bool ok = task.insertFile("public", kDir + "/a.txt", "public", kDir + "/a.txt", st);
+         return Expect(ok, TaskHits() == 1);
+     },
+     kEitherSlot, [] { FreshTask(false); },
+     [] { return TaskHits() == 0 || TaskHits() == 1 ? "" : "torn: " + std::to_string(TaskHits()); }},
+    {"SearchTaskQuery",
+     [] {
+         const NvoSearchDBTask task("/volume1", "alice", "5F5E10A3");
+         const bool desc = true;
+         const auto all = static_cast<_tag_dir_entry_type_>(2);
+         std::string names;
+         const auto collect = [](FI_FILE_INFO_DATA *r, void *arg) { return *static_cast<std::string *>(arg) += r->name, 1; };
+         unsigned long long total = 0;
+         const bool ok = task.queryResult(1, 1, "name", &desc, &all, "TXT", collect, &names, &total);
+         return Expect(ok, total == 3 && names == "b.txt");
+     },
+     kEitherSlot, [] {
+         if (TaskHits() != 3) {
+             FreshTask(true);
+         }
+     }},
 };
 
 // Runs op with call n failing with err for n = 1, 2, ... until a run gets through.
