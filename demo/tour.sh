@@ -129,4 +129,12 @@ show "Another request waits until the task has written its progress (limit 300: 
 sleep 1
 show "The task has finished; a clean-up keeps it until it is two days old" \
     tasks --user alice clean
+task=$("$NORVO" --json search-db --user alice --volume /volume1 create | sed 's/.*"task":"\([0-9A-F]*\)".*/\1/')
+printf '\n   (alice'"'"'s new search task: %s)\n' "$task"
+show "alice's search stores hits in a task database of her own (her folder 0700, the file 0600)" \
+    search-db --user alice --volume /volume1 --task "$task" insert /volume1/photo/2024 /volume1/photo/2024/beach.jpg /volume1/photo/2024/party.mov
+show "A later request pages the hits sorted by size, largest first" \
+    search-db --user alice --volume /volume1 --task "$task" list --sort size --desc --limit 10
+show "A task id that getUniqueID would never make reaches no path: no such task" \
+    search-db --user alice --volume /volume1 --task ../../etc list
 printf '\nEnd of the tour.\n'

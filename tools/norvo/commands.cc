@@ -215,6 +215,30 @@ std::vector<CommandDef> MakeCommands() {
           {"steps", "N", false, "the demo worker's steps, 200 ms each (default 5)"}},
          {{"ACTION", "list, show, wait, kill, clean or start"}, {"ARG...", "ID, or ID KEY for wait"}},
          RunTasks},
+        {"search-db",
+         "a search task's result database: create, insert, list, delete, remove",
+         "Works as USER (initgroups, setegid, seteuid: needs root) on USER's search tasks on VOLUME\n"
+         "(/volume1), each a database under VOLUME/@tmp/norvo/FBSearch/USER. ACTION is one of:\n"
+         "  create           a new task (or the task --task ID) and its empty database\n"
+         "  insert PATH...   stores the hits of real paths (/volume1/photo/2013/a.jpg; the share is\n"
+         "                   the second component)\n"
+         "  list             a page of hits: --offset, --limit (default 50), --sort KEY (name, size,\n"
+         "                   mtime, crtime, ctime, atime, user, group, posix, type, ppath) with\n"
+         "                   --desc, --type file|dir|all, --pattern P (names containing P)\n"
+         "  delete PATH      the hit of PATH and every hit below it\n"
+         "  remove           the task's database\n"
+         "Every action but create needs --task ID. The sqlite3 shell reads the database.",
+         {{"user", "USER", true, kUserHelp},
+          {"volume", "VOLUME", true, "the volume of the task: /volume1, /volumeUSB1, ..."},
+          {"task", "ID", false, "the task's id (create: an id of one's choosing)"},
+          {"offset", "N", false, "list: the first hit of the page (default 0)"},
+          {"limit", "N", false, "list: the page's size (default 50)"},
+          {"sort", "KEY", false, "list: the sort key"},
+          {"desc", nullptr, false, "list: with --sort, descending"},
+          {"type", "WORD", false, "list: file, dir or all (default)"},
+          {"pattern", "P", false, "list: names containing P (* and ? are wildcards)"}},
+         {{"ACTION", "create, insert, list, delete or remove"}, {"PATH...", "real paths for insert and delete"}},
+         RunSearchDb},
     };
 }
 

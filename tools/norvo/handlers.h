@@ -17,5 +17,6 @@ int RunLs(const Invocation &inv);          // cmd_ls.cc
 int RunWalk(const Invocation &inv);        // cmd_walk.cc
 int RunSubdirs(const Invocation &inv);     // cmd_subdirs.cc
 int RunTasks(const Invocation &inv);       // cmd_tasks.cc
+int RunSearchDb(const Invocation &inv);    // cmd_search_db.cc
 
 }  // namespace norvo::cli
