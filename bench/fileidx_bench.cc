@@ -8,18 +8,26 @@
 //  - Page: 100 hits at offset 50,000 sorted by name (FILEIDXDBSelect), against the same query
 //    in the sqlite3 shell on the same file (SQLite's NOCASE collation, process start included).
 //    Goal: x_shell <= 1.2.
+//  - The same two through a search task (NvoSearchDBTask): each hit made from a real path and
+//    a stat record by the task's own record filling (split, permission text, type) and
+//    inserted with FILEIDXOutputDBInsert, against the floor; and queryResult's page (the count
+//    of all hits included), against the shell.
 #include <sqlite3.h>
 #include <stdio.h>
+#include <string.h>
 #include <time.h>
 #include <unistd.h>
 
 #include <chrono>
 #include <functional>
+#include <memory>
 #include <string>
 
 #include <benchmark/benchmark.h>
 
 #include "appliance.h"
+#include "norvo/searchdb.h"
+#include "norvosearch/search_db_record.h"
 #include "fileidx.h"
 #include "vlibc_exec.h"
 
@@ -111,6 +119,30 @@ void InsertFloor(const std::string &path) {
     sqlite3_close(db);
 }
 
+// The walk's path through the task: the real path and status of entry i become its record.
+void InsertThroughTask(const std::string &path) {
+    static FI_FILE_INFO_DATA hit, names;
+    FI_OUTPUT_DB *out = nullptr;
+    bool ok = FILEIDXOutputDBOpen(path.c_str(), &out) == 0;
+    std::string root, rest;
+    for (int i = 0; ok && i < kHits; ++i) {
+        MakeHit(i, &names);
+        _tag_QUIBSTAT_ st{};
+        st.st_mode = 0100644;
+        st.st_size = names.size;
+        st.st_mtim.tv_sec = st.st_atim.tv_sec = st.st_ctim.tv_sec = static_cast<int32_t>(names.mtime);
+        const std::string real = std::string("/volume1/photo/") + names.path;
+        ok = norvo::search::SplitRealPath(real, &root, &rest) == norvo::search::SplitResult::kOk;
+        norvo::search::FillHit(norvo::search::KeyShare("photo"), root, rest, st, &hit);
+        memcpy(hit.userName, names.userName, sizeof hit.userName);  // the walk's name caches
+        memcpy(hit.groupName, names.groupName, sizeof hit.groupName);
+        ok = ok && FILEIDXOutputDBInsert(out, &hit) == 0;
+    }
+    if (FILEIDXOutputDBClose(out) != 0 || !ok) {
+        abort();
+    }
+}
+
 double CpuNow() {
     timespec now{};
     clock_gettime(CLOCK_PROCESS_CPUTIME_ID, &now);
@@ -143,6 +175,15 @@ void InsertFloorBench(benchmark::State &state) {
 void InsertOutputBench(benchmark::State &state) {
     double cpu = 0;
     const double seconds = TimeInserts(state, InsertThroughOutput, &cpu);
+    if (g_floorSeconds > 0) {
+        state.counters["x_floor"] = seconds / g_floorSeconds;
+        state.counters["cpu_x_floor"] = cpu / g_floorCpu;
+    }
+}
+
+void InsertTaskBench(benchmark::State &state) {
+    double cpu = 0;
+    const double seconds = TimeInserts(state, InsertThroughTask, &cpu);
     if (g_floorSeconds > 0) {
         state.counters["x_floor"] = seconds / g_floorSeconds;
         state.counters["cpu_x_floor"] = cpu / g_floorCpu;
@@ -186,6 +227,22 @@ void PageBench(benchmark::State &state) {
     }
 }
 
+std::unique_ptr<NvoSearchDBTask> g_task;
+
+void TaskPageBench(benchmark::State &state) {
+    const bool desc = false;
+    const double seconds = TimePages(state, [&] {
+        int hits = 0;
+        unsigned long long total = 0;
+        const auto count = [](FI_FILE_INFO_DATA *, void *arg) { return ++*static_cast<int *>(arg), 1; };
+        return g_task->queryResult(50000, 100, "name", &desc, nullptr, nullptr, count, &hits, &total) &&
+               hits == 100 && total == kHits;
+    });
+    if (g_shellSeconds > 0) {
+        state.counters["x_shell"] = seconds / g_shellSeconds;
+    }
+}
+
 }  // namespace
 
 int main(int argc, char **argv) {
@@ -193,10 +250,18 @@ int main(int argc, char **argv) {
     norvo::testing::Appliance appliance;
     appliance.Basic();
     InsertThroughOutput(FreshDb("page.db"));
+    g_task.reset(NvoSearchDBTaskMgr("alice").createDBTask("/volume1", nullptr));
+    if (!g_task || FILEIDXDBCreate(g_task->getDBTaskFilePath().c_str()) != 0) {
+        abort();
+    }
+    InsertThroughTask(g_task->getDBTaskFilePath());
     benchmark::RegisterBenchmark("InsertFloor", InsertFloorBench)
         ->Unit(benchmark::kMillisecond)
         ->Iterations(5);
     benchmark::RegisterBenchmark("FILEIDXOutputDBInsert", InsertOutputBench)
+        ->Unit(benchmark::kMillisecond)
+        ->Iterations(5);
+    benchmark::RegisterBenchmark("TaskWalkInsert", InsertTaskBench)
         ->Unit(benchmark::kMillisecond)
         ->Iterations(5);
     benchmark::RegisterBenchmark("PageInSqliteShell", PageShellBench)
@@ -205,7 +270,11 @@ int main(int argc, char **argv) {
     benchmark::RegisterBenchmark("FILEIDXDBSelectPage", PageBench)
         ->Unit(benchmark::kMillisecond)
         ->Iterations(10);
+    benchmark::RegisterBenchmark("TaskQueryResultPage", TaskPageBench)
+        ->Unit(benchmark::kMillisecond)
+        ->Iterations(10);
     benchmark::RunSpecifiedBenchmarks();
+    g_task.reset();
     benchmark::Shutdown();
     return 0;
 }
