@@ -11,6 +11,7 @@
 #include <filesystem>
 #include <fstream>
 #include <functional>
+#include <map>
 #include <memory>
 #include <random>
 #include <regex>
@@ -119,9 +120,10 @@ TEST_F(SearchDb, BadVolumesUsersAndIdsTouchNothing) {
 }
 
 struct Ref {
-    std::string share, path, name, ppath, user;
-    long long size, mtime;
+    std::string share, path;
     bool dir;
+    std::map<std::string, std::string> text;  // by sort key; "ppath" is the parent folder
+    std::map<std::string, long long> number;
 };
 
 // Every sort key and direction, paged in random steps, gives the reference order (ties in the
@@ -130,61 +132,64 @@ TEST_F(SearchDb, PagesFollowTheReferenceOrder) {
     std::unique_ptr<NvoSearchDBTask> task = NewTask();
     std::mt19937 random(7);
     std::vector<Ref> refs;
-    const Strings names = {"a", "B", "b", "doc", "Doc.txt", "x.doc", "é", "É"};
+    const Strings stems = {"a", "B", "b", "doc", "é", "É"}, exts = {"", ".txt", ".TXT", ".doc"};
+    const std::pair<mode_t, const char *> modes[] = {{0644, "rw-r--r--"}, {0600, "rw-------"}, {0755, "rwxr-xr-x"}};
     for (int i = 0; i < 60; ++i) {
         Ref r;
-        r.share = i % 3 ? "photo" : "home";
-        r.ppath = "d" + std::to_string(random() % 3);
-        r.name = names[random() % names.size()] + std::to_string(i % 2);
-        r.path = r.ppath + "/" + r.name + "_" + std::to_string(i);
-        r.name += "_" + std::to_string(i);
+        const std::string share = i % 3 ? "photo" : "home", ext = exts[random() % exts.size()];
         r.dir = random() % 4 == 0;
-        r.size = r.dir ? 0 : random() % 3;
-        r.mtime = static_cast<long long>(random() % 3) - 1;
+        r.text["ppath"] = "d" + std::to_string(random() % 3);
+        r.text["name"] = stems[random() % stems.size()] + "_" + std::to_string(i) + ext;
+        r.text["type"] = r.dir || ext.empty() ? "" : ext == ".TXT" ? "txt" : ext.substr(1);
+        r.text["user"] = i % 2 ? "alice" : "bob";
+        r.text["group"] = i % 3 ? "users" : "staff";
+        const auto &mode = modes[random() % 3];
+        r.text["posix"] = mode.second;
         _tag_QUIBSTAT_ st{};
-        st.st_mode = r.dir ? 040755 : 0100644;
-        st.st_size = r.dir ? 99 : r.size;  // a directory's own size is never stored
-        st.st_mtim.tv_sec = static_cast<int32_t>(r.mtime);
-        st.st_uid = i % 2 ? app.Uid("alice") : app.Uid("bob");
-        r.user = i % 2 ? "alice" : "bob";
-        const std::string real = "/volume1/" + r.share + "/" + r.path;
-        ASSERT_TRUE(task->insertFile(r.share, real, r.share, real, st));
-        r.share = r.share == "home" ? "homes" : r.share;
+        st.st_mode = mode.first | (r.dir ? S_IFDIR : S_IFREG);
+        st.st_uid = app.Uid(r.text["user"]);
+        st.st_gid = app.Gid(r.text["group"]);
+        st.st_size = r.dir ? 99 : random() % 3;  // a directory's own size is never stored
+        r.number["size"] = r.dir ? 0 : st.st_size;
+        for (auto [key, time] : {std::pair{"crtime", &st.st_crtim}, {"ctime", &st.st_ctim}, {"atime", &st.st_atim},
+                                 {"mtime", &st.st_mtim}}) {
+            time->tv_sec = static_cast<int32_t>(random() % 3) - 1;
+            r.number[key] = time->tv_sec;
+        }
+        r.path = r.text["ppath"] + "/" + r.text["name"];
+        const std::string real = "/volume1/" + share + "/" + r.path;
+        ASSERT_TRUE(task->insertFile(share, real, share, real, st));
+        r.share = share == "home" ? "homes" : share;
         refs.push_back(r);
     }
     const auto text = [](const std::string &a, const std::string &b) { return VLIBCUnicodeUTF8StrCaseCmp(a.c_str(), b.c_str()); };
-    const struct {
-        const char *key;
-        std::function<int(const Ref &, const Ref &)> cmp;
-    } keys[] = {
-        {"name", [&](const Ref &a, const Ref &b) { return text(a.name, b.name); }},
-        {"bogus", [&](const Ref &a, const Ref &b) { return text(a.name, b.name); }},
-        {"size", [](const Ref &a, const Ref &b) { return (a.size > b.size) - (a.size < b.size); }},
-        {"mtime", [](const Ref &a, const Ref &b) { return (a.mtime > b.mtime) - (a.mtime < b.mtime); }},
-        {"user", [&](const Ref &a, const Ref &b) { return text(a.user, b.user); }},
-        {"ppath", [&](const Ref &a, const Ref &b) { return text(a.share, b.share) ? text(a.share, b.share) : text(a.ppath, b.ppath); }},
-    };
-    for (const auto &key : keys) {
+    for (const std::string key : {"name", "bogus", "user", "group", "posix", "type", "ppath", "size", "mtime", "crtime",
+                                  "ctime", "atime"}) {
+        const auto cmp = [&](Ref a, Ref b) -> int {
+            if (key == "ppath" && text(a.share, b.share) != 0) return text(a.share, b.share);
+            if (a.number.count(key)) return (a.number[key] > b.number[key]) - (a.number[key] < b.number[key]);
+            return a.text.count(key) ? text(a.text[key], b.text[key]) : text(a.text["name"], b.text["name"]);
+        };
         for (const bool desc : {false, true}) {
             std::vector<Ref> want = refs;
             std::stable_sort(want.begin(), want.end(), [&](const Ref &a, const Ref &b) {
-                return desc ? key.cmp(b, a) < 0 : key.cmp(a, b) < 0;
+                return desc ? cmp(b, a) < 0 : cmp(a, b) < 0;
             });
             Strings expected, got;
             for (const Ref &r : want) expected.push_back(r.share + ":" + r.path);
             while (got.size() < refs.size() + 3) {
-                const Strings page = Page(*task, got.size(), 1 + random() % 7, key.key, desc);
+                const Strings page = Page(*task, got.size(), 1 + random() % 7, key.c_str(), desc);
                 if (page.empty()) break;
                 got.insert(got.end(), page.begin(), page.end());
             }
-            EXPECT_EQ(got, expected) << key.key << (desc ? " desc" : "");
+            EXPECT_EQ(got, expected) << key << (desc ? " desc" : "");
         }
     }
     for (const auto &[type, pattern] : std::vector<std::pair<int, const char *>>{{2, "doc"}, {1, "DOC"}, {0, ""}, {7, "é"}}) {
         unsigned long long total = 0;
         Page(*task, 0, 1000, nullptr, false, type, pattern, &total);
         const auto n = std::count_if(refs.begin(), refs.end(), [&](const Ref &r) {
-            return (type == 2 || r.dir == (type != 1)) && NvoLibStrLikeCompare(("*" + std::string(pattern) + "*").c_str(), r.name.c_str(), '\\') == 1;
+            return (type == 2 || r.dir == (type != 1)) && NvoLibStrLikeCompare(("*" + std::string(pattern) + "*").c_str(), r.text.at("name").c_str(), '\\') == 1;
         });
         EXPECT_EQ(total, static_cast<unsigned long long>(n)) << type << pattern;
     }
