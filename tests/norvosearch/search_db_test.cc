@@ -185,11 +185,13 @@ TEST_F(SearchDb, PagesFollowTheReferenceOrder) {
             EXPECT_EQ(got, expected) << key << (desc ? " desc" : "");
         }
     }
-    for (const auto &[type, pattern] : std::vector<std::pair<int, const char *>>{{2, "doc"}, {1, "DOC"}, {0, ""}, {7, "é"}}) {
+    for (const auto &filter : std::vector<std::pair<int, std::string>>{{2, "doc"}, {1, "DOC"}, {0, ""}, {7, "é"}}) {
+        const int type = filter.first;
+        const std::string pattern = filter.second;
         unsigned long long total = 0;
-        Page(*task, 0, 1000, nullptr, false, type, pattern, &total);
+        Page(*task, 0, 1000, nullptr, false, type, pattern.c_str(), &total);
         const auto n = std::count_if(refs.begin(), refs.end(), [&](const Ref &r) {
-            return (type == 2 || r.dir == (type != 1)) && NvoLibStrLikeCompare(("*" + std::string(pattern) + "*").c_str(), r.text.at("name").c_str(), '\\') == 1;
+            return (type == 2 || r.dir == (type != 1)) && NvoLibStrLikeCompare(("*" + pattern + "*").c_str(), r.text.at("name").c_str(), '\\') == 1;
         });
         EXPECT_EQ(total, static_cast<unsigned long long>(n)) << type << pattern;
     }
