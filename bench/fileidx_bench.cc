@@ -26,9 +26,9 @@
 #include <benchmark/benchmark.h>
 
 #include "appliance.h"
+#include "fileidx.h"
 #include "norvo/searchdb.h"
 #include "norvosearch/search_db_record.h"
-#include "fileidx.h"
 #include "vlibc_exec.h"
 
 namespace {

@@ -8,9 +8,9 @@
 //
 // Untrusted input: the volume must be a volume's own folder ("/volume1", never a path below or
 // beside it), the task id must be what getUniqueID makes (upper-case hexadecimal, 2 to 16
-// digits, no leading zero) and the user a single path component. Anything else is refused
-// before it reaches a path (the platform error 0x0D00, the line "Bad Parameter") and nothing on
-// disk is touched.
+// digits, no leading zero) and the user a single path component without control characters.
+// Anything else is refused before it reaches a path (the platform error 0x0D00, the line
+// "Bad Parameter") and nothing on disk is touched.
 #pragma once
 #include <string>
 
@@ -79,8 +79,8 @@ public:
     // or empty: any). *total receives the number of matching hits. false at once for a limit
     // of 0 or a null total (*total untouched).
     bool queryResult(unsigned long offset, unsigned long limit, const char *sortBy, const bool *sortDesc,
-                     const _tag_dir_entry_type_ *type, const char *pattern, FILEIDX_SELECT_CB callback, void *arg,
-                     unsigned long long *total) const;
+                     const _tag_dir_entry_type_ *type, const char *pattern, FILEIDX_SELECT_CB callback,
+                     void *arg, unsigned long long *total) const;
     // Deletes the database file; true when unlink succeeds.
     bool remove();
 

@@ -67,7 +67,8 @@ int OpenOwnedDir(int parent, const char *name, uid_t uid, gid_t gid, mode_t mode
     } else if (st.st_uid != uid && !(made || st.st_uid == 0)) {
         return EPERM;
     } else if ((st.st_uid != uid && fchown(dir.get(), uid, gid) != 0) ||
-               ((st.st_mode & 07777) != mode && fchmod(dir.get(), mode) != 0) || (*out = dup(dir.get())) < 0) {
+               ((st.st_mode & 07777) != mode && fchmod(dir.get(), mode) != 0) ||
+               (*out = dup(dir.get())) < 0) {
         err = errno;
     }
     // Left behind, a half-made folder would stand in for the real one from then on; rmdir
@@ -89,7 +90,8 @@ int OpenTmpDir(int parent, const char *name, int *out) {
     if (st.st_uid != 0) {
         return EPERM;
     }
-    if ((st.st_mode & S_ISVTX) == 0 && geteuid() == 0 && fchmod(dir.get(), (st.st_mode & 07777) | S_ISVTX) != 0) {
+    if ((st.st_mode & S_ISVTX) == 0 && geteuid() == 0 &&
+        fchmod(dir.get(), (st.st_mode & 07777) | S_ISVTX) != 0) {
         return errno;
     }
     *out = dup(dir.get());
@@ -153,14 +155,16 @@ std::string NvoSearchDBTask::getDBTaskDir(const char *volume, const char *user) 
 std::string NvoSearchDBTask::getDBTaskFilePath(const char *volume, const char *user, const char *taskId) {
     return norvo::Guarded(std::string(), [&] {
         char buffer[4096] = {0};
-        snprintf(buffer, sizeof buffer, "%s/%s", getDBTaskDir(volume, user).c_str(), taskId != nullptr ? taskId : "");
+        snprintf(buffer, sizeof buffer, "%s/%s", getDBTaskDir(volume, user).c_str(),
+                 taskId != nullptr ? taskId : "");
         return std::string(buffer);
     });
 }
 
 bool NvoSearchDBTask::checkDBTaskDirExists(const char *volume, const char *user) {
     return norvo::Guarded(false, [&] {
-        return IsVolume(volume) && IsUserComponent(user) && access(getDBTaskDir(volume, user).c_str(), F_OK) == 0;
+        return IsVolume(volume) && IsUserComponent(user) &&
+               access(getDBTaskDir(volume, user).c_str(), F_OK) == 0;
     });
 }
 
@@ -225,15 +229,15 @@ bool NvoSearchDBTask::createDBTaskDir(const char *volume, const char *owner, con
         if (NvoCreateTmpDir(volume) != 0) {
             const int err = errno;
             NVO_SET_QUIB_ERR(kNorvoSearch, err == ENOSPC ? kErrDiskFull : QUIB_ERR_FAILED);
-            NVO_LOG(kNorvoSearch, "%s(%d): failed to create tmp folder %s/%s/%s, errno=%s(%d)", volume, "@tmp", "norvo",
-                    strerror(err), err);
+            NVO_LOG(kNorvoSearch, "%s(%d): failed to create tmp folder %s/%s/%s, errno=%s(%d)", volume,
+                    "@tmp", "norvo", strerror(err), err);
             return false;
         }
         std::string where;
         if (const int err = MakeTaskFolders(volume, owner, &where)) {
             NVO_SET_QUIB_ERR(kNorvoSearch, err == ENOSPC ? kErrDiskFull : QUIB_ERR_FAILED);
-            NVO_LOG(kNorvoSearch, "%s(%d): failed to create task folder %s, errno=%s(%d)", where.c_str(), strerror(err),
-                    err);
+            NVO_LOG(kNorvoSearch, "%s(%d): failed to create task folder %s, errno=%s(%d)", where.c_str(),
+                    strerror(err), err);
             return false;
         }
         return true;

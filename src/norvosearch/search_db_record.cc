@@ -41,14 +41,15 @@ std::string TypeText(const char *name, bool isDir) {
     return ext;
 }
 
-void FillHit(const std::string &share, const std::string &root, const std::string &rest, const _tag_QUIBSTAT_ &st,
-             FI_FILE_INFO_DATA *r) {
+void FillHit(const std::string &share, const std::string &root, const std::string &rest,
+             const _tag_QUIBSTAT_ &st, FI_FILE_INFO_DATA *r) {
     const size_t slash = rest.rfind('/');
     const std::string name = slash == std::string::npos ? rest : rest.substr(slash + 1);
     const bool isDir = S_ISDIR(st.st_mode);
     snprintf(r->name, sizeof r->name, "%s", name.c_str());
     snprintf(r->realPath, sizeof r->realPath, "%s", root.c_str());
-    snprintf(r->parentPath, sizeof r->parentPath, "%s", slash == std::string::npos ? "" : rest.substr(0, slash).c_str());
+    snprintf(r->parentPath, sizeof r->parentPath, "%s",
+             slash == std::string::npos ? "" : rest.substr(0, slash).c_str());
     snprintf(r->share, sizeof r->share, "%s", share.c_str());
     snprintf(r->path, sizeof r->path, "%s", rest.c_str());
     snprintf(r->type, sizeof r->type, "%s", TypeText(name.c_str(), isDir).c_str());
@@ -81,8 +82,17 @@ bool IsTaskId(const char *taskId) {
 }
 
 bool IsUserComponent(const char *user) {
-    return user != nullptr && user[0] != '\0' && strcmp(user, ".") != 0 && strcmp(user, "..") != 0 &&
-           strchr(user, '/') == nullptr && strlen(user) < 256;
+    if (user == nullptr || user[0] == '\0' || strcmp(user, ".") == 0 || strcmp(user, "..") == 0) {
+        return false;
+    }
+    size_t length = 0;
+    for (; user[length] != '\0'; ++length) {
+        const unsigned char c = static_cast<unsigned char>(user[length]);
+        if (c == '/' || c < 0x20 || c == 0x7F) {
+            return false;
+        }
+    }
+    return length < 256;
 }
 
 }  // namespace norvo::search

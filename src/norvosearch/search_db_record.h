@@ -18,8 +18,8 @@ std::string KeyShare(const std::string &share);
 
 // Fills *r for the entry at rest below the share folder root (share: the key's share name).
 // Directories are stored with size 0, as the in-memory size test counts them.
-void FillHit(const std::string &share, const std::string &root, const std::string &rest, const _tag_QUIBSTAT_ &st,
-             FI_FILE_INFO_DATA *r);
+void FillHit(const std::string &share, const std::string &root, const std::string &rest,
+             const _tag_QUIBSTAT_ &st, FI_FILE_INFO_DATA *r);
 
 // What sorting by "type" orders by: the lower-case extension of a file ("" for folders and
 // names without one).
@@ -29,7 +29,7 @@ std::string TypeText(const char *name, bool isDir);
 bool IsVolume(const char *volume);
 // What getUniqueID makes: 2 to 16 upper-case hexadecimal digits, the first not 0.
 bool IsTaskId(const char *taskId);
-// One path component: not empty, ".", "..", and without "/".
+// One path component: not empty, ".", "..", and without "/" or a control character.
 bool IsUserComponent(const char *user);
 
 }  // namespace norvo::search

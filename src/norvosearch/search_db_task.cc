@@ -35,14 +35,15 @@ struct Key {
 // Splits path as a key needs it, logging what is missing. false for a malformed path.
 bool Split(const std::string &share, const std::string &path, std::string *root, std::string *rest) {
     switch (SplitRealPath(path, root, rest)) {
-    case SplitResult::kNoShare:
-        NVO_LOG(kNorvoSearch, "%s:%d Fail to find the share name %s from %s", share.c_str(), path.c_str());
-        return false;
-    case SplitResult::kNoPath:
-        NVO_LOG(kNorvoSearch, "%s:%d Fail to find the path name %s", path.c_str());
-        return false;
-    case SplitResult::kOk:
-        break;
+        case SplitResult::kNoShare:
+            NVO_LOG(kNorvoSearch, "%s:%d Fail to find the share name %s from %s", share.c_str(),
+                    path.c_str());
+            return false;
+        case SplitResult::kNoPath:
+            NVO_LOG(kNorvoSearch, "%s:%d Fail to find the path name %s", path.c_str());
+            return false;
+        case SplitResult::kOk:
+            break;
     }
     return true;
 }
@@ -129,8 +130,8 @@ void NameOf(uid_t uid, gid_t gid, FI_FILE_INFO_DATA *r) {
 
 }  // namespace
 
-bool NvoSearchDBTask::insertFile(std::string share, std::string path, std::string realShare, std::string realPath,
-                                 _tag_QUIBSTAT_ &st) {
+bool NvoSearchDBTask::insertFile(std::string share, std::string path, std::string realShare,
+                                 std::string realPath, _tag_QUIBSTAT_ &st) {
     return norvo::Guarded(false, [&] {
         Key key;
         if (!MakeKey(share, path, &key)) {
@@ -200,8 +201,8 @@ bool NvoSearchDBTask::updatePermRecs(std::string share, std::string path, const 
     });
 }
 
-bool NvoSearchDBTask::updateFile(std::string share, std::string path, std::string newShare, std::string newPath,
-                                 _tag_QUIBSTAT_ &st) {
+bool NvoSearchDBTask::updateFile(std::string share, std::string path, std::string newShare,
+                                 std::string newPath, _tag_QUIBSTAT_ &st) {
     return norvo::Guarded(false, [&] {
         Key key;
         std::string root, rest;
@@ -249,8 +250,8 @@ bool NvoSearchDBTask::updateFileInFolder(std::string share, std::string path, st
             _tag_QUIBSTAT_ st{};
             if (VLIBCFileLStat(real.c_str(), QUIB_STAT_BASIC | QUIB_STAT_CRTIME, &st) != 0) {
                 const int err = errno;
-                NVO_LOG(kNorvoSearch, "%s:%d VLIBCFileLStat: (%s), %s, quiberr=%x.", real.c_str(), strerror(err),
-                        VLIBCErrGet());
+                NVO_LOG(kNorvoSearch, "%s:%d VLIBCFileLStat: (%s), %s, quiberr=%x.", real.c_str(),
+                        strerror(err), VLIBCErrGet());
                 continue;
             }
             __tag_FI_SQL_COND where{}, whereShare{};
@@ -280,9 +281,9 @@ bool NvoSearchDBTask::queryResult(unsigned long offset, unsigned long limit, con
             static const struct {
                 const char *word;
                 __tag_FI_SQL_COND_TYPE column;
-            } kKeys[] = {{"size", FI_COND_SIZE},       {"mtime", FI_COND_MTIME},   {"crtime", FI_COND_CRTIME},
-                         {"ctime", FI_COND_CTIME},     {"atime", FI_COND_ATIME},   {"user", FI_COND_USER_NAME},
-                         {"group", FI_COND_GROUP_NAME}, {"posix", FI_COND_POSIX},  {"type", FI_COND_TYPE},
+            } kKeys[] = {{"size", FI_COND_SIZE},        {"mtime", FI_COND_MTIME}, {"crtime", FI_COND_CRTIME},
+                         {"ctime", FI_COND_CTIME},      {"atime", FI_COND_ATIME}, {"user", FI_COND_USER_NAME},
+                         {"group", FI_COND_GROUP_NAME}, {"posix", FI_COND_POSIX}, {"type", FI_COND_TYPE},
                          {"ppath", FI_COND_PARENT_PATH}};
             __tag_FI_SQL_COND_TYPE column = FI_COND_NAME;
             for (const auto &key : kKeys) {

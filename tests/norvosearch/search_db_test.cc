@@ -106,7 +106,7 @@ TEST_F(SearchDb, BadVolumesUsersAndIdsTouchNothing) {
     const struct {
         const char *volume, *user, *id;
     } rows[] = {{"/volume1/..", "alice", nullptr}, {"/volume1/photo", "alice", nullptr}, {"/tmp", "alice", nullptr},
-                {"/volume1", "..", nullptr},        {"/volume1", "a/b", nullptr},         {"/volume1", "alice", "../x"},
+                {"/volume1", "..", nullptr},        {"/volume1", "a/b", nullptr}, {"/volume1", "a\nb", nullptr},         {"/volume1", "alice", "../x"},
                 {"/volume1", "alice", "5f5e"},      {"/volume1", "alice", "0A"},          {"/volume1", "alice", "A"},
                 {"/volume1", "alice", "12345678901234567"}};
     for (const auto &row : rows) {
@@ -116,7 +116,7 @@ TEST_F(SearchDb, BadVolumesUsersAndIdsTouchNothing) {
         EXPECT_FALSE(NvoSearchDBTask(row.volume, row.user, row.id).createDBTaskDir(row.volume, row.user, row.id));
     }
     EXPECT_NE(access("/volume1/@tmp", F_OK), 0);
-    EXPECT_EQ(app.ErrorLines(), Strings(30, "norvosearch.cpp:# Bad Parameter"));
+    EXPECT_EQ(app.ErrorLines(), Strings(33, "norvosearch.cpp:# Bad Parameter"));
 }
 
 struct Ref {

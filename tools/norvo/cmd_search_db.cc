@@ -74,14 +74,17 @@ int List(const Invocation &inv, const NvoSearchDBTask &task) {
     if (typeWord != "file" && typeWord != "dir" && typeWord != "all") {
         return ReportUsageError(inv.command, "--type wants file, dir or all, not " + typeWord);
     }
-    const _tag_dir_entry_type_ type =
-        typeWord == "file" ? DIR_ENTRY_TYPE_FILE : typeWord == "dir" ? DIR_ENTRY_TYPE_DIR : DIR_ENTRY_TYPE_ALL;
+    const _tag_dir_entry_type_ type = typeWord == "file"  ? DIR_ENTRY_TYPE_FILE
+                                      : typeWord == "dir" ? DIR_ENTRY_TYPE_DIR
+                                                          : DIR_ENTRY_TYPE_ALL;
     const bool desc = inv.Has("desc");
     Listing listing{inv.json};
     unsigned long long total = 0;
-    if (!task.queryResult(static_cast<unsigned long>(offset), static_cast<unsigned long>(limit), inv.CStr("sort"),
-                          inv.Has("sort") ? &desc : nullptr, &type, inv.CStr("pattern"), PrintHit, &listing, &total)) {
-        return limit == 0 ? ReportFailure(inv, 400, "a page of no hits") : TaskFailure(inv, "the task's hits");
+    if (!task.queryResult(static_cast<unsigned long>(offset), static_cast<unsigned long>(limit),
+                          inv.CStr("sort"), inv.Has("sort") ? &desc : nullptr, &type, inv.CStr("pattern"),
+                          PrintHit, &listing, &total)) {
+        return limit == 0 ? ReportFailure(inv, 400, "a page of no hits")
+                          : TaskFailure(inv, "the task's hits");
     }
     Json::Value data(Json::objectValue);
     data["total"] = static_cast<Json::UInt64>(total);
@@ -98,8 +101,10 @@ int RunSearchDb(const Invocation &inv) {
     const std::string &action = inv.arguments[0];
     const std::vector<std::string> paths(inv.arguments.begin() + 1, inv.arguments.end());
     const bool wantsPaths = action == "insert" || action == "delete";
-    if (action != "create" && action != "insert" && action != "list" && action != "delete" && action != "remove") {
-        return ReportUsageError(inv.command, "ACTION is create, insert, list, delete or remove, not " + action);
+    if (action != "create" && action != "insert" && action != "list" && action != "delete" &&
+        action != "remove") {
+        return ReportUsageError(inv.command,
+                                "ACTION is create, insert, list, delete or remove, not " + action);
     }
     if (wantsPaths ? paths.empty() || (action == "delete" && paths.size() != 1) : !paths.empty()) {
         return ReportUsageError(inv.command, action + (wantsPaths ? " wants PATH" : " takes no PATH"));

@@ -237,7 +237,8 @@ std::vector<CommandDef> MakeCommands() {
           {"desc", nullptr, false, "list: with --sort, descending"},
           {"type", "WORD", false, "list: file, dir or all (default)"},
           {"pattern", "P", false, "list: names containing P (* and ? are wildcards)"}},
-         {{"ACTION", "create, insert, list, delete or remove"}, {"PATH...", "real paths for insert and delete"}},
+         {{"ACTION", "create, insert, list, delete or remove"},
+          {"PATH...", "real paths for insert and delete"}},
          RunSearchDb},
     };
 }
