@@ -52,7 +52,8 @@ namespace NorvoLogin {
 // lock failed, or an address blocked for failing), -4 bad arguments or a file error (the file
 // is then unchanged). A session id matching no line counts as a failed login of the address.
 NORVO_API int IsAuthorizedByPath(QUIB::WebCGI *cgi, const char *sessionId, char *userOut, int userOutLen,
-                                 _tag_confirm_policy *policy, _tag_cgi_position position, const char *cookieName);
+                                 _tag_confirm_policy *policy, _tag_cgi_position position,
+                                 const char *cookieName);
 
 class NORVO_API FolderSharingLoginManager {
 public:

@@ -36,16 +36,16 @@ using Section = std::unique_ptr<const int, SectionEnd>;
 
 const char *AppIdOf(_tag_cgi_position position) {
     switch (position) {
-    case CGI_POSITION_FILE_BROWSER:
-        return "QUIB.TVQ.App.Tovana3.Instance";
-    case CGI_POSITION_AURELO:
-        return "QUIB.TVQ.Aurelo.Application";
-    case CGI_POSITION_SILVORY:
-        return "QUIB.TVQ.Silvory";
-    case CGI_POSITION_DUNETRA:
-        return "QUIB.TVQ.Dunetra.Application";
-    default:
-        return nullptr;
+        case CGI_POSITION_FILE_BROWSER:
+            return "QUIB.TVQ.App.Tovana3.Instance";
+        case CGI_POSITION_AURELO:
+            return "QUIB.TVQ.Aurelo.Application";
+        case CGI_POSITION_SILVORY:
+            return "QUIB.TVQ.Silvory";
+        case CGI_POSITION_DUNETRA:
+            return "QUIB.TVQ.Dunetra.Application";
+        default:
+            return nullptr;
     }
 }
 
@@ -85,9 +85,10 @@ void Append(std::string *out, const char *format, ...) {
 struct Verdict {
     int result;
     bool keep;
+    bool asRead = false;  // kept as it was read, not refreshed
 };
-Verdict Judge(const SessionLine &line, const char *user, const CONFIRM_POLICY &policy, _tag_cgi_position position,
-              bool expired) {
+Verdict Judge(const SessionLine &line, const char *user, const CONFIRM_POLICY &policy,
+              _tag_cgi_position position, bool expired) {
     PQUIBUSER record = nullptr;
     if (QUIBUserGet(user, &record) != 0) {
         return {-2, false};
@@ -109,7 +110,7 @@ Verdict Judge(const SessionLine &line, const char *user, const CONFIRM_POLICY &p
     }
     const int result = (policy.acceptMask & 1) && admin == 1 ? 2 : (policy.acceptMask & 2) ? 1 : -2;
     if (!line.Persistent() && expired) {
-        return {-1, policy.noRefresh != 0};
+        return {-1, policy.noRefresh != 0, policy.noRefresh != 0};
     }
     return {result, true};
 }
@@ -123,8 +124,8 @@ int NorvoLogin::IsAuthorizedByPath(QUIB::WebCGI *cgi, const char *sessionId, cha
                                    _tag_confirm_policy *policy, _tag_cgi_position position,
                                    const char *cookieName) try {
     char address[64];
-    if (cgi == nullptr || userOut == nullptr || userOutLen <= 0 || policy == nullptr || sessionId == nullptr ||
-        !ClientAddress(address)) {
+    if (cgi == nullptr || userOut == nullptr || userOutLen <= 0 || policy == nullptr ||
+        sessionId == nullptr || !ClientAddress(address)) {
         return -4;
     }
     if (cookieName == nullptr) {
@@ -137,7 +138,6 @@ int NorvoLogin::IsAuthorizedByPath(QUIB::WebCGI *cgi, const char *sessionId, cha
     // The compared copy is 46 bytes, enough for any IP literal.
     char compared[46] = "";
     memcpy(compared, address, std::min(strlen(address), sizeof compared - 1));
-    const Clock clock = ReadClock();
     int result = -2;
     bool known = false;
     {
@@ -147,6 +147,8 @@ int NorvoLogin::IsAuthorizedByPath(QUIB::WebCGI *cgi, const char *sessionId, cha
             return -2;
         }
         const Section section(&lock);
+        // Read under the lock: a line written meanwhile would otherwise lie ahead of it.
+        const Clock clock = ReadClock();
         const int in = OpenOwnFile(SessionFile().c_str(), false);
         if (in < 0) {
             NVO_SET_QUIB_ERR(kModule, QUIB_ERR_OPEN_FAILED);
@@ -173,24 +175,27 @@ int NorvoLogin::IsAuthorizedByPath(QUIB::WebCGI *cgi, const char *sessionId, cha
             }
             const bool expired = !line.Persistent() && Expired(clock, line.LastAccess());
             if (strcmp(line.field[2], sessionId) == 0 && strcmp(line.field[7], cookieName) == 0 &&
-                (strcmp(line.field[0], compared) == 0 || (skip < 0 ? (skip = SkipSourceCheck()) : skip) == 1)) {
+                (strcmp(line.field[0], compared) == 0 ||
+                 (skip < 0 ? (skip = SkipSourceCheck()) : skip) == 1)) {
                 known = true;
                 const char *user = line.field[1];
                 setenv("USERNAME", user, 1);
                 snprintf(userOut, static_cast<size_t>(userOutLen), "%s", user);
                 const Verdict verdict = Judge(line, user, *policy, position, expired);
                 result = verdict.result;
-                if (verdict.keep) {
+                if (verdict.keep && !verdict.asRead) {
                     Append(&kept, "%s,%s,%s,%s,%ld,%d,%s,%s\n", line.field[0], line.field[1], line.field[2],
                            line.field[3], policy->noRefresh != 0 ? line.LastAccess() : clock.now,
                            static_cast<int>(position), line.field[6], line.field[7]);
                 }
+                if (!verdict.asRead) {
+                    return;
+                }
+            } else if (expired) {
                 return;
             }
-            if (!expired) {
-                Append(&kept, "%s,%s,%s,%s,%s,%s,%s,%s\n", line.field[0], line.field[1], line.field[2], line.field[3],
-                       line.field[4], line.field[5], line.field[6], line.field[7]);
-            }
+            Append(&kept, "%s,%s,%s,%s,%s,%s,%s,%s\n", line.field[0], line.field[1], line.field[2],
+                   line.field[3], line.field[4], line.field[5], line.field[6], line.field[7]);
         });
         // A short or failed write keeps the old file: the scratch file goes, never over it.
         const bool written = WriteAll(out, kept);

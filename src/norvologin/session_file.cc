@@ -21,11 +21,11 @@ const char *const kName = "foldersharing";
 const char *const kSuffix = "current.users";
 
 // Each name is the one format applied to the three parts.
-#define NAMED(format)                                           \
-    [] {                                                        \
-        char text[256];                                         \
+#define NAMED(format)                                              \
+    [] {                                                           \
+        char text[256];                                            \
         snprintf(text, sizeof text, format, kDir, kName, kSuffix); \
-        return std::string(text);                               \
+        return std::string(text);                                  \
     }()
 
 bool IsIpLiteral(const char *text) {
