@@ -91,7 +91,9 @@ Verdict Judge(const SessionLine &line, const char *user, const CONFIRM_POLICY &p
               _tag_cgi_position position, bool expired) {
     PQUIBUSER record = nullptr;
     if (QUIBUserGet(user, &record) != 0) {
-        return {-2, false};
+        // Only an account that is gone ends the session; a lookup that failed refuses this once.
+        const bool gone = VLIBCErrGet() == QUIB_ERR_NO_SUCH_USER;
+        return {-2, !gone, !gone};
     }
     UserRecord owned(record);
     // An expired account is refused: the application check alone would let it through.
