@@ -9,6 +9,8 @@
 
 #include <algorithm>
 #include <memory>
+#include <string_view>
+#include <vector>
 
 #include "common/log.h"
 #include "common/owners.h"
@@ -170,7 +172,8 @@ int NorvoLogin::IsAuthorizedByPath(QUIB::WebCGI *cgi, const char *sessionId, cha
         }
         kept.reserve(text.size() + 64);
         int skip = -1;  // read when first needed
-        ForEachPiece(text, kLineBuffer, [&](char *buf) {
+        std::vector<char> copy(kLineBuffer);
+        const auto judge = [&](char *buf) {
             SessionLine line;
             if (!ParseLine(buf, &line)) {
                 return;
@@ -198,6 +201,19 @@ int NorvoLogin::IsAuthorizedByPath(QUIB::WebCGI *cgi, const char *sessionId, cha
             }
             Append(&kept, "%s,%s,%s,%s,%s,%s,%s,%s\n", line.field[0], line.field[1], line.field[2],
                    line.field[3], line.field[4], line.field[5], line.field[6], line.field[7]);
+        };
+        ForEachPiece(text, kLineBuffer, [&](std::string_view piece) {
+            PlainLine plain;
+            if (SplitPlain(piece, &plain) && (plain.field[2] != sessionId || plain.field[7] != cookieName)) {
+                if (static_cast<int>(NumberOf(plain.field[6])) != 0 ||
+                    !Expired(clock, NumberOf(plain.field[4]))) {
+                    kept.append(piece);
+                }
+                return;
+            }
+            memcpy(copy.data(), piece.data(), piece.size());
+            copy[piece.size()] = '\0';
+            judge(copy.data());
         });
         // A short or failed write keeps the old file: the scratch file goes, never over it.
         const bool written = WriteAll(out, kept);
@@ -241,7 +257,10 @@ int QuibCgiHasRecord(QuibCgi *cgi, char *userOut, int userOutLen, const char *co
         return 0;
     }
     int found = 0;
-    ForEachPiece(text, 1024, [&](char *buf) {
+    char buf[1024];
+    ForEachPiece(text, sizeof buf, [&](std::string_view piece) {
+        memcpy(buf, piece.data(), piece.size());
+        buf[piece.size()] = '\0';
         SessionLine line;
         if (found == 0 && ParseLine(buf, &line) && strcmp(line.field[2], id) == 0 &&
             strcmp(line.field[7], cookieName) == 0) {

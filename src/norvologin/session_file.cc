@@ -89,6 +89,55 @@ bool ParseLine(char *line, SessionLine *out) {
     return true;
 }
 
+bool SplitPlain(std::string_view piece, PlainLine *out) {
+    if (piece.empty() || piece.back() != '\n') {
+        return false;
+    }
+    // One pass over the bytes: this runs for every line of the file at every request.
+    const char *p = piece.data();
+    const char *const end = p + piece.size() - 1;
+    const char *start = p;
+    int n = 0;
+    for (; p < end; ++p) {
+        const char c = *p;
+        if (c == ',') {
+            if (p == start || n == 7) {
+                return false;
+            }
+            out->field[n++] = std::string_view(start, static_cast<size_t>(p - start));
+            start = p + 1;
+        } else if (c == '\r' || c == '\0') {
+            return false;
+        }
+    }
+    if (p == start || n != 7) {
+        return false;
+    }
+    out->field[7] = std::string_view(start, static_cast<size_t>(p - start));
+    return true;
+}
+
+long NumberOf(std::string_view field) {
+    if (field.size() <= 18) {
+        long value = 0;
+        bool digits = true;
+        for (const char c : field) {
+            digits = digits && c >= '0' && c <= '9';
+            value = value * 10 + (c - '0');
+        }
+        if (digits) {
+            return value;
+        }
+    }
+    char small[32];
+    if (field.size() < sizeof small) {
+        memcpy(small, field.data(), field.size());
+        small[field.size()] = '\0';
+        return atol(small);
+    }
+    return atol(std::string(field).c_str());
+}
+
 bool Uptime(long *now) {
     struct sysinfo info;
     if (sysinfo(&info) != 0) {

@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <string>
+#include <string_view>
 #include <vector>
 
 namespace norvo::login {
@@ -50,22 +51,28 @@ bool Expired(const Clock &clock, long lastAccess);
 int OpenOwnFile(const char *path, bool forWriting);
 // The whole file of descriptor fd; false on a read error.
 bool ReadAll(int fd, std::string *text);
-// Calls fn with each piece of text that fgets with a kLineBuffer buffer would give, in a
-// buffer fn may change.
+// Calls fn with each piece of text that fgets with a buffer of bufferSize would give.
 template <typename F>
 void ForEachPiece(const std::string &text, int bufferSize, F &&fn) {
-    std::vector<char> buf(static_cast<size_t>(bufferSize));
-    const size_t most = buf.size() - 1;
+    const size_t most = static_cast<size_t>(bufferSize) - 1;
     for (size_t pos = 0; pos < text.size();) {
         size_t n = std::min(most, text.size() - pos);
         if (const void *end = memchr(text.data() + pos, '\n', n)) {
             n = static_cast<size_t>(static_cast<const char *>(end) - (text.data() + pos)) + 1;
         }
-        memcpy(buf.data(), text.data() + pos, n);
-        buf[n] = '\0';
+        fn(std::string_view(text.data() + pos, n));
         pos += n;
-        fn(buf.data());
     }
 }
+
+// A piece as the session's own writers write a line: LF-ended, eight non-empty fields, no CR
+// or NUL. Its fields are exactly what ParseLine gives, and written back unchanged it is these
+// same bytes, so the many lines an authorisation only carries over need no formatting.
+struct PlainLine {
+    std::string_view field[8];
+};
+bool SplitPlain(std::string_view piece, PlainLine *out);
+// atol of a field that is not terminated.
+long NumberOf(std::string_view field);
 
 }  // namespace norvo::login

@@ -38,7 +38,8 @@ struct Link {
 // A link id is a cookie name too: letters, digits, "_" and "-", at most 64.
 bool GoodLinkId(const char *id) {
     const size_t n = id == nullptr ? 0 : strlen(id);
-    return n >= 1 && n <= 64 && strspn(id, "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789_-") == n;
+    return n >= 1 && n <= 64 &&
+           strspn(id, "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789_-") == n;
 }
 
 bool FindLink(const char *id, Link *link) {
@@ -73,8 +74,9 @@ int Fail(QUIB::WebCGI &cgi, int code) {
 
 unsigned long Number(const QUIB::WebCGI &cgi, const char *name) {
     const char *text = cgi.In(name);
-    return text != nullptr && strspn(text, "0123456789") == strlen(text) && strlen(text) < 10 ? strtoul(text, nullptr, 10)
-                                                                                             : 0;
+    return text != nullptr && strspn(text, "0123456789") == strlen(text) && strlen(text) < 10
+               ? strtoul(text, nullptr, 10)
+               : 0;
 }
 
 // The link's folder as its user sees it: resolved, checked, and read under the user's identity.
@@ -104,9 +106,9 @@ int List(QUIB::WebCGI &cgi, const Link &link) {
     const unsigned long offset = Number(cgi, "offset");
     const char *sort = cgi.In("sort");
     NvoLibSetErr(NVO_ERR_NONE);
-    const int listed = lister.NvoLibDirEntryListEnum(link.path.c_str(), real.c_str(), sort != nullptr ? sort : "name",
-                                                     kInfo, offset, Number(cgi, "limit"), true, DIR_ENTRY_TYPE_ALL, {},
-                                                     files, &total);
+    const int listed = lister.NvoLibDirEntryListEnum(
+        link.path.c_str(), real.c_str(), sort != nullptr ? sort : "name", kInfo, offset, Number(cgi, "limit"),
+        true, DIR_ENTRY_TYPE_ALL, {}, files, &total);
     identity.reset();
     if (listed != 1) {
         return Fail(cgi, NvoLibGetErr() != NVO_ERR_NONE ? NvoLibGetErr() : NVO_ERR_SYSTEM);

@@ -48,7 +48,8 @@ std::string Output(const std::vector<std::string> &argv) {
         internal::FailErrno("pipe");
     }
     std::vector<char *> args;
-    for (const auto &arg : argv) args.push_back(const_cast<char *>(arg.c_str()));
+    for (const auto &arg : argv)
+        args.push_back(const_cast<char *>(arg.c_str()));
     args.push_back(nullptr);
     const pid_t pid = fork();
     if (pid == 0) {
@@ -59,7 +60,8 @@ std::string Output(const std::vector<std::string> &argv) {
     close(out[1]);
     std::string text;
     char buf[65536];
-    for (ssize_t got; (got = read(out[0], buf, sizeof buf)) > 0;) text.append(buf, static_cast<size_t>(got));
+    for (ssize_t got; (got = read(out[0], buf, sizeof buf)) > 0;)
+        text.append(buf, static_cast<size_t>(got));
     close(out[0]);
     int status = -1;
     waitpid(pid, &status, 0);
@@ -82,7 +84,8 @@ WebFront::WebFront(const std::string &program, const std::string &trustedProxy) 
                                      std::to_string(port_), program, trustedProxy});
     const std::string confFile = dir_ + "/lighttpd.conf";
     const int fd = open(confFile.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0644);
-    if (fd < 0 || write(fd, conf.data(), conf.size()) != static_cast<ssize_t>(conf.size()) || close(fd) != 0) {
+    if (fd < 0 || write(fd, conf.data(), conf.size()) != static_cast<ssize_t>(conf.size()) ||
+        close(fd) != 0) {
         internal::FailErrno("can't write %s", confFile.c_str());
     }
     const std::string server = internal::FindProgram("lighttpd");
