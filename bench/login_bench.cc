@@ -34,12 +34,14 @@ void WriteSessions(int64_t n) {
     std::string text;
     for (int64_t i = 0; i < n; ++i) {
         char line[160];
-        snprintf(line, sizeof line, "192.0.2.1,alice,%s%07lld,%ld,%ld,2,0,L\n", i == n / 2 ? "SESSION" : "other00",
-                 static_cast<long long>(i == n / 2 ? 0 : i), info.uptime, info.uptime);
+        snprintf(line, sizeof line, "192.0.2.1,alice,%s%07lld,%ld,%ld,2,0,L\n",
+                 i == n / 2 ? "SESSION" : "other00", static_cast<long long>(i == n / 2 ? 0 : i), info.uptime,
+                 info.uptime);
         text += line;
     }
     const int fd = open(kFile.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0600);
-    if (fd < 0 || write(fd, text.data(), text.size()) != static_cast<ssize_t>(text.size()) || close(fd) != 0) {
+    if (fd < 0 || write(fd, text.data(), text.size()) != static_cast<ssize_t>(text.size()) ||
+        close(fd) != 0) {
         abort();
     }
 }
@@ -51,7 +53,8 @@ void Floor(benchmark::State &state) {
         text.clear();
         const int in = open(kFile.c_str(), O_RDONLY | O_CLOEXEC);
         char buf[65536];
-        for (ssize_t got; (got = read(in, buf, sizeof buf)) > 0;) text.append(buf, static_cast<size_t>(got));
+        for (ssize_t got; (got = read(in, buf, sizeof buf)) > 0;)
+            text.append(buf, static_cast<size_t>(got));
         close(in);
         const int out = open(kScratch.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0600);
         if (write(out, text.data(), text.size()) != static_cast<ssize_t>(text.size()) || close(out) != 0 ||
@@ -90,7 +93,8 @@ void Login(benchmark::State &state) {
                 cgi.Init(-1, sink);
                 LOGIN_PARAMS params = {"alice", "Anomyous", "folderSharing", 15, 0};
                 char session[64];
-                _exit(NorvoLogin::FolderSharingLoginManager().login(&cgi, session, sizeof session, &params, "L") == 1
+                _exit(NorvoLogin::FolderSharingLoginManager().login(&cgi, session, sizeof session, &params,
+                                                                    "L") == 1
                           ? 0
                           : 1);
             }
@@ -105,8 +109,8 @@ void Login(benchmark::State &state) {
             state.SkipWithError("a login failed");
         }
     }
-    state.counters["logins_per_s"] = benchmark::Counter(static_cast<double>(processes) * state.iterations(),
-                                                        benchmark::Counter::kIsRate);
+    state.counters["logins_per_s"] =
+        benchmark::Counter(static_cast<double>(processes) * state.iterations(), benchmark::Counter::kIsRate);
 }
 
 // Google Benchmark reports each run separately; the ratio needs the floor's time, so the floor
@@ -138,8 +142,16 @@ int main(int argc, char **argv) {
         benchmark::RegisterBenchmark("Floor", Floor)->Arg(n)->Unit(benchmark::kMicrosecond);
         benchmark::RegisterBenchmark("Authorize", Authorize)->Arg(n)->Unit(benchmark::kMicrosecond);
     }
-    benchmark::RegisterBenchmark("Login", Login)->Arg(1)->Iterations(2)->Unit(benchmark::kMillisecond)->UseRealTime();
-    benchmark::RegisterBenchmark("Login", Login)->Arg(8)->Iterations(2)->Unit(benchmark::kMillisecond)->UseRealTime();
+    benchmark::RegisterBenchmark("Login", Login)
+        ->Arg(1)
+        ->Iterations(2)
+        ->Unit(benchmark::kMillisecond)
+        ->UseRealTime();
+    benchmark::RegisterBenchmark("Login", Login)
+        ->Arg(8)
+        ->Iterations(2)
+        ->Unit(benchmark::kMillisecond)
+        ->UseRealTime();
     Keeper reporter;
     benchmark::RunSpecifiedBenchmarks(&reporter);
     benchmark::Shutdown();

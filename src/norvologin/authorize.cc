@@ -143,12 +143,13 @@ int NorvoLogin::IsAuthorizedByPath(QUIB::WebCGI *cgi, const char *sessionId, cha
     char compared[46] = "";
     memcpy(compared, address, std::min(strlen(address), sizeof compared - 1));
     int result = -2;
-    bool known = false;
-    {
+    bool known = false;  // a line holds this session (from a usable address)
+    [&] {
         const int lock = QuibCgiBeginCriticalSection(SessionLock().c_str(), kLockTimeoutMs);
         if (lock < 0) {
             NVO_LOG(kModule, "%s (%d) QuibCgiBeginCriticalSection Failed.");
-            return -2;
+            known = true;  // not the cookie's fault
+            return;
         }
         const Section section(&lock);
         // Read under the lock: a line written meanwhile would otherwise lie ahead of it.
@@ -156,19 +157,21 @@ int NorvoLogin::IsAuthorizedByPath(QUIB::WebCGI *cgi, const char *sessionId, cha
         const int in = OpenOwnFile(SessionFile().c_str(), false);
         if (in < 0) {
             NVO_SET_QUIB_ERR(kModule, QUIB_ERR_OPEN_FAILED);
-            return -2;
+            return;  // no sessions: the cookie names none
         }
         const Fd inOwned(&in);
         const int out = OpenOwnFile(SessionScratch().c_str(), true);
         if (out < 0) {
             NVO_SET_QUIB_ERR(kModule, QUIB_ERR_OPEN_FAILED);
             NVO_LOG(kModule, "%s(%d): file open error, reason=%m");
-            return -4;
+            result = -4, known = true;
+            return;
         }
         Fd outOwned(&out);
         std::string text, kept;
         if (!ReadAll(in, &text)) {
-            return -4;
+            result = -4, known = true;
+            return;
         }
         kept.reserve(text.size() + 64);
         int skip = -1;  // read when first needed
@@ -221,9 +224,9 @@ int NorvoLogin::IsAuthorizedByPath(QUIB::WebCGI *cgi, const char *sessionId, cha
         const bool closed = close(out) == 0;
         if (!written || !closed || VLIBCSysRename(SessionScratch().c_str(), SessionFile().c_str()) != 0) {
             unlink(SessionScratch().c_str());
-            return -4;
+            result = -4, known = true;
         }
-    }
+    }();
     if (!known) {
         AutoBlockFailLoginSet(address, "FOLDER_SHARING");
     }

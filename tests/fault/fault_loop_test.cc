@@ -510,7 +510,7 @@ const Op kOps[] = {
          });
          return Expect(rc == 1, Read(kSessions).find(",alice," + std::string(session) + ",") == 9);
      },
-     kNoSlot, [] { unlink(kSessions.c_str()), OpenSink(); },
+     kNoSlot, [] { unlink(kSessions.c_str()), OpenSink(), QUIBAutoBlockResetByIP("192.0.2.1"); },
      [] {
          // One whole line or none.
          const std::string text = Read(kSessions);
@@ -528,7 +528,7 @@ const Op kOps[] = {
          });
          return Expect(rc == 1, std::regex_match(Read(kSessions), std::regex(kRefreshed)));
      },
-     kNoSlot, [] { Write(kSessions, g_sessions = SessionLines()), OpenSink(); },
+     kNoSlot, [] { Write(kSessions, g_sessions = SessionLines()), OpenSink(), QUIBAutoBlockResetByIP("192.0.2.1"); },
      [] {
          const std::string text = Read(kSessions);
          // Old, or swept: alice's line refreshed, as it was (her lookup failed) or gone (her
