@@ -41,7 +41,8 @@ std::vector<std::string> FgetsPieces(const std::string &text) {
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     const std::string text(reinterpret_cast<const char *>(data), size);
     std::vector<std::string> pieces;
-    norvo::login::ForEachPiece(text, kLineBuffer, [&](std::string_view piece) { pieces.emplace_back(piece); });
+    norvo::login::ForEachPiece(text, kLineBuffer,
+                               [&](std::string_view piece) { pieces.emplace_back(piece); });
     if (pieces != FgetsPieces(text)) {
         abort();
     }
