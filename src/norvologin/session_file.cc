@@ -122,8 +122,11 @@ long NumberOf(std::string_view field) {
         long value = 0;
         bool digits = true;
         for (const char c : field) {
-            digits = digits && c >= '0' && c <= '9';
-            value = value * 10 + (c - '0');
+            if (c < '0' || c > '9') {
+                digits = false;
+                break;
+            }
+            value = value * 10 + (c - '0');  // 18 digits stay below 2^63
         }
         if (digits) {
             return value;
