@@ -3,6 +3,7 @@
 #include "norvo/errors.h"
 #include "norvo/norvodir.h"
 #include "norvo/norvoenum.h"
+#include "norvo/norvologin.h"
 #include "norvo/norvomisc.h"
 #include "norvo/norvoprogress.h"
 #include "norvo/norvosearch.h"

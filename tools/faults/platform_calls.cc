@@ -90,6 +90,7 @@ SEAM_PLATFORM(int, QuibCgiGetInCookies, -1, (QuibCgi * cgi, const char *name, ch
 SEAM_PLATFORM(int, QuibCgiIsDeniedIP, -1, (const char *ip), (ip))
 SEAM_PLATFORM(int, AutoBlockFailLoginSet, -1, (const char *ip, const char *service), (ip, service))
 SEAM_PLATFORM(int, QUIBAutoBlockResetByIP, -1, (const char *ip), (ip))
+SEAM_PLATFORM(char, QUIBUserRandomNumMap2Seed, '\0', (long num), (num))
 
 int QUIBFSMkdirP(const char *path, char *stopAt, int stopAtSize, int recursive, uid_t uid, gid_t gid,
                  mode_t mode) {

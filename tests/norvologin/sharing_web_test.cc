@@ -1,0 +1,122 @@
+// A sharing-link visitor through the real web front: lighttpd runs norvo.cgi, curl asks.
+// Each login takes its second here: the CGI program sleeps for real.
+#include <sys/stat.h>
+#include <sys/sysinfo.h>
+#include <unistd.h>
+
+#include <fstream>
+#include <regex>
+#include <sstream>
+#include <string>
+
+#include <gtest/gtest.h>
+
+#include "appliance.h"
+#include "web_front.h"
+
+namespace {
+
+using norvo::testing::Appliance;
+using norvo::testing::WebFront;
+
+const std::string kFile = "/tmp/foldersharing.current.users";
+
+std::string Read(const std::string &path) {
+    std::ifstream in(path, std::ios::binary);
+    std::stringstream text;
+    text << in.rdbuf();
+    return text.str();
+}
+
+// The session id the reply's cookie L1 carries ("" when none).
+std::string CookieOf(const WebFront::Reply &reply) {
+    std::smatch m;
+    return std::regex_search(reply.head, m, std::regex("Set-Cookie: L1=([^;]+); Path=/; HttpOnly")) ? m[1].str() : "";
+}
+
+const char kDenied[] = R"({"error":{"code":407,"key":"error:error_privilege_not_enough"},"success":false})"
+                       "\n";
+
+class SharingWeb : public ::testing::Test {
+protected:
+    void SetUp() override {
+        app_.Basic().SetAppPrivilege("QUIB.TVQ.App.Tovana3.Instance", "@users").SetSetting("auto_block_attempts", "3");
+        app_.WriteFile("/volume1/public/dir/a.txt", "hello", "alice");
+        app_.WriteFile("/usr/quib/etc/norvo_cgi_links.conf", "L1=\"alice:/public/dir\"\n");
+    }
+    Appliance app_;
+};
+
+TEST_F(SharingWeb, AVisitorLogsInListsFromItsAddressOnlyAndExpires) {
+    WebFront web(NORVO_CGI);
+    const WebFront::Reply login = web.Get("api=login&FOLDER_SHARING=L1");
+    EXPECT_EQ(login.body, R"({"data":{"user":"alice"},"success":true})" "\n");
+    const std::string id = CookieOf(login);
+    ASSERT_EQ(id.size(), 13u) << login.head;
+    const std::regex line("127\\.0\\.0\\.1,alice," + id + ",([0-9]+),([0-9]+),([12]),0,L1\n");
+    std::smatch m;
+    const std::string first = Read(kFile);
+    ASSERT_TRUE(std::regex_match(first, m, line)) << first;
+    EXPECT_EQ(m[3], "1");
+    struct stat st;
+    ASSERT_EQ(stat(kFile.c_str(), &st), 0);
+    EXPECT_EQ(st.st_mode & 07777, 0600u);
+
+    const std::string cookie = "Cookie: L1=" + id;
+    const WebFront::Reply list = web.Get("api=list&FOLDER_SHARING=L1", {cookie});
+    EXPECT_NE(list.body.find(R"("total":1)"), std::string::npos) << list.body;
+    EXPECT_NE(list.body.find(R"("name":"a.txt")"), std::string::npos);
+    const std::string refreshed = Read(kFile);
+    ASSERT_TRUE(std::regex_match(refreshed, m, line));
+    EXPECT_EQ(m[3], "2");
+
+    EXPECT_EQ(web.Get("api=list&FOLDER_SHARING=L1", {cookie}, "127.0.0.2").body, kDenied);
+    app_.SetSetting("skip_checksrcip", "yes");
+    EXPECT_NE(web.Get("api=list&FOLDER_SHARING=L1", {cookie}, "127.0.0.2").body.find(R"("success":true)"),
+              std::string::npos);
+    EXPECT_EQ(Read(kFile).substr(0, 10), "127.0.0.1,");  // the line keeps its address
+
+    // Idle for 16 minutes: refused and swept.
+    struct sysinfo info;
+    sysinfo(&info);
+    app_.WriteFile(kFile, "127.0.0.1,alice," + id + ",1," + std::to_string(info.uptime - 960) + ",2,0,L1\n", "root",
+                   0600);
+    EXPECT_EQ(web.Get("api=list&FOLDER_SHARING=L1", {cookie}).body, kDenied);
+    EXPECT_EQ(Read(kFile), "");
+    EXPECT_TRUE(app_.ErrorLines().empty());
+}
+
+TEST_F(SharingWeb, FailuresBlockAndHostileRequestsForgeNothing) {
+    WebFront web(NORVO_CGI);
+    // Guessed link ids count as failed logins; a good login starts the count again.
+    web.Get("api=login&FOLDER_SHARING=nope", {}, "127.0.0.2"), web.Get("api=login&FOLDER_SHARING=nope", {}, "127.0.0.2");
+    ASSERT_EQ(CookieOf(web.Get("api=login&FOLDER_SHARING=L1", {}, "127.0.0.2")).size(), 13u);
+    web.Get("api=login&FOLDER_SHARING=nope", {}, "127.0.0.2"), web.Get("api=login&FOLDER_SHARING=nope", {}, "127.0.0.2");
+    EXPECT_EQ(web.Get("api=list&FOLDER_SHARING=L1", {"Cookie: L1=guessed1234567"}, "127.0.0.2").body, kDenied);
+    EXPECT_EQ(web.Get("api=login&FOLDER_SHARING=L1", {}, "127.0.0.2").body, kDenied);  // the third: blocked
+
+    // Forwarded addresses are not taken from strangers; a cookie that is no token, a line break
+    // in the link id: nothing written.
+    const std::string before = Read(kFile);
+    EXPECT_EQ(web.Get("api=list&FOLDER_SHARING=L1", {"X-Forwarded-For: 127.0.0.2", "Cookie: L1=\"a b\""}).body,
+              kDenied);
+    EXPECT_EQ(web.Post("api=login", "FOLDER_SHARING=L1%0A127.0.0.1,admin,X,1,1,1,1,L1").body,
+              R"({"error":{"code":400,"key":"error:error_error_system"},"success":false})" "\n");
+    EXPECT_EQ(Read(kFile), before);
+    {
+        WebFront proxied(NORVO_CGI, "127.0.0.1");
+        EXPECT_EQ(proxied.Get("api=login&FOLDER_SHARING=L1", {"Client-IP: 10.0.0.1,10.0.0.2"}).body, kDenied);
+    }
+    EXPECT_EQ(Read(kFile), before);
+
+    // bob's file behind a link at the session file's place.
+    app_.WriteFile("/tmp/bob.txt", "bob's\n", "bob", 0644);
+    unlink(kFile.c_str());
+    ASSERT_EQ(symlink("/tmp/bob.txt", kFile.c_str()), 0);
+    EXPECT_EQ(web.Get("api=login&FOLDER_SHARING=L1").body, kDenied);
+    EXPECT_EQ(Read("/tmp/bob.txt"), "bob's\n");
+    EXPECT_EQ(app_.ErrorLines(), (std::vector<std::string>{"norvologin:# QUIBAutoBlockIsDeniedIP",
+                                                            "norvologin:# Failed to get client ip."}));
+}
+
+}  // namespace
