@@ -11,6 +11,7 @@
 #include <fcntl.h>
 #include <sys/mman.h>
 #include <sys/stat.h>
+#include <stdlib.h>
 #include <syslog.h>
 #include <unistd.h>
 
@@ -126,6 +127,13 @@ std::function<std::string()> OldOrNew(std::string before, std::string after) {
 }
 
 const std::string kDir = "/volume1/public/dir";
+const std::string kUpload(100000, 'u');
+
+// An upload is in place whole or not there at all, and no temporary is left beside it.
+std::string WholeOrNone() {
+    const std::string text = Read(kDir + "/up");
+    return (text.empty() || text == kUpload ? "" : "torn upload of " + std::to_string(text.size())) + Leftovers(kDir + "/up");
+}
 char g_sid[64];
 Appliance *g_app;
 bool g_created;
@@ -467,6 +475,28 @@ const Op kOps[] = {
          const double progress = task ? task->getProperty("progress").asDouble() : 0;
          return (data == "d" && progress == 0.25) || (data == "new" && progress == 0.5) ? "" : "torn: " + data;
      }},
+    {"MoveAcross", [] { return Expect(MoveFile("alice", "/volume2/up", (kDir + "/up").c_str(), nullptr) == 1, Read(kDir + "/up") == kUpload); },
+     kLibrarySlot, [] { Write("/volume2/up", kUpload); fs::remove(kDir + "/up"); }, WholeOrNone},
+    {"MoveSameVolume", [] { return Expect(MoveFile("alice", "/volume1/up", (kDir + "/up").c_str(), nullptr) == 1, Read(kDir + "/up") == kUpload); },
+     kLibrarySlot, [] { Write("/volume1/up", kUpload); fs::remove(kDir + "/up"); }, WholeOrNone},
+    {"Identity",
+     [] { return Expect(NvoLibUGIDSet(nullptr, "admin") == 0, geteuid() == 0 && getegid() == g_app->Gid("users")); },
+     kLibrarySlot, [] { (void)setegid(0); }},
+    {"Chown2Admin",
+     [] {
+         struct stat st;
+         return Expect(NvoLibChown2Admin((kDir + "/a.txt").c_str(), "bob") == 0,
+                       stat((kDir + "/a.txt").c_str(), &st) == 0 && st.st_uid == g_app->Uid("bob"));
+     },
+     kNoSlot, [] { (void)chown((kDir + "/a.txt").c_str(), 0, 0); }},
+    {"TransferLog", [] { return Expect(NvoLibDoLog("alice", "/public/a", 1, NORVO_ACTION_UPLOAD, false) == 1, true); },
+     kPlatformSlot, [] { setenv("REMOTE_ADDR", "192.0.2.1", 1); }},
+    {"RemoteAddr",
+     [] {
+         std::string out;
+         return Expect(GetRemoteAddr(out) == "http://nas.example.net:5000", true);
+     },
+     kNoSlot, [] { setenv("HTTP_HOST", "nas:5000", 1); }},
     {"CleanTimeOutTasks",
      [] {
          CleanTimeOutTasks("alice");
@@ -523,7 +553,9 @@ TEST_P(Faults, ReleaseEverythingAndSayWhy) {
     app_.Basic().WriteFile(kDir + "/a.txt", "hello", "alice").MakeDir(kDir + "/sub");
     app_.MakeDir("/volume1/homes/alice", "alice").SetDomain("CORP").AddUser("CORP\\dave");
     app_.SetAppPrivilege("QUIB.Fault.Loop", "@staff").SetSetting("auto_block_attempts", "1");
-    app_.SetSetting("obx_timeout_minutes", "30");
+    app_.SetSetting("obx_timeout_minutes", "30").SetSetting("filebrowserxferlog", "yes");
+    app_.SetSetting("ddns_update", "yes").SetSetting("ddns_select", "home").SetDefaultSetting("supportddns", "yes");
+    app_.WriteFile("/usr/quib/etc/ddns.conf", "home.hostname=nas.example.net\n");
     g_settings = Read(QUIB_INFO_CONF);
     g_sid[0] = '\0';
     openlog(nullptr, LOG_NDELAY, LOG_USER);  // the log connection is the process's, not a run's

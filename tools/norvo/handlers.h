@@ -17,5 +17,7 @@ int RunLs(const Invocation &inv);          // cmd_ls.cc
 int RunWalk(const Invocation &inv);        // cmd_walk.cc
 int RunSubdirs(const Invocation &inv);     // cmd_subdirs.cc
 int RunTasks(const Invocation &inv);       // cmd_tasks.cc
+int RunUpload(const Invocation &inv);      // cmd_upload.cc
+int RunXferlog(const Invocation &inv);     // cmd_upload.cc
 
 }  // namespace norvo::cli
