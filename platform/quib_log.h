@@ -9,10 +9,10 @@
 
 // One dynamic-DNS entry.
 typedef struct _tag_QUIB_DDNS_CONFIG_ {
-    char szName[128];       // the entry's name (the "ddns_select" setting names one)
-    char szProvider[64];    // the service
-    char szHostname[256];   // the host name it keeps up to date
-    char szUsername[128];   // the account at the service
+    char szName[128];      // the entry's name (the "ddns_select" setting names one)
+    char szProvider[64];   // the service
+    char szHostname[256];  // the host name it keeps up to date
+    char szUsername[128];  // the account at the service
 } QUIB_DDNS_CONFIG, *PQUIB_DDNS_CONFIG;
 
 QUIB_BEGIN_C

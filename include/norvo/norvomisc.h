@@ -125,8 +125,8 @@ enum NORVO_ACTIONS {
 };
 
 // NvoLibDoFileBrowserLog when the setting "filebrowserxferlog" is "yes" (any case); else 0.
-NORVO_API int NvoLibDoLog(const std::string &user, const std::string &path, long long size, NORVO_ACTIONS action,
-                          bool isDir);
+NORVO_API int NvoLibDoLog(const std::string &user, const std::string &path, long long size,
+                          NORVO_ACTIONS action, bool isDir);
 // One transfer record (QUIBLogOBXFMXferLog) with the client address of "REMOTE_ADDR": 1 when
 // written; 0 for an empty user, path or address (logged), an action outside 1..9, or a failed
 // write (logged).

@@ -25,7 +25,7 @@ using norvo::platform::FileDescriptor;
 using norvo::platform::Guarded;
 using norvo::platform::ScopeExit;
 
-constexpr size_t kChunk = 64u << 20;     // per progress call; large, so the kernel's copy runs long
+constexpr size_t kChunk = 64u << 20;       // per progress call; large, so the kernel's copy runs long
 constexpr off_t kFatLimit = 0xFFFFFFFFLL;  // FAT's largest file
 constexpr size_t kTempStem = 200;          // of the target's name in the temporary's, so it fits NAME_MAX
 
@@ -114,7 +114,8 @@ int CopyData(int in, int out, const QUIB_FILECOPY_OPT &options) {
         if (kernel) {
             loff_t from = at, to = at;
             n = copy_file_range(in, &from, out, &to, kChunk, 0);
-            if (n < 0 && at == 0 && (errno == EXDEV || errno == EINVAL || errno == ENOSYS || errno == EOPNOTSUPP)) {
+            if (n < 0 && at == 0 &&
+                (errno == EXDEV || errno == EINVAL || errno == ENOSYS || errno == EOPNOTSUPP)) {
                 kernel = false;
                 buffer.resize(1u << 20);
                 continue;
@@ -163,7 +164,8 @@ int CreateTemporary(int dir, const std::string &name, std::string *tempName) {
             suffix += kDigits[byte % 62];
         }
         *tempName = "." + name.substr(0, kTempStem) + "." + suffix;
-        const int fd = openat(dir, tempName->c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600);
+        const int fd =
+            openat(dir, tempName->c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600);
         if (fd >= 0 || errno != EEXIST) {
             return fd;
         }
@@ -260,7 +262,8 @@ int Move(const char *src, const char *dst, const QUIB_FILECOPY_OPT &options) {
         if (const int err = SetOwnerAndMode(from.Get(), options)) {
             return COPY_FAIL(err);
         }
-        if (RenameInto(fromDir.Get(), srcName.c_str(), dir.Get(), name.c_str(), options.blOverwrite != 0) == 0) {
+        if (RenameInto(fromDir.Get(), srcName.c_str(), dir.Get(), name.c_str(), options.blOverwrite != 0) ==
+            0) {
             return options.blSync && SyncDir(dir.Get()) != 0 ? COPY_FAIL(errno) : 0;
         }
         if (errno != EXDEV) {  // two mounts of one file system: copy after all
@@ -288,7 +291,9 @@ int Move(const char *src, const char *dst, const QUIB_FILECOPY_OPT &options) {
         err = fsync(to.Get()) != 0 ? errno : 0;
     }
     if (err == 0) {
-        err = RenameInto(dir.Get(), tempName.c_str(), dir.Get(), name.c_str(), options.blOverwrite != 0) != 0 ? errno : 0;
+        err = RenameInto(dir.Get(), tempName.c_str(), dir.Get(), name.c_str(), options.blOverwrite != 0) != 0
+                  ? errno
+                  : 0;
     }
     if (err != 0) {
         return COPY_FAIL(err);

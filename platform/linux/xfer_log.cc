@@ -44,8 +44,8 @@ std::string Stamp() {
     struct tm parts;
     localtime_r(&now, &parts);
     char buf[32];
-    snprintf(buf, sizeof buf, "%s %2d %02d:%02d:%02d", kMonths[parts.tm_mon % 12], parts.tm_mday, parts.tm_hour,
-             parts.tm_min, parts.tm_sec);
+    snprintf(buf, sizeof buf, "%s %2d %02d:%02d:%02d", kMonths[parts.tm_mon % 12], parts.tm_mday,
+             parts.tm_hour, parts.tm_min, parts.tm_sec);
     return buf;
 }
 
@@ -84,7 +84,8 @@ bool Empty(const char *text) {
 
 bool IsHostName(const char *name) {
     const size_t length = strlen(name);
-    return length > 0 && length <= 253 && strspn(name, "abcdefghijklmnopqrstuvwxyzABCDEFGHIJKLMNOPQRSTUVWXYZ0123456789-.") == length;
+    return length > 0 && length <= 253 &&
+           strspn(name, "abcdefghijklmnopqrstuvwxyzABCDEFGHIJKLMNOPQRSTUVWXYZ0123456789-.") == length;
 }
 
 // The value of "<name>.<field>" into out (size bytes); false when absent or unreadable.
@@ -97,14 +98,15 @@ bool DdnsField(const char *name, const char *field, char *out, size_t size) {
 
 extern "C" {
 
-int QUIBLogOBXFMXferLog(const char *ip, const char *user, const char *action, long long size, const char *path,
-                        int isDir) {
+int QUIBLogOBXFMXferLog(const char *ip, const char *user, const char *action, long long size,
+                        const char *path, int isDir) {
     if (Empty(ip) || Empty(user) || Empty(action) || Empty(path) || size < 0) {
         return NORVO_FAIL_ERRNO(EINVAL);
     }
     return Guarded(-1, [&] {
-        const std::string record = "<" + std::to_string(LOG_LOCAL6 | LOG_INFO) + ">" + Stamp() + " " QUIB_XFERLOG_TAG "[" +
-                                   std::to_string(getpid()) + "]: client=" + Quoted(ip) + " user=" + Quoted(user) +
+        const std::string record = "<" + std::to_string(LOG_LOCAL6 | LOG_INFO) + ">" + Stamp() +
+                                   " " QUIB_XFERLOG_TAG "[" + std::to_string(getpid()) +
+                                   "]: client=" + Quoted(ip) + " user=" + Quoted(user) +
                                    " action=" + Quoted(action) + " size=" + std::to_string(size) +
                                    " type=" + (isDir ? "dir" : "file") + " path=" + Quoted(path);
         const int err = SendRecord(record);
@@ -113,7 +115,8 @@ int QUIBLogOBXFMXferLog(const char *ip, const char *user, const char *action, lo
 }
 
 int QUIBDDNSConfigGet(const char *name, PQUIB_DDNS_CONFIG config) {
-    if (Empty(name) || config == nullptr || strlen(name) >= sizeof config->szName || strpbrk(name, " \t=\"'#") != nullptr) {
+    if (Empty(name) || config == nullptr || strlen(name) >= sizeof config->szName ||
+        strpbrk(name, " \t=\"'#") != nullptr) {
         return NORVO_FAIL_ERRNO(EINVAL);
     }
     return Guarded(-1, [&] {

@@ -21,8 +21,8 @@ namespace {
 constexpr size_t kHostMax = 4095;
 
 const char *ActionWord(int action) {
-    static const char *const kWords[] = {"download", "upload", "delete", "rename", "copy",
-                                         "move", "property set", "mkdir", "download test"};
+    static const char *const kWords[] = {"download", "upload",       "delete", "rename",       "copy",
+                                         "move",     "property set", "mkdir",  "download test"};
     return action >= 1 && action <= 9 ? kWords[action - 1] : nullptr;
 }
 
@@ -104,8 +104,8 @@ std::string DdnsHost() {
 
 }  // namespace
 
-int NvoLibDoFileBrowserLog(const std::string &user, const std::string &path, long long size, NORVO_ACTIONS action,
-                           bool isDir) {
+int NvoLibDoFileBrowserLog(const std::string &user, const std::string &path, long long size,
+                           NORVO_ACTIONS action, bool isDir) {
     return norvo::Guarded(0, [&] {
         const std::string client = Env("REMOTE_ADDR");
         if (user.empty() || path.empty() || client.empty()) {
@@ -116,7 +116,8 @@ int NvoLibDoFileBrowserLog(const std::string &user, const std::string &path, lon
         if (word == nullptr) {
             return 0;
         }
-        if (QUIBLogOBXFMXferLog(client.c_str(), user.c_str(), word, size, path.c_str(), isDir ? 1 : 0) == -1) {
+        if (QUIBLogOBXFMXferLog(client.c_str(), user.c_str(), word, size, path.c_str(), isDir ? 1 : 0) ==
+            -1) {
             NVO_LOG(kNorvoMisc, "%s:%d Failed to add the File Browser log for %s", path.c_str());
             return 0;
         }
@@ -124,10 +125,12 @@ int NvoLibDoFileBrowserLog(const std::string &user, const std::string &path, lon
     });
 }
 
-int NvoLibDoLog(const std::string &user, const std::string &path, long long size, NORVO_ACTIONS action, bool isDir) {
+int NvoLibDoLog(const std::string &user, const std::string &path, long long size, NORVO_ACTIONS action,
+                bool isDir) {
     return norvo::Guarded(0, [&] {
         char enabled[8] = "";
-        if (QuibConf("filebrowserxferlog", "no", enabled, sizeof enabled) != 0 || strcasecmp(enabled, "yes") != 0) {
+        if (QuibConf("filebrowserxferlog", "no", enabled, sizeof enabled) != 0 ||
+            strcasecmp(enabled, "yes") != 0) {
             return 0;
         }
         return NvoLibDoFileBrowserLog(user, path, size, action, isDir);
@@ -146,7 +149,8 @@ std::string &GetRemoteAddr(std::string &out) {
         if (host.empty()) {
             host = requestHost;
         }
-        std::string port = Setting(QUIB_INFO_CONF, https ? "external_port_obx_https" : "external_port_obx_http", 16);
+        std::string port =
+            Setting(QUIB_INFO_CONF, https ? "external_port_obx_https" : "external_port_obx_http", 16);
         if (port.empty()) {
             port = requestPort;
         }

@@ -60,7 +60,8 @@ int CopyFailureCode(int platformError) {
 int CheckFile(std::string path, const char *user, const char *sid, int *type) {
     return norvo::Guarded(int(NVO_ERR_SYSTEM), [&]() -> int {
         std::string fullPath, shareName, volume, sharePath;
-        if (NvoFullPathGet(path.c_str(), fullPath, shareName, volume, sharePath, user != nullptr ? user : "") != 1) {
+        if (NvoFullPathGet(path.c_str(), fullPath, shareName, volume, sharePath,
+                           user != nullptr ? user : "") != 1) {
             NVO_LOG(kNorvoUpload, "%s:%d Failed to get fullpath of: %s", path.c_str());
             return NvoLibGetErr();
         }

@@ -58,8 +58,8 @@ int NvoLibEUIDSet(const char *sid, const char *user, unsigned int uid) {
             return Fail(NVO_ERR_GENERAL);
         }
         if (admin == -1) {
-            NVO_LOG(kNorvoUser, "%s:%d QUIBGroupIsAdminGroupMem(%s) failed. [0x%04X %s:%d]", user, VLIBCErrGet(),
-                    VLIBCErrorGetFile(), VLIBCErrorGetLine());
+            NVO_LOG(kNorvoUser, "%s:%d QUIBGroupIsAdminGroupMem(%s) failed. [0x%04X %s:%d]", user,
+                    VLIBCErrGet(), VLIBCErrorGetFile(), VLIBCErrorGetLine());
             return Fail(NVO_ERR_SYSTEM);
         }
         if (admin == 1) {
@@ -118,8 +118,8 @@ int NvoLibChown2Admin(const char *file, const char *owner) {
         }
         const int type = QUIBGetFSType(file, 0);
         if (type < 0) {
-            syslog(LOG_ERR, "%s:%d(%s) : failed to get file-system type dir = %s", "NvoLibChown2Admin", __LINE__,
-                   kNorvoUser, file);
+            syslog(LOG_ERR, "%s:%d(%s) : failed to get file-system type dir = %s", "NvoLibChown2Admin",
+                   __LINE__, kNorvoUser, file);
             return -1;
         }
         if (type == FSTYPE_FAT || QUIBFSIsRemoteFS(type) == 1 || QUIBFSIsImageFS(type) == 1) {

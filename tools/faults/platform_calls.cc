@@ -65,7 +65,8 @@ SEAM_PLATFORM(int, QUIBGetFSType, -1, (const char *path, int flags), (path, flag
 SEAM_PLATFORM(int, QUIBFileCopy, -1, (const char *src, const char *dst, const QUIB_FILECOPY_OPT *options),
               (src, dst, options))
 SEAM_PLATFORM(int, QUIBLogOBXFMXferLog, -1,
-              (const char *ip, const char *user, const char *action, long long size, const char *path, int isDir),
+              (const char *ip, const char *user, const char *action, long long size, const char *path,
+               int isDir),
               (ip, user, action, size, path, isDir))
 SEAM_PLATFORM(int, QUIBDDNSConfigGet, -1, (const char *name, PQUIB_DDNS_CONFIG config), (name, config))
 SEAM_PLATFORM(int, QuibConf, -1, (const char *key, const char *defaultValue, char *buf, size_t size),

@@ -72,8 +72,8 @@ int RunUpload(const Invocation &inv) {
 }
 
 int RunXferlog(const Invocation &inv) {
-    static const char *const kWords[] = {"download", "upload", "delete", "rename", "copy",
-                                         "move", "property set", "mkdir", "download test"};
+    static const char *const kWords[] = {"download", "upload",       "delete", "rename",       "copy",
+                                         "move",     "property set", "mkdir",  "download test"};
     const std::string &word = inv.arguments[0];
     int action = 0;
     for (int i = 0; i < 9; ++i) {
@@ -94,15 +94,17 @@ int RunXferlog(const Invocation &inv) {
     DefaultClient();
     const std::string &user = *inv.Value("user");
     const auto kind = static_cast<NORVO_ACTIONS>(action);
-    const bool logged = inv.Has("force") ? NvoLibDoFileBrowserLog(user, inv.arguments[1], size, kind, inv.Has("dir")) == 1
-                                         : NvoLibDoLog(user, inv.arguments[1], size, kind, inv.Has("dir")) == 1;
+    const bool logged = inv.Has("force")
+                            ? NvoLibDoFileBrowserLog(user, inv.arguments[1], size, kind, inv.Has("dir")) == 1
+                            : NvoLibDoLog(user, inv.arguments[1], size, kind, inv.Has("dir")) == 1;
     std::string address;
     GetRemoteAddr(address);
     Json::Value data(Json::objectValue);
     data["logged"] = logged;
     data["address"] = address;
-    return ReportSuccess(inv, data,
-                         TextTable().Row("record", logged ? "written" : "not written").Row("device address", address));
+    return ReportSuccess(
+        inv, data,
+        TextTable().Row("record", logged ? "written" : "not written").Row("device address", address));
 }
 
 }  // namespace norvo::cli
