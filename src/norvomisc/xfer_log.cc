@@ -76,7 +76,7 @@ void SplitHost(const std::string &value, std::string *host, std::string *port) {
 
 // The host of the selected dynamic-DNS entry, when the device keeps one up to date; "" if not.
 std::string DdnsHost() {
-    if (VLIBCFileCheckKeyValue(QUIB_INFO_DEFAULTS_CONF, "supportddns", "yes", 0) != 1) {
+    if (VLIBCFileCheckKeyValue(QUIB_INFO_DEFAULTS_CONF, "supportddns", "yes", 1) != 1) {
         return "";
     }
     int got = 0;
