@@ -69,9 +69,9 @@ TEST(Identity, TakesTheUsersIdsAndReportsAFailedSwitch) {
     EXPECT_EQ(app.ErrorLines(), (Lines{"norvouser.cpp:# bad parameter", "norvouser.cpp:# bad parameter"}));
 }
 
-TEST(Identity, Chown2AdminSkipsFatAndNeverFollowsALink) {
+TEST(Identity, Chown2AdminSkipsFatAndNetworkMountsAndNeverFollowsALink) {
     Appliance app;
-    app.Basic().MountFat("/volumeUSB1").WriteFile("/volume1/public/f", "x").WriteFile("/volume1/public/target", "t");
+    app.Basic().MountFat("/volumeUSB1").MountDeadRemote("/volume1/public/nas").WriteFile("/volume1/public/f", "x").WriteFile("/volume1/public/target", "t");
     ASSERT_EQ(symlink("/volume1/public/target", "/volume1/public/link"), 0);
     ASSERT_EQ(close(creat("/volumeUSB1/f", 0644)), 0);
     struct stat before, st;
@@ -79,6 +79,7 @@ TEST(Identity, Chown2AdminSkipsFatAndNeverFollowsALink) {
     EXPECT_EQ(NvoLibChown2Admin("/volumeUSB1/f", "alice"), 0);
     ASSERT_EQ(stat("/volumeUSB1/f", &st), 0);
     EXPECT_EQ(st.st_uid, before.st_uid);
+    EXPECT_EQ(NvoLibChown2Admin("/volume1/public/nas", "alice"), 0);  // a network mount: skipped
     EXPECT_EQ(NvoLibChown2Admin("/volume1/public/f", "alice"), 0);
     EXPECT_EQ(NvoLibChown2Admin("/volume1/public/link", "alice"), 0);
     ASSERT_EQ(stat("/volume1/public/f", &st), 0);
