@@ -200,8 +200,8 @@ int CheckTarget(int dir, const char *name, bool overwrite) {
     if (fstatat(dir, name, &st, AT_SYMLINK_NOFOLLOW) != 0) {
         return errno == ENOENT ? 0 : errno;
     }
-    if (S_ISDIR(st.st_mode) || !S_ISREG(st.st_mode)) {
-        return EISDIR;
+    if (!S_ISREG(st.st_mode)) {
+        return EISDIR;  // a folder, a link, a device: never replaced by a file
     }
     return overwrite ? 0 : EEXIST;
 }
@@ -211,10 +211,12 @@ bool IsFat(int dir) {
     return QUIBGetFSType(where.c_str(), 0) == FSTYPE_FAT;
 }
 
-int SyncDir(int dir) {
+// Best effort: the rename has happened, and a folder the user may not read can't be synced.
+void SyncDir(int dir) {
     FileDescriptor readable(openat(dir, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-    // A folder the user may not read can't be synced; the rename itself is done.
-    return readable.IsOpen() && fsync(readable.Get()) != 0 ? errno : 0;
+    if (readable.IsOpen()) {
+        (void)fsync(readable.Get());
+    }
 }
 
 int Move(const char *src, const char *dst, const QUIB_FILECOPY_OPT &options) {
@@ -264,7 +266,10 @@ int Move(const char *src, const char *dst, const QUIB_FILECOPY_OPT &options) {
         }
         if (RenameInto(fromDir.Get(), srcName.c_str(), dir.Get(), name.c_str(), options.blOverwrite != 0) ==
             0) {
-            return options.blSync && SyncDir(dir.Get()) != 0 ? COPY_FAIL(errno) : 0;
+            if (options.blSync) {
+                SyncDir(dir.Get());
+            }
+            return 0;
         }
         if (errno != EXDEV) {  // two mounts of one file system: copy after all
             return COPY_FAIL(errno);
@@ -300,7 +305,7 @@ int Move(const char *src, const char *dst, const QUIB_FILECOPY_OPT &options) {
     }
     removeTemp.Dismiss();
     if (options.blSync) {
-        (void)SyncDir(dir.Get());
+        SyncDir(dir.Get());
     }
     if (options.blRemoveSource) {
         // The target is whole and in place: a source that can't be removed stays, and the
