@@ -1,5 +1,6 @@
 #include <stdlib.h>
 #include <syslog.h>
+#include <unistd.h>
 
 #include <string>
 #include <vector>
@@ -73,6 +74,8 @@ TEST(TransferLog, RemoteAddressFromEachSource) {
         {nullptr, "nas:5000", ddns.c_str(), "supportddns=yes\n", "http://nas.example.net:5000"},
         {nullptr, "nas:5000", ddns.c_str(), "", "http://nas:5000"},
         {nullptr, "nas", "ddns_update=no\nddns_select=home\n", "supportddns=yes\n", "http://nas"},
+        {nullptr, "nas", nullptr, "supportddns=yes\n", "http://nas",
+         {"norvomisc.cpp:# Failed to get ddns_update of /etc/quibinfo.conf"}},
         {nullptr, "nas", "ddns_update=yes\n", "supportddns=yes\n", "http://nas",
          {"norvomisc.cpp:# Failed to get ddns_select of /etc/quibinfo.conf"}},
         {nullptr, "nas", "ddns_update=yes\nddns_select=gone\n", "supportddns=yes\n", "http://nas",
@@ -82,13 +85,14 @@ TEST(TransferLog, RemoteAddressFromEachSource) {
          {"norvomisc.cpp:# Failed to get DDNS info by select name bad, errno=Invalid argument, quib_error=[D00]"}},
     };
     for (const Row &row : rows) {
-        app.WriteFile("/etc/quibinfo.conf", row.settings).WriteFile("/etc.defaults/quibinfo.conf", row.defaults);
+        app.WriteFile("/etc/quibinfo.conf", row.settings ? row.settings : "").WriteFile("/etc.defaults/quibinfo.conf", row.defaults);
+        row.settings ? 0 : unlink("/etc/quibinfo.conf");
         row.https ? setenv("HTTPS", row.https, 1) : unsetenv("HTTPS");
         row.host ? setenv("HTTP_HOST", row.host, 1) : unsetenv("HTTP_HOST");
         app.ClearLogs();
         std::string out = "old";
-        EXPECT_EQ(GetRemoteAddr(out), row.want) << (row.host ? row.host : "no host") << " " << row.settings;
-        EXPECT_EQ(app.ErrorLines(), row.lines) << row.settings;
+        EXPECT_EQ(GetRemoteAddr(out), row.want) << (row.host ? row.host : "no host") << " " << (row.settings ? row.settings : "no settings");
+        EXPECT_EQ(app.ErrorLines(), row.lines) << row.host;
     }
 }
 

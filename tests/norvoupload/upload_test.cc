@@ -78,6 +78,10 @@ TEST(Upload, CheckFileJudgesTheTargetAsTheUser) {
                     lines.end());
         EXPECT_EQ(lines, row.lines) << row.user << " " << row.path;
     }
+    app.ClearLogs();  // a process that can't become the user
+    EXPECT_EQ(app.RunAs("bob", [] { return CheckFile("/public/x", "alice", nullptr, nullptr) - 400; }), 1);
+    EXPECT_EQ(app.ErrorLines(), (Lines{"norvouser.cpp:# Failed to set UID for user=alice, sid=(null)",
+                                       "norvoupload.cpp:# Failed to set UGID for user=alice, sid=(null)"}));
 }
 
 class Move : public ::testing::Test {

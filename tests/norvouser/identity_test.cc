@@ -49,6 +49,7 @@ TEST(Identity, TakesTheUsersIdsAndReportsAFailedSwitch) {
         {"root", nullptr, nullptr, -1, 400, 0, 0, 0, {"norvouser.cpp:# Bad parameter"}},
         {"bob", nullptr, "alice", -1, 401, bob, users, 0, {"norvouser.cpp:# Failed to set UID for user=alice, sid=(null)"}},
         {"bob", nullptr, "admin", -1, 401, bob, users, 0, {"norvouser.cpp:# Failed to set UID for user=admin, sid=(null)"}},
+        {"bob", nullptr, "root", -1, 401, bob, users, 0, {"norvouser.cpp:# Failed to set GID for user=root, sid=(null)"}},
     };
     for (const Row &row : rows) {
         app.ClearLogs();
@@ -65,8 +66,10 @@ TEST(Identity, TakesTheUsersIdsAndReportsAFailedSwitch) {
     }
     app.ClearLogs();
     EXPECT_EQ(app.RunAs("root", [] { return NvoLibEGIDSet(nullptr, "alice", ~0u) == -1 && NvoLibGetErr() == 400 &&
-                                              NvoLibEUIDSet(nullptr, "alice", ~0u) == -1 && geteuid() == 0; }), 1);
-    EXPECT_EQ(app.ErrorLines(), (Lines{"norvouser.cpp:# bad parameter", "norvouser.cpp:# bad parameter"}));
+                                              NvoLibEUIDSet(nullptr, "alice", ~0u) == -1 && geteuid() == 0 &&
+                                              NvoLibEUIDSet(nullptr, "ghost", 5) == -1 && NvoLibGetErr() == 401; }), 1);
+    EXPECT_EQ(app.ErrorLines(), (Lines{"norvouser.cpp:# bad parameter", "norvouser.cpp:# bad parameter",
+                                       "norvouser.cpp:# QUIBGroupIsAdminGroupMem(ghost) failed. [0x1D00 account_records.cc:#]"}));
 }
 
 TEST(Identity, Chown2AdminSkipsFatAndNetworkMountsAndNeverFollowsALink) {
