@@ -1,5 +1,7 @@
 #include <fcntl.h>
 #include <grp.h>
+#include <linux/capability.h>
+#include <sys/syscall.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -64,6 +66,18 @@ TEST(Identity, TakesTheUsersIdsAndReportsAFailedSwitch) {
         EXPECT_EQ(got, 0) << row.from << " as " << (row.user ? row.user : "null");
         EXPECT_EQ(app.ErrorLines(), row.lines) << (row.user ? row.user : "null");
     }
+    // Root without the right to change groups: no request goes on with root's group.
+    app.ClearLogs();
+    EXPECT_EQ(app.RunAs("root", [] {
+        __user_cap_header_struct header{_LINUX_CAPABILITY_VERSION_3, 0};
+        __user_cap_data_struct caps[2];
+        syscall(SYS_capget, &header, caps);
+        caps[0].effective &= ~(1u << CAP_SETGID);
+        syscall(SYS_capset, &header, caps);
+        return NvoLibUGIDSet(nullptr, "alice") == -1 && NvoLibGetErr() == 401 && getegid() == 0 && geteuid() == 0;
+    }), 1);
+    EXPECT_EQ(app.ErrorLines(), (Lines{"norvouser.cpp:# Failed to initgroup for user=alice, sid=(null)",
+                                       "norvouser.cpp:# Failed to set GID for user=alice, sid=(null)"}));
     app.ClearLogs();
     EXPECT_EQ(app.RunAs("root", [] { return NvoLibEGIDSet(nullptr, "alice", ~0u) == -1 && NvoLibGetErr() == 400 &&
                                               NvoLibEUIDSet(nullptr, "alice", ~0u) == -1 && geteuid() == 0 &&
