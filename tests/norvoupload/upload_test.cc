@@ -52,8 +52,8 @@ TEST(Upload, CheckFileJudgesTheTargetAsTheUser) {
         bool switched;
         Lines lines;
     } rows[] = {
-        {"alice", "/photo/new.jpg", 0, 0, 0, true},
-        {"alice", "/photo/old.jpg", 1, 0, 1, true},
+        {"alice", "/photo/new.jpg", 0, 0, 0, true, {}},
+        {"alice", "/photo/old.jpg", 1, 0, 1, true, {}},
         {"alice", "/photo/old.jpg", 0, 414, 0, false,
          {"norvomisc.cpp:# Share no modify privilege, path=/photo/old.jpg",
           "norvoupload.cpp:# No upload privilege to path /photo/old.jpg"}},

@@ -42,10 +42,10 @@ TEST(Identity, TakesTheUsersIdsAndReportsAFailedSwitch) {
         gid_t egid, group;  // group: a supplementary group that must be held (0: none asked)
         Lines lines;
     } rows[] = {
-        {"root", nullptr, "alice", 0, 0, alice, users, staff},
-        {"root", sid, "alice", 0, 0, alice, users, staff},
-        {"root", "no-such-login", "bob", 0, 0, bob, users, staff},  // the name answers instead
-        {"root", nullptr, "admin", 0, 0, 0, users, 0},                // administrators keep uid 0
+        {"root", nullptr, "alice", 0, 0, alice, users, staff, {}},
+        {"root", sid, "alice", 0, 0, alice, users, staff, {}},
+        {"root", "no-such-login", "bob", 0, 0, bob, users, staff, {}},  // the name answers instead
+        {"root", nullptr, "admin", 0, 0, 0, users, 0, {}},                // administrators keep uid 0
         {"root", nullptr, "ghost", -1, 403, 0, 0, 0, {"norvouser.cpp:# Failed to get GID for user=ghost"}},
         {"root", "x", "ghost", -1, 403, 0, 0, 0, {"norvouser.cpp:# Failed to get GID for user=ghost, sid=x"}},
         {"root", nullptr, nullptr, -1, 400, 0, 0, 0, {"norvouser.cpp:# Bad parameter"}},
