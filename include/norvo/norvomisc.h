@@ -111,8 +111,9 @@ NORVO_API std::string FindCommonParent(std::vector<std::string> paths);
 
 // ---- Transfer log and the device's address ----
 
-// The kinds of logged transfers; any other value is never logged.
-enum NORVO_ACTIONS {
+// The kinds of logged transfers; any other value is never logged. The type is fixed, so any int
+// a caller passes is a value of it.
+enum NORVO_ACTIONS : int {
     NORVO_ACTION_DOWNLOAD = 1,       // "download"
     NORVO_ACTION_UPLOAD = 2,         // "upload"
     NORVO_ACTION_DELETE = 3,         // "delete"

@@ -1,10 +1,14 @@
 // upload and xferlog: an upload's last steps from the shell, and one transfer record.
+#include <grp.h>
 #include <signal.h>
 #include <stdlib.h>
 #include <string.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
+#include <algorithm>
 #include <string>
+#include <vector>
 
 #include "exit_status.h"
 #include "handlers.h"
@@ -31,6 +35,29 @@ void DefaultClient() {
     }
 }
 
+// CheckFile takes the user's identity for good, as a CGI program's request does; the command
+// gives it back before it exits, as the other commands do (the real uid stays root).
+class SavedIdentity {
+public:
+    SavedIdentity() : uid_(geteuid()), gid_(getegid()), groups_(size_t(std::max(getgroups(0, nullptr), 0))) {
+        const int n = getgroups(int(groups_.size()), groups_.data());
+        groups_.resize(n > 0 ? size_t(n) : 0);
+    }
+    ~SavedIdentity() {
+        if (seteuid(uid_) == 0) {
+            (void)setgroups(groups_.size(), groups_.data());
+            (void)setegid(gid_);
+        }
+    }
+    SavedIdentity(const SavedIdentity &) = delete;
+    SavedIdentity &operator=(const SavedIdentity &) = delete;
+
+private:
+    uid_t uid_;
+    gid_t gid_;
+    std::vector<gid_t> groups_;
+};
+
 }  // namespace
 
 int RunUpload(const Invocation &inv) {
@@ -50,6 +77,7 @@ int RunUpload(const Invocation &inv) {
         return ReportLibraryFailure(inv, "resolving " + dst);
     }
     // As the upload program: checked, then moved as the user, who owns the result.
+    const SavedIdentity saved;
     if (const int code = CheckFile(dst, user.c_str(), inv.CStr("sid"), &type)) {
         return ReportFailure(inv, code, "checking " + dst);
     }
