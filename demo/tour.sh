@@ -137,4 +137,15 @@ show "A later request pages the hits sorted by size, largest first" \
     search-db --user alice --volume /volume1 --task "$task" list --sort size --desc --limit 10
 show "A task id that getUniqueID would never make reaches no path: no such task" \
     search-db --user alice --volume /volume1 --task ../../etc list
+# An upload's last steps: the file has arrived in a folder of alice's beside the shares.
+mkdir -p /volume1/@tmp/upload && chown "$(id -u alice)" /volume1/@tmp/upload
+printf 'sand and sea\n' > /volume1/@tmp/upload/part && chown "$(id -u alice)" /volume1/@tmp/upload/part
+echo 'filebrowserxferlog="yes"' >> /etc/quibinfo.conf
+show "An upload lands in photo as alice's file, and the transfer log gets one record" \
+    upload --user alice /volume1/@tmp/upload/part /photo/2024/notes.txt
+show "bob may only read photo: his upload is refused before anything moves" \
+    upload --user bob /volume2/archive/2019/report.pdf /photo/2024/report.pdf
+export HTTP_HOST=nas:5000  # as the web server passes a request's Host header
+show "A download recorded by hand, with the address a client reaches the device under" \
+    xferlog --user bob --size 4096 download /archive/2019/report.pdf
 printf '\nEnd of the tour.\n'

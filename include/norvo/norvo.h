@@ -7,6 +7,8 @@
 #include "norvo/norvomisc.h"
 #include "norvo/norvoprogress.h"
 #include "norvo/norvosearch.h"
+#include "norvo/norvoupload.h"
+#include "norvo/norvouser.h"
 #include "norvo/nvoman.h"
 #include "norvo/pathinfo.h"
 #include "norvo/searchdb.h"

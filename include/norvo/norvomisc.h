@@ -108,3 +108,34 @@ NORVO_API void StringExplode(const std::string &text, const char *delim,
 // "" for no paths or only empty ones. Paths without a common leading directory give their
 // common prefix as it is ("ab" and "ac" give "a").
 NORVO_API std::string FindCommonParent(std::vector<std::string> paths);
+
+// ---- Transfer log and the device's address ----
+
+// The kinds of logged transfers; any other value is never logged. The type is fixed, so any int
+// a caller passes is a value of it.
+enum NORVO_ACTIONS : int {
+    NORVO_ACTION_DOWNLOAD = 1,       // "download"
+    NORVO_ACTION_UPLOAD = 2,         // "upload"
+    NORVO_ACTION_DELETE = 3,         // "delete"
+    NORVO_ACTION_RENAME = 4,         // "rename"
+    NORVO_ACTION_COPY = 5,           // "copy"
+    NORVO_ACTION_MOVE = 6,           // "move"
+    NORVO_ACTION_PROPERTY_SET = 7,   // "property set"
+    NORVO_ACTION_MKDIR = 8,          // "mkdir"
+    NORVO_ACTION_DOWNLOAD_TEST = 9,  // "download test"
+};
+
+// NvoLibDoFileBrowserLog when the setting "filebrowserxferlog" is "yes" (any case); else 0.
+NORVO_API int NvoLibDoLog(const std::string &user, const std::string &path, long long size,
+                          NORVO_ACTIONS action, bool isDir);
+// One transfer record (QUIBLogOBXFMXferLog) with the client address of "REMOTE_ADDR": 1 when
+// written; 0 for an empty user, path or address (logged), an action outside 1..9, or a failed
+// write (logged).
+NORVO_API int NvoLibDoFileBrowserLog(const std::string &user, const std::string &path, long long size,
+                                     NORVO_ACTIONS action, bool isDir);
+// out = the device's address as the client sees it, "scheme://host[:port]": https when "HTTPS"
+// is "on"; the host from "external_host_ip", else the selected dynamic-DNS entry (when the
+// device supports it and "ddns_update" is "yes"), else "HTTP_HOST"; the port from
+// "external_port_obx_http(s)" when set, else "HTTP_HOST". A host or port from "HTTP_HOST" with
+// characters no host name or port has is left out. Returns out.
+NORVO_API std::string &GetRemoteAddr(std::string &out);

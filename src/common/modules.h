@@ -8,4 +8,6 @@ inline constexpr char kNorvoMisc[] = "norvomisc.cpp";
 inline constexpr char kNorvoEnum[] = "norvoenum.cpp";
 inline constexpr char kNorvoSearch[] = "norvosearch.cpp";
 inline constexpr char kNorvoProgress[] = "norvoprogress";
+inline constexpr char kNorvoUser[] = "norvouser.cpp";
+inline constexpr char kNorvoUpload[] = "norvoupload.cpp";
 }  // namespace norvo

@@ -12,6 +12,7 @@
 #include <sys/mman.h>
 #include <sys/stat.h>
 #include <sys/sysinfo.h>
+#include <stdlib.h>
 #include <syslog.h>
 #include <unistd.h>
 
@@ -134,6 +135,13 @@ std::function<std::string()> OldOrNew(std::string before, std::string after) {
 }
 
 const std::string kDir = "/volume1/public/dir";
+const std::string kUpload(100000, 'u');
+
+// An upload is in place whole or not there at all, and no temporary is left beside it.
+std::string WholeOrNone() {
+    const std::string text = Read(kDir + "/up");
+    return (text.empty() || text == kUpload ? "" : "torn upload of " + std::to_string(text.size())) + Leftovers(kDir + "/up");
+}
 char g_sid[64];
 Appliance *g_app;
 bool g_created;
@@ -630,6 +638,39 @@ const Op kOps[] = {
                     ? ""
                     : "torn: " + text;
      }},
+    {"MoveAcross",
+     [] {
+         const bool ok = MoveFile("alice", "/volume2/up", (kDir + "/up").c_str(), nullptr) == 1;
+         return Expect(ok, Read(kDir + "/up") == kUpload);
+     },
+     kEitherSlot, [] { Write("/volume2/up", kUpload); fs::remove(kDir + "/up"); }, WholeOrNone},
+    {"MoveSameVolume",
+     [] {
+         const bool ok = MoveFile("alice", "/volume1/up", (kDir + "/up").c_str(), nullptr) == 1;
+         return Expect(ok, Read(kDir + "/up") == kUpload);
+     },
+     kEitherSlot, [] { Write("/volume1/up", kUpload); fs::remove(kDir + "/up"); }, WholeOrNone},
+    {"Identity",
+     [] {
+         const bool ok = NvoLibUGIDSet(nullptr, "admin") == 0;
+         return Expect(ok, geteuid() == 0 && getegid() == getpwnam("admin")->pw_gid);
+     },
+     kLibrarySlot, [] { (void)setegid(0); }},
+    {"Chown2Admin",
+     [] {
+         const bool ok = NvoLibChown2Admin((kDir + "/a.txt").c_str(), "bob") == 0;
+         struct stat st;
+         return Expect(ok, stat((kDir + "/a.txt").c_str(), &st) == 0 && st.st_uid == g_app->Uid("bob"));
+     },
+     kNoSlot, [] { (void)chown((kDir + "/a.txt").c_str(), 0, 0); }},
+    {"TransferLog", [] { return Expect(NvoLibDoLog("alice", "/public/a", 1, NORVO_ACTION_UPLOAD, false) == 1, true); },
+     kPlatformSlot, [] { setenv("REMOTE_ADDR", "192.0.2.1", 1); }},
+    {"RemoteAddr",
+     [] {
+         std::string out;
+         return Expect(GetRemoteAddr(out) == "http://nas.example.net:5000", true);
+     },
+     kNoSlot, [] { setenv("HTTP_HOST", "nas:5000", 1); }},
     {"CleanTimeOutTasks",
      [] {
          CleanTimeOutTasks("alice");
@@ -726,6 +767,10 @@ TEST_P(Faults, ReleaseEverythingAndSayWhy) {
     app_.MakeDir("/volume1/homes/alice", "alice").SetDomain("CORP").AddUser("CORP\\dave");
     app_.SetAppPrivilege("QUIB.Fault.Loop", "@staff").SetAppPrivilege("QUIB.TVQ.App.Tovana3.Instance", "alice").SetSetting("auto_block_attempts", "1");
     app_.SetSetting("obx_timeout_minutes", "30");
+    app_.SetAppPrivilege("QUIB.Fault.Loop", "@staff").SetSetting("auto_block_attempts", "1");
+    app_.SetSetting("obx_timeout_minutes", "30").SetSetting("filebrowserxferlog", "yes");
+    app_.SetSetting("ddns_update", "yes").SetSetting("ddns_select", "home").SetDefaultSetting("supportddns", "yes");
+    app_.WriteFile("/usr/quib/etc/ddns.conf", "home.hostname=nas.example.net\n");
     g_settings = Read(QUIB_INFO_CONF);
     g_sid[0] = '\0';
     openlog(nullptr, LOG_NDELAY, LOG_USER);  // the log connection is the process's, not a run's

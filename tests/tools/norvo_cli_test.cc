@@ -153,6 +153,17 @@ TEST_F(NorvoCliTest, SharesCheckPathAndFailures) {
     EXPECT_EQ(text.err, "error 418 (error:error_reserved_name)\n");
 }
 
+TEST_F(NorvoCliTest, UploadMovesACheckedFileInAndLogsIt) {
+    appliance_.MakeDir("/volume2/up", "alice").WriteFile("/volume2/up/a", "sand", "alice").WriteFile("/volume2/up/b");
+    appliance_.SetSetting("filebrowserxferlog", "yes");
+    const Json::Value done = RunJson({"upload", "--user", "alice", "/volume2/up/a", "/photo/a.txt"})["data"];
+    EXPECT_EQ(done["real_path"].asString(), "/volume1/photo/a.txt");
+    EXPECT_TRUE(done["logged"].asBool());
+    EXPECT_EQ(RunJson({"upload", "--user", "bob", "/volume2/up/b", "/photo/b"}, 1)["error"]["code"].asInt(), 407);
+    EXPECT_TRUE(RunJson({"xferlog", "--user", "bob", "download test", "/photo/a.txt"})["data"]["logged"].asBool());
+    EXPECT_EQ(RunNorvo({"xferlog", "--user", "bob", "fly", "/photo/a.txt"}).exitStatus, 2);
+}
+
 TEST_F(NorvoCliTest, SubdirsListsFoldersAsTheUser) {
     appliance_.MakeDir("/volume1/photo/d\xFF", "alice").MakeDir("/volume1/photo/B", "bob", 0700).WriteFile("/volume1/photo/c");
     const Json::Value folders = RunJson({"subdirs", "--user", "alice", "/volume1/photo"})["data"]["folders"];

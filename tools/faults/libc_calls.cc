@@ -15,6 +15,7 @@
 #include <stdio.h>
 #include <stdlib.h>
 #include <sys/file.h>
+#include <sys/socket.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -90,6 +91,16 @@ SEAM_CALL(int, fchown, -1, (int fd, uid_t uid, gid_t gid), (fd, uid, gid))
 SEAM_CALL(int, fchmod, -1, (int fd, mode_t mode), (fd, mode))
 SEAM_CALL(int, flock, -1, (int fd, int operation), (fd, operation))
 SEAM_CALL(int, rename, -1, (const char *from, const char *to), (from, to))
+SEAM_CALL(int, renameat, -1, (int fromDir, const char *from, int toDir, const char *to),
+          (fromDir, from, toDir, to))
+SEAM_CALL(int, renameat2, -1, (int fromDir, const char *from, int toDir, const char *to, unsigned flags),
+          (fromDir, from, toDir, to, flags))
+SEAM_CALL(ssize_t, copy_file_range, -1,
+          (int in, off64_t *inAt, int out, off64_t *outAt, size_t size, unsigned flags),
+          (in, inAt, out, outAt, size, flags))
+SEAM_CALL(int, futimens, -1, (int fd, const struct timespec times[2]), (fd, times))
+SEAM_CALL(int, socket, -1, (int domain, int type, int protocol), (domain, type, protocol))
+SEAM_CALL(int, connect, -1, (int fd, const struct sockaddr *address, socklen_t size), (fd, address, size))
 SEAM_CALL(int, getpwnam_r, NssFailure(result),
           (const char *name, struct passwd *entry, char *buf, size_t size, struct passwd **result),
           (name, entry, buf, size, result))

@@ -11,7 +11,9 @@
 
 #include "fileidx.h"
 #include "quib_dir_pass.h"
+#include "quib_file_copy.h"
 #include "quib_fs.h"
+#include "quib_log.h"
 #include "quib_login.h"
 #include "quib_s2s.h"
 #include "quib_sdk_share.h"
@@ -62,6 +64,15 @@ SEAM_PLATFORM(int, QUIBLoginGet, -1, (const char *sid, char *userBuf, int userSi
 SEAM_PLATFORM(int, QUIBLoginRemove, -1, (const char *sid), (sid))
 SEAM_PLATFORM(int, QUIBS2SIsSyncedShare, -1, (const char *name), (name))
 SEAM_PLATFORM(int, QUIBGetFSType, -1, (const char *path, int flags), (path, flags))
+SEAM_PLATFORM(int, QUIBFileCopy, -1, (const char *src, const char *dst, const QUIB_FILECOPY_OPT *options),
+              (src, dst, options))
+SEAM_PLATFORM(int, QUIBLogOBXFMXferLog, -1,
+              (const char *ip, const char *user, const char *action, long long size, const char *path,
+               int isDir),
+              (ip, user, action, size, path, isDir))
+SEAM_PLATFORM(int, QUIBDDNSConfigGet, -1, (const char *name, PQUIB_DDNS_CONFIG config), (name, config))
+SEAM_PLATFORM(int, QuibConf, -1, (const char *key, const char *defaultValue, char *buf, size_t size),
+              (key, defaultValue, buf, size))
 SEAM_PLATFORM(int, QUIBFSIsInMountTable, -1, (const char *path), (path))
 SEAM_PLATFORM(int, QUIBShareIsShareRecycle, -1, (const char *realPath), (realPath))
 SEAM_PLATFORM(int, QUIBACLPermGet, -1, (const char *path, unsigned int *mask), (path, mask))

@@ -240,6 +240,33 @@ std::vector<CommandDef> MakeCommands() {
          {{"ACTION", "create, insert, list, delete or remove"},
           {"PATH...", "real paths for insert and delete"}},
          RunSearchDb},
+        {"upload",
+         "an upload's last steps: check the target, move the file in, log it",
+         "Does what the upload program does once the file has arrived: CheckFile for DEST (a\n"
+         "user-visible path) as USER, which takes USER's identity (groups, gid, uid; needs root),\n"
+         "then MoveFile of SRC to DEST's real path, owned by USER (SRC is moved: renamed on the\n"
+         "same volume, else copied and removed), then one transfer record (NvoLibDoLog, when\n"
+         "filebrowserxferlog is on; the client is REMOTE_ADDR, else 127.0.0.1). An existing\n"
+         "file is replaced unless --no-overwrite. Ctrl-C cancels the move; DEST is left as it was.",
+         {{"user", "USER", true, kUserHelp},
+          {"sid", "SID", false, "the login sid of the account"},
+          {"no-overwrite", nullptr, false, "refuse a DEST that exists (upload type 0)"}},
+         {{"SRC", "the uploaded file (a real path); USER must be able to read and remove it"},
+          {"DEST", "a user-visible target path: /share/dir/file, /home/..."}},
+         RunUpload},
+        {"xferlog",
+         "write one transfer record; show the device's address",
+         "Records ACTION on PATH by USER in the transfer log (NvoLibDoLog: only when the setting\n"
+         "filebrowserxferlog is yes; --force writes regardless, NvoLibDoFileBrowserLog). ACTION\n"
+         "is one of download, upload, delete, rename, copy, move, \"property set\", mkdir,\n"
+         "\"download test\". The client is REMOTE_ADDR, else 127.0.0.1. Also prints the device's\n"
+         "address as a client sees it (GetRemoteAddr: HTTPS, HTTP_HOST and the settings).",
+         {{"user", "USER", true, kUserHelp},
+          {"size", "BYTES", false, "the size to record (default 0)"},
+          {"dir", nullptr, false, "PATH is a folder"},
+          {"force", nullptr, false, "write even when the transfer log is off"}},
+         {{"ACTION", "the logged word"}, {"PATH", "the user-visible path to record"}},
+         RunXferlog},
     };
 }
 

@@ -18,5 +18,7 @@ int RunWalk(const Invocation &inv);        // cmd_walk.cc
 int RunSubdirs(const Invocation &inv);     // cmd_subdirs.cc
 int RunTasks(const Invocation &inv);       // cmd_tasks.cc
 int RunSearchDb(const Invocation &inv);    // cmd_search_db.cc
+int RunUpload(const Invocation &inv);      // cmd_upload.cc
+int RunXferlog(const Invocation &inv);     // cmd_upload.cc
 
 }  // namespace norvo::cli
