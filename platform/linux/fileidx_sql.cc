@@ -307,7 +307,7 @@ int RegisterFunctions(sqlite3 *db) {
         rc =
             sqlite3_create_collation_v2(db, "fileidx_nocase", SQLITE_UTF8, nullptr, NoCaseCollation, nullptr);
     }
-    return FileIdxCodeOfSqlite(rc);
+    return CodeOfSqlite(rc);
 }
 
 // A link or a non-directory where a directory must be is a refusal, not a system failure.
@@ -402,26 +402,6 @@ const char kFileIdxColumns[] =
     "name, real_path, parent_path, share, path, is_dir, size, type, crtime, ctime, atime, mtime, posix, mode, "
     "uid, gid, user_name, group_name";
 
-int FileIdxCodeOfSqlite(int rc) {
-    switch (rc & 0xFF) {
-        case SQLITE_OK:
-        case SQLITE_DONE:
-        case SQLITE_ROW:
-            return QUIB_ERR_NONE;
-        case SQLITE_NOMEM:
-            return QUIB_ERR_NO_MEMORY;
-        case SQLITE_FULL:
-            return QUIB_ERR_NO_SPACE;
-        case SQLITE_READONLY:
-            return QUIB_ERR_READ_ONLY_FS;
-        case SQLITE_PERM:
-        case SQLITE_AUTH:
-            return QUIB_ERR_ACCESS_DENIED;
-        default:
-            return QUIB_ERR_FAILED;
-    }
-}
-
 int FileIdxCodeOf(sqlite3 *db, int rc) {
     const int primary = rc & 0xFF;
     if (db != nullptr && (primary == SQLITE_CANTOPEN || primary == SQLITE_IOERR || primary == SQLITE_FULL)) {
@@ -429,7 +409,7 @@ int FileIdxCodeOf(sqlite3 *db, int rc) {
             return VLIBCErrFromErrno(err);
         }
     }
-    return FileIdxCodeOfSqlite(rc);
+    return CodeOfSqlite(rc);
 }
 
 int CreateFileIdxDb(const char *path) {
@@ -461,7 +441,7 @@ int CreateFileIdxDb(const char *path) {
         code = FileIdxCodeOf(db.get(), sqlite3_exec(db.get(), kSchema, nullptr, nullptr, nullptr));
     }
     if (code == QUIB_ERR_NONE) {
-        code = FileIdxCodeOfSqlite(sqlite3_close(db.release()));
+        code = CodeOfSqlite(sqlite3_close(db.release()));
     }
     if (code != QUIB_ERR_NONE) {
         db.reset();
@@ -558,7 +538,7 @@ int PrepareBound(sqlite3 *db, const SqlText &sql, FileIdxStatement *out) {
                                                   static_cast<int>(value.text.size()), SQLITE_TRANSIENT)
                               : sqlite3_bind_int64(raw, index, value.number);
         if (bound != SQLITE_OK) {
-            return FileIdxCodeOfSqlite(bound);
+            return CodeOfSqlite(bound);
         }
     }
     return QUIB_ERR_NONE;
@@ -596,7 +576,7 @@ int BindRecord(sqlite3_stmt *statement, const __tag_FI_FILE_INFO_DATA &r) {
     number(r.gid);
     text(r.userName, sizeof r.userName);
     text(r.groupName, sizeof r.groupName);
-    return FileIdxCodeOfSqlite(rc);
+    return CodeOfSqlite(rc);
 }
 
 void ReadRecord(sqlite3_stmt *statement, __tag_FI_FILE_INFO_DATA *r) {

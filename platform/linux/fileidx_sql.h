@@ -9,22 +9,14 @@
 #include <vector>
 
 #include "fileidx.h"
+#include "sqlite_db.h"
 
 namespace norvo::platform {
 
-struct FileIdxDbCloser {
-    void operator()(sqlite3 *db) const { sqlite3_close_v2(db); }
-};
-using FileIdxDb = std::unique_ptr<sqlite3, FileIdxDbCloser>;
+using FileIdxDb = SqliteDb;
+using FileIdxStatement = Statement;
 
-struct FileIdxStatementFinalizer {
-    void operator()(sqlite3_stmt *statement) const { sqlite3_finalize(statement); }
-};
-using FileIdxStatement = std::unique_ptr<sqlite3_stmt, FileIdxStatementFinalizer>;
-
-// The one translation of SQLite result codes into platform codes.
-[[nodiscard]] int FileIdxCodeOfSqlite(int rc);
-// The same, but a failure to open or read a file says the system's reason (ENOSPC, EACCES...).
+// CodeOfSqlite, but a failure to open or read a file says the system's reason (ENOSPC, EACCES...).
 [[nodiscard]] int FileIdxCodeOf(sqlite3 *db, int rc);
 
 // Who may own a database that is opened.
