@@ -25,33 +25,19 @@ const char *Text(const char *text) {
     return text != nullptr ? text : "(null)";
 }
 
+// The file copy's own codes; every other one as the library translates platform codes.
 int CopyFailureCode(int platformError) {
     switch (platformError) {
-        case 0x0300:
-            return NVO_ERR_PRIVILEGE;
-        case 0x0600:
-        case 0x0700:
-            return NVO_ERR_NO_PATH;
         case 0x0800:
         case 0xA000:
         case 0xA200:
             return NVO_ERR_EXIST;
-        case 0x2400:
-            return NVO_ERR_QUOTA;
-        case 0x2900:
-            return NVO_ERR_NO_SPACE;
-        case 0x8400:
-            return NVO_ERR_READ_ONLY;
         case 0xA300:
             return NVO_ERR_UPLOAD_CANCELLED;
         case 0xA400:
             return NVO_ERR_UPLOAD_FILE_TOO_BIG;
-        case 0xA500:
-            return NVO_ERR_FAT_RESERVED_NAME;
-        case 0xC300:
-            return NVO_ERR_LONG_PATH;
         default:
-            return NVO_ERR_SYSTEM;
+            return NvoParseQuibErrToError(platformError, nullptr);
     }
 }
 
