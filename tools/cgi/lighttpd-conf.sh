@@ -16,7 +16,10 @@ server.document-root = "$dir/htdocs"
 server.errorlog = "$dir/error.log"
 server.pid-file = "$dir/lighttpd.pid"
 server.upload-dirs = ("$dir")
-server.max-request-size = 1024
+# Uploads stream through to the program as they arrive (never whole in the server's memory or
+# files); 16 GiB at most, in KiB.
+server.stream-request-body = 2
+server.max-request-size = 16777216
 alias.url = ("/cgi-bin/norvo.cgi" => "$cgi")
 \$HTTP["url"] =^ "/cgi-bin/" { cgi.assign = ("" => "") }
 CONF
