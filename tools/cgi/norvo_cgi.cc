@@ -400,6 +400,10 @@ int Download(QUIB::WebCGI &cgi, const Link &link) {
     const std::string head = "Content-Length: " + std::to_string(st.st_size) +
                              "\r\nContent-Disposition: " + Disposition(name) + "\r\n";
     bool sent = WriteAll(STDOUT_FILENO, head.data(), head.size()) && cgi.WriteHeader("application/octet-stream") == 0;
+    // Recorded before the last byte goes: the server may end the program once it has them all.
+    if (sent) {
+        NvoLibDoLog(link.user, visible, st.st_size, NORVO_ACTION_DOWNLOAD, false);
+    }
     long long left = st.st_size;
     static char buf[65536];
     while (sent && left > 0) {
@@ -408,9 +412,6 @@ int Download(QUIB::WebCGI &cgi, const Link &link) {
         left -= got;
     }
     close(fd);
-    if (sent) {
-        NvoLibDoLog(link.user, visible, st.st_size, NORVO_ACTION_DOWNLOAD, false);
-    }
     return 0;
 }
 

@@ -123,6 +123,21 @@ WebFront::Reply WebFront::Post(const std::string &query, const std::string &form
     return Ask({internal::FindProgram("curl"), "-sS", "-i", "--max-time", "30", "--data-raw", form}, query);
 }
 
+WebFront::Reply WebFront::PostBody(const std::string &query, const std::string &body,
+                                   const std::vector<std::string> &headers) const {
+    const std::string file = dir_ + "/body";
+    const int fd = open(file.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0600);
+    if (fd < 0 || write(fd, body.data(), body.size()) != static_cast<ssize_t>(body.size()) || close(fd) != 0) {
+        internal::FailErrno("can't write %s", file.c_str());
+    }
+    std::vector<std::string> argv = {internal::FindProgram("curl"), "-sS", "-i", "--max-time", "30", "--data-binary",
+                                     "@" + file};
+    for (const std::string &header : headers) {
+        argv.insert(argv.end(), {"-H", header});
+    }
+    return Ask(argv, query);
+}
+
 WebFront::Reply WebFront::Ask(std::vector<std::string> argv, const std::string &query) const {
     argv.push_back("http://127.0.0.1:" + std::to_string(port_) + "/cgi-bin/norvo.cgi?" + query);
     const std::string text = Output(argv);
