@@ -27,7 +27,8 @@ class Collect : public MultipartReader::Sink {
 public:
     bool Begin(const Part &part) override {
         if (part.filename.find_first_of(std::string("/\0", 2)) != std::string::npos ||
-            (part.file && !part.filename.empty() && !norvo::cgi::SafeFileName(part.filename)) || part.name.empty()) {
+            (part.file && !part.filename.empty() && !norvo::cgi::SafeFileName(part.filename)) ||
+            part.name.empty()) {
             abort();
         }
         parts.push_back({part, ""});
@@ -42,8 +43,8 @@ public:
 };
 
 // The parts and the result of reading body in pieces of at most piece bytes.
-std::pair<std::vector<Got>, MultipartReader::Result> Read(const std::string &boundary, const std::string &body,
-                                                          size_t piece) {
+std::pair<std::vector<Got>, MultipartReader::Result> Read(const std::string &boundary,
+                                                          const std::string &body, size_t piece) {
     Collect sink;
     MultipartReader reader(boundary, &sink);
     MultipartReader::Result result = MultipartReader::kMore;
@@ -81,7 +82,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *bytes, size_t size) {
     // Pieces change nothing: whole, then small.
     const auto whole = Read("B", body, body.size() + 1);
     const auto cut = Read("B", body, piece);
-    if (whole.second != cut.second || (whole.second != MultipartReader::kBad && !Same(whole.first, cut.first))) {
+    if (whole.second != cut.second ||
+        (whole.second != MultipartReader::kBad && !Same(whole.first, cut.first))) {
         abort();
     }
 
@@ -117,7 +119,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *bytes, size_t size) {
     std::string encoded = "preamble\r\n";
     for (const Got &got : parts) {
         encoded += "--" + boundary + "\r\nContent-Disposition: form-data; name=\"" + got.part.name + "\"" +
-                   (got.part.file ? "; filename=\"" + got.part.filename + "\"" : "") + "\r\n\r\n" + got.data + "\r\n";
+                   (got.part.file ? "; filename=\"" + got.part.filename + "\"" : "") + "\r\n\r\n" + got.data +
+                   "\r\n";
     }
     encoded += "--" + boundary + "--\r\nepilogue";
     const auto back = Read(boundary, encoded, piece);

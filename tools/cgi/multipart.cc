@@ -91,7 +91,8 @@ bool SplitParameters(const std::string &text, std::string *type, std::map<std::s
 std::string MultipartBoundary(const char *contentType) {
     std::string type;
     std::map<std::string, std::string> params;
-    if (contentType == nullptr || !SplitParameters(contentType, &type, &params) || type != "multipart/form-data") {
+    if (contentType == nullptr || !SplitParameters(contentType, &type, &params) ||
+        type != "multipart/form-data") {
         return "";
     }
     const auto found = params.find("boundary");
@@ -99,8 +100,7 @@ std::string MultipartBoundary(const char *contentType) {
         return "";
     }
     const std::string &b = found->second;
-    static const char kSet[] =
-        "0123456789ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz'()+_,-./:=? ";
+    static const char kSet[] = "0123456789ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz'()+_,-./:=? ";
     if (b.empty() || b.size() > 70 || b.back() == ' ' || strspn(b.c_str(), kSet) != b.size()) {
         return "";
     }
@@ -129,73 +129,73 @@ MultipartReader::Result MultipartReader::Feed(const char *data, size_t size) {
 // One move on buf_; false when it needs more bytes or has stopped.
 bool MultipartReader::Step() {
     switch (state_) {
-    case kData: {
-        const size_t at = buf_.find(delimiter_);
-        const size_t take = at != std::string::npos ? at
-                            : buf_.size() >= delimiter_.size() ? buf_.size() - delimiter_.size() + 1
-                                                               : 0;
-        if (take > 0 && inPart_ && !sink_->Data(buf_.data(), take)) {
-            state_ = kFailed;
-            return false;
-        }
-        if (at == std::string::npos) {
-            buf_.erase(0, take);
-            return false;
-        }
-        if (inPart_) {
-            inPart_ = false;
-            if (!sink_->End()) {
+        case kData: {
+            const size_t at = buf_.find(delimiter_);
+            const size_t take = at != std::string::npos            ? at
+                                : buf_.size() >= delimiter_.size() ? buf_.size() - delimiter_.size() + 1
+                                                                   : 0;
+            if (take > 0 && inPart_ && !sink_->Data(buf_.data(), take)) {
                 state_ = kFailed;
                 return false;
             }
-        }
-        buf_.erase(0, at + delimiter_.size());
-        state_ = kDelimiterLine;
-        return true;
-    }
-    case kDelimiterLine: {
-        if (buf_.size() < 2) {
-            return false;
-        }
-        if (buf_.compare(0, 2, "--") == 0) {
-            state_ = kClosed;
-            buf_.clear();
-            return false;
-        }
-        size_t at = 0;
-        SkipSpace(buf_, &at);  // transport padding
-        if (at + 2 > buf_.size()) {
-            if (buf_.size() > kMaxHeaderBytes || (at < buf_.size() && buf_[at] != '\r')) {
-                state_ = kFailed;
+            if (at == std::string::npos) {
+                buf_.erase(0, take);
+                return false;
             }
-            return false;
-        }
-        if (buf_[at] != '\r' || buf_[at + 1] != '\n') {
-            state_ = kFailed;
-            return false;
-        }
-        buf_.erase(0, at);  // the line break stays: the header block starts with one
-        state_ = kHeaders;
-        return true;
-    }
-    case kHeaders: {
-        const size_t end = buf_.find("\r\n\r\n");
-        if (end == std::string::npos || end > kMaxHeaderBytes) {
-            if (end != std::string::npos || buf_.size() > kMaxHeaderBytes + 4) {
-                state_ = kFailed;
+            if (inPart_) {
+                inPart_ = false;
+                if (!sink_->End()) {
+                    state_ = kFailed;
+                    return false;
+                }
             }
-            return false;
+            buf_.erase(0, at + delimiter_.size());
+            state_ = kDelimiterLine;
+            return true;
         }
-        if (!StartPart(buf_.substr(2, end))) {
-            state_ = kFailed;
-            return false;
+        case kDelimiterLine: {
+            if (buf_.size() < 2) {
+                return false;
+            }
+            if (buf_.compare(0, 2, "--") == 0) {
+                state_ = kClosed;
+                buf_.clear();
+                return false;
+            }
+            size_t at = 0;
+            SkipSpace(buf_, &at);  // transport padding
+            if (at + 2 > buf_.size()) {
+                if (buf_.size() > kMaxHeaderBytes || (at < buf_.size() && buf_[at] != '\r')) {
+                    state_ = kFailed;
+                }
+                return false;
+            }
+            if (buf_[at] != '\r' || buf_[at + 1] != '\n') {
+                state_ = kFailed;
+                return false;
+            }
+            buf_.erase(0, at);  // the line break stays: the header block starts with one
+            state_ = kHeaders;
+            return true;
         }
-        buf_.erase(0, end + 4);
-        state_ = kData;
-        return true;
-    }
-    default:
-        return false;
+        case kHeaders: {
+            const size_t end = buf_.find("\r\n\r\n");
+            if (end == std::string::npos || end > kMaxHeaderBytes) {
+                if (end != std::string::npos || buf_.size() > kMaxHeaderBytes + 4) {
+                    state_ = kFailed;
+                }
+                return false;
+            }
+            if (!StartPart(buf_.substr(2, end))) {
+                state_ = kFailed;
+                return false;
+            }
+            buf_.erase(0, end + 4);
+            state_ = kData;
+            return true;
+        }
+        default:
+            return false;
     }
 }
 

@@ -209,7 +209,7 @@ public:
             return true;
         }
         if (!WriteAll(fd_, data, size)) {
-            return Refuse(errno == ENOSPC ? NVO_UPLOAD_ERR_NO_SPACE
+            return Refuse(errno == ENOSPC   ? NVO_UPLOAD_ERR_NO_SPACE
                           : errno == EDQUOT ? NVO_UPLOAD_ERR_QUOTA
                           : errno == EFBIG  ? NVO_UPLOAD_ERR_TOO_LARGE
                                             : NVO_UPLOAD_ERR_SYSTEM);
@@ -259,7 +259,8 @@ private:
 // when the request is done (the leak check at exit needs a process it may trace).
 class SavedIdentity {
 public:
-    SavedIdentity() : uid_(geteuid()), gid_(getegid()), groups_(static_cast<size_t>(std::max(getgroups(0, nullptr), 0))) {
+    SavedIdentity()
+        : uid_(geteuid()), gid_(getegid()), groups_(static_cast<size_t>(std::max(getgroups(0, nullptr), 0))) {
         const int n = getgroups(static_cast<int>(groups_.size()), groups_.data());
         groups_.resize(n > 0 ? static_cast<size_t>(n) : 0);
     }
@@ -282,8 +283,8 @@ private:
 // A refused body is still read to its end, so the client gets the answer rather than a reset.
 int ReadUpload(const std::string &boundary, UploadSink &sink) {
     const char *lengthText = getenv("CONTENT_LENGTH");
-    if (lengthText == nullptr || *lengthText == '\0' || strspn(lengthText, "0123456789") != strlen(lengthText) ||
-        strlen(lengthText) > 15) {
+    if (lengthText == nullptr || *lengthText == '\0' ||
+        strspn(lengthText, "0123456789") != strlen(lengthText) || strlen(lengthText) > 15) {
         return ConvUploadErrnoToAPIErr(NVO_UPLOAD_ERR_BAD_REQUEST);
     }
     unsigned long long left = strtoull(lengthText, nullptr, 10);
@@ -402,7 +403,8 @@ int Download(QUIB::WebCGI &cgi, const Link &link) {
     }
     const std::unique_ptr<QUIBUSER, void (*)(PQUIBUSER)> user(record, QUIBUserFree);
     std::string error;
-    const std::unique_ptr<norvo::cli::UserIdentity> identity = norvo::cli::UserIdentity::Assume(*user, &error);
+    const std::unique_ptr<norvo::cli::UserIdentity> identity =
+        norvo::cli::UserIdentity::Assume(*user, &error);
     if (!identity) {
         return Fail(cgi, NVO_ERR_SYSTEM);
     }
@@ -425,7 +427,8 @@ int Download(QUIB::WebCGI &cgi, const Link &link) {
     const std::string name = strrchr(visible.c_str(), '/') + 1;
     const std::string head = "Content-Length: " + std::to_string(st.st_size) +
                              "\r\nContent-Disposition: " + Disposition(name) + "\r\n";
-    bool sent = WriteAll(STDOUT_FILENO, head.data(), head.size()) && cgi.WriteHeader("application/octet-stream") == 0;
+    bool sent =
+        WriteAll(STDOUT_FILENO, head.data(), head.size()) && cgi.WriteHeader("application/octet-stream") == 0;
     // Recorded before the last byte goes: the server may end the program once it has them all.
     if (sent) {
         NvoLibDoLog(link.user, visible, st.st_size, NORVO_ACTION_DOWNLOAD, false);

@@ -127,11 +127,12 @@ WebFront::Reply WebFront::PostBody(const std::string &query, const std::string &
                                    const std::vector<std::string> &headers) const {
     const std::string file = dir_ + "/body";
     const int fd = open(file.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0600);
-    if (fd < 0 || write(fd, body.data(), body.size()) != static_cast<ssize_t>(body.size()) || close(fd) != 0) {
+    if (fd < 0 || write(fd, body.data(), body.size()) != static_cast<ssize_t>(body.size()) ||
+        close(fd) != 0) {
         internal::FailErrno("can't write %s", file.c_str());
     }
-    std::vector<std::string> argv = {internal::FindProgram("curl"), "-sS", "-i", "--max-time", "30", "--data-binary",
-                                     "@" + file};
+    std::vector<std::string> argv = {
+        internal::FindProgram("curl"), "-sS", "-i", "--max-time", "30", "--data-binary", "@" + file};
     for (const std::string &header : headers) {
         argv.insert(argv.end(), {"-H", header});
     }

@@ -32,7 +32,8 @@ public:
     // The same as a POST of the urlencoded form.
     Reply Post(const std::string &query, const std::string &form) const;
     // A POST of body, bytes as given, with extra request headers (a Content-Type among them).
-    Reply PostBody(const std::string &query, const std::string &body, const std::vector<std::string> &headers) const;
+    Reply PostBody(const std::string &query, const std::string &body,
+                   const std::vector<std::string> &headers) const;
     int port() const { return port_; }
 
 private:
