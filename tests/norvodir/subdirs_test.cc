@@ -2,7 +2,6 @@
 // the refusals with their codes and log lines, and a network mount whose server is gone.
 #include <fcntl.h>
 #include <sys/stat.h>
-#include <syslog.h>
 #include <unistd.h>
 
 #include <algorithm>

@@ -10,12 +10,10 @@
 #include <algorithm>
 #include <filesystem>
 #include <fstream>
-#include <functional>
 #include <map>
 #include <memory>
 #include <random>
 #include <regex>
-#include <set>
 #include <string>
 #include <vector>
 

@@ -11,7 +11,6 @@
 
 #include <algorithm>
 #include <fstream>
-#include <functional>
 #include <random>
 #include <sstream>
 #include <string>
