@@ -14,6 +14,7 @@
 
 #include <gtest/gtest.h>
 
+#include "../platform/platform_test_util.h"
 #include "appliance.h"
 #include "norvo/errors.h"
 #include "norvo/subdirs.h"
@@ -22,6 +23,7 @@
 namespace {
 
 using norvo::testing::Appliance;
+using norvo::testing::ReadFile;
 using Fields = std::vector<std::string>;  // name, path, size, mode, mtime, uid, gid, mount point, type
 
 const std::string kTree = "/volume1/public/tree";
@@ -33,11 +35,6 @@ std::vector<std::string> Split(const std::string &text) {
     std::istringstream in(text);
     for (std::string part; std::getline(in, part, '\0');) parts.push_back(part);
     return parts;
-}
-
-std::string ReadAll(const std::string &path) {
-    std::ifstream in(path, std::ios::binary);
-    return std::string(std::istreambuf_iterator<char>(in), {});
 }
 
 Fields FieldsOf(const _tag_SUBDIR_ENTRY_INFO_ &r) {
@@ -71,7 +68,7 @@ Result EnumAs(Appliance &app, const std::string &user, const std::string &path,
         std::ofstream(kResult, std::ios::binary) << text;
         return 0;
     });
-    const std::vector<std::string> parts = Split(ReadAll(kResult));
+    const std::vector<std::string> parts = Split(ReadFile(kResult));
     Result r;
     if (parts.size() < 3 || (parts.size() - 3) % 9 != 0) {
         ADD_FAILURE() << "no result from " << user;
@@ -98,7 +95,7 @@ std::vector<Fields> Reference(Appliance &app, const std::string &user, const std
                                 "'%n\\0%s\\0%f\\0%Y\\0%u\\0%g\\0%d\\0' {} + > " + kReference;
     EXPECT_EQ(app.RunAs(user, [&] { return system(command.c_str()) == 0 ? 0 : 1; }), 0) << command;
     const std::set<std::string> hidden = {"@eaDir", "@tmp", "@sharebin", "#snapshot", ".DS_Store"};
-    const std::vector<std::string> parts = Split(ReadAll(kReference));
+    const std::vector<std::string> parts = Split(ReadFile(kReference));
     struct stat dirStat;
     EXPECT_EQ(stat(dir.c_str(), &dirStat), 0);  // a folder on another device is a mount point
     std::vector<Fields> folders;

@@ -5,14 +5,13 @@
 #include <syslog.h>
 #include <unistd.h>
 
-#include <fstream>
 #include <regex>
-#include <sstream>
 #include <string>
 #include <vector>
 
 #include <gtest/gtest.h>
 
+#include "../platform/platform_test_util.h"
 #include "appliance.h"
 #include "web_front.h"
 
@@ -23,12 +22,7 @@ using norvo::testing::LogLine;
 using norvo::testing::WebFront;
 using Lines = std::vector<std::string>;
 
-std::string Read(const std::string &path) {
-    std::ifstream in(path, std::ios::binary);
-    std::stringstream text;
-    text << in.rdbuf();
-    return text.str();
-}
+const auto Read = norvo::testing::ReadFile;
 
 // Every file below dir, "@tmp" included: what a refused upload must not have left.
 Lines Tree(const std::string &dir) {

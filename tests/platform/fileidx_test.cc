@@ -12,7 +12,6 @@
 #include <algorithm>
 #include <fstream>
 #include <random>
-#include <sstream>
 #include <string>
 #include <vector>
 
@@ -537,9 +536,7 @@ TEST_F(FileIdx, ShellReadsTheDatabaseThroughExec) {
     const char *shell[] = {"sqlite3", "-readonly", kDb.c_str(), ".output /volume1/public/out",
                            "SELECT share, name, size FROM fileinfo;", nullptr};
     ASSERT_EQ(VLIBCExec("/usr/bin/sqlite3", shell), 0);
-    std::stringstream out;
-    out << std::ifstream("/volume1/public/out").rdbuf();
-    EXPECT_EQ(out.str(), "photo|a'; DROP TABLE fileinfo; --.jpg|42\n");
+    EXPECT_EQ(norvo::testing::ReadFile("/volume1/public/out"), "photo|a'; DROP TABLE fileinfo; --.jpg|42\n");
 
     setenv("HTTP_X", "() { :; }; echo owned", 1);
     ASSERT_EQ(dup2(2, 50), 50);

@@ -56,16 +56,12 @@ TEST_F(TaskStore, TheOwnersDirectoryIsTheOwnersAlone) {
     EXPECT_EQ(ModeOf(QUIB_TASK_DIR), "0:0 " + std::to_string(0711));
     EXPECT_EQ(ModeOf(kAliceDir), alice + " " + std::to_string(0700));
     EXPECT_EQ(ModeOf(kAliceDir + "/" QUIB_TASK_DB_NAME), alice + " " + std::to_string(0600));
-    const auto reads = [](const char *owner) {
-        OBX::TaskMgr other(owner);
-        return other.isOpen() ? 1 : -(VLIBCErrGet() >> 8);
-    };
     EXPECT_EQ(app_.RunAs("alice", [&] {
         OBX::TaskMgr own("alice");
         Tasks task(own.getTask("Tovana_1"));
         return task && task->beginUpdate() && task->setProperty("k", 1) && task->endUpdate() ? 1 : 0;
     }), 1);
-    EXPECT_EQ(app_.RunAs("bob", [&] { return reads("alice"); }), -3);  // 0x0300
+    EXPECT_EQ(app_.RunAs("bob", [] { return OBX::TaskMgr("alice").isOpen() ? 1 : VLIBCErrGet() >> 8; }), 3);
     // Whatever is not exactly so is refused, to root as well.
     struct Case { const char *what, *command; } cases[] = {
         {"a directory others may enter", "chmod 0710 " QUIB_TASK_DIR "/alice"},
@@ -172,7 +168,6 @@ TEST_F(TaskStore, ATaskWhoseWorkerIsGoneCountsAsFinished) {
     const pid_t worker = Sleeper();
     Tasks task(mgr.createTask("w", worker)), self(mgr.createTask("self", getpid()));
     ASSERT_TRUE(task && self);
-    EXPECT_EQ(task->getPid(), worker);
     EXPECT_FALSE(task->isFinished());
     kill(worker, SIGKILL);
     while (system(("grep -q '^State:.*Z' /proc/" + std::to_string(worker) + "/status").c_str()) != 0) usleep(1000);
@@ -188,7 +183,6 @@ TEST_F(TaskStore, ATaskWhoseWorkerIsGoneCountsAsFinished) {
     Tasks other(mgr.createTask("marked", getpid()));
     ASSERT_TRUE(other && other->setFinished() && other->reload());
     EXPECT_TRUE(other->isFinished());
-    EXPECT_TRUE(Tasks(mgr.getTask("marked"))->isFinished());
 }
 
 }  // namespace
