@@ -223,8 +223,10 @@ TEST_F(FileIdx, ChainShapesAndPaths) {
         hits.push_back(Hit("t", path));
     }
     Insert(hits);
+    // path AND share; the records live on the heap, so the link survives the return.
     auto c = [](const char *share, __tag_FI_SQL_COND_OP op, const char *path) {
         std::vector<__tag_FI_SQL_COND> r{Cond(FI_COND_PATH, op, path), Cond(FI_COND_SHARE, FI_OP_EQ, share)};
+        r[0].andNext = &r[1];
         return r;
     };
     const struct {
@@ -244,7 +246,6 @@ TEST_F(FileIdx, ChainShapesAndPaths) {
     };
     for (const auto &k : cases) {
         auto chain = c("s", k.op, k.pattern);
-        chain[0].andNext = &chain[1];
         EXPECT_EQ(Where(&chain[0]), k.paths) << k.pattern;
     }
     // (a or ab) and share t, with the andNext on the first alternative or on the last.
@@ -282,12 +283,10 @@ TEST_F(FileIdx, ChainShapesAndPaths) {
 
     // Update: rename s:a/b to s:a/z; a set list that would give two hits one key changes nothing.
     auto key = c("s", FI_OP_EQ, "a/b");
-    key[0].andNext = &key[1];
     __tag_FI_SQL_COND set[2] = {Cond(FI_COND_PATH, FI_OP_EQ, "a/z"), Cond(FI_COND_SIZE, FI_OP_EQ, "18446744073709551615")};
     set[0].orNext = &set[1];
     ASSERT_EQ(FILEIDXDBUpdate(kDb.c_str(), set, &key[0]), 0);
     auto moved = c("s", FI_OP_EQ, "a/z");
-    moved[0].andNext = &moved[1];
     FI_QUERY bySize{&moved[0], 0, {}};
     const auto size = [](FI_FILE_INFO_DATA *r, void *arg) { return *static_cast<long long *>(arg) = r->size, 1; };
     long long found = 0;
@@ -298,7 +297,6 @@ TEST_F(FileIdx, ChainShapesAndPaths) {
     EXPECT_EQ(Where(&moved[0]), (std::vector<std::string>{"s:a/z"}));
     // Delete a folder and what lies below it, sparing its namesake prefix and the other share.
     auto folder = c("s", FI_OP_PATH_LIKE, "a/*");
-    folder[0].andNext = &folder[1];
     ASSERT_EQ(FILEIDXDBDel(kDb.c_str(), &folder[0]), 0);
     __tag_FI_SQL_COND inS = Cond(FI_COND_SHARE, FI_OP_EQ, "s");
     EXPECT_EQ(Where(&inS), (std::vector<std::string>{"s:a", "s:ab", "s:a*b/x", "s:*/x", "s:a\\b/c", "s:A/b"}));
