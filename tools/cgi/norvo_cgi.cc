@@ -255,30 +255,6 @@ private:
     int code_ = 0;
 };
 
-// CheckFile leaves the process as the user for the rest of the upload; root comes back only
-// when the request is done (the leak check at exit needs a process it may trace).
-class SavedIdentity {
-public:
-    SavedIdentity()
-        : uid_(geteuid()), gid_(getegid()), groups_(static_cast<size_t>(std::max(getgroups(0, nullptr), 0))) {
-        const int n = getgroups(static_cast<int>(groups_.size()), groups_.data());
-        groups_.resize(n > 0 ? static_cast<size_t>(n) : 0);
-    }
-    ~SavedIdentity() {
-        if (seteuid(uid_) == 0) {
-            (void)setgroups(groups_.size(), groups_.data());
-            (void)setegid(gid_);
-        }
-    }
-    SavedIdentity(const SavedIdentity &) = delete;
-    SavedIdentity &operator=(const SavedIdentity &) = delete;
-
-private:
-    uid_t uid_;
-    gid_t gid_;
-    std::vector<gid_t> groups_;
-};
-
 // Reads the body from stdin through the multipart reader into the sink; 0 or the library code.
 // A refused body is still read to its end, so the client gets the answer rather than a reset.
 int ReadUpload(const std::string &boundary, UploadSink &sink) {
@@ -331,7 +307,9 @@ int Upload(QUIB::WebCGI &cgi, const Link &link) {
     if (NvoCreateTmpDir(volume.c_str()) != 0) {
         return Fail(cgi, NVO_ERR_SYSTEM);
     }
-    const SavedIdentity saved;
+    // CheckFile leaves the process as the user for the rest of the upload; root comes back
+    // only when the request is done (the leak check at exit needs a process it may trace).
+    const norvo::cli::SavedIdentity saved;
     UploadSink sink(link, volume + "/@tmp/norvo");
     int code = ReadUpload(boundary, sink);
     if (code == 0) {

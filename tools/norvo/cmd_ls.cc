@@ -107,16 +107,6 @@ std::string HumanSize(uint64_t size) {
     return buf;
 }
 
-std::string Date(int32_t seconds) {
-    const time_t when = seconds;
-    struct tm parts;
-    char buf[32];
-    if (localtime_r(&when, &parts) == nullptr || strftime(buf, sizeof buf, "%Y-%m-%d %H:%M", &parts) == 0) {
-        return "?";
-    }
-    return buf;
-}
-
 // The cells of one line, escaped for the terminal; the name last (it may be long or odd).
 class Table {
 public:

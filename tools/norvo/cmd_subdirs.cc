@@ -21,16 +21,6 @@
 namespace norvo::cli {
 namespace {
 
-std::string Date(int32_t seconds) {
-    const time_t when = seconds;
-    struct tm parts;
-    char buf[32];
-    if (localtime_r(&when, &parts) == nullptr || strftime(buf, sizeof buf, "%Y-%m-%d %H:%M", &parts) == 0) {
-        return "?";
-    }
-    return buf;
-}
-
 Json::Value FolderJson(const _tag_SUBDIR_ENTRY_INFO_ &folder) {
     Json::Value item(Json::objectValue);
     item["name"] = folder.name;

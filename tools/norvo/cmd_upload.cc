@@ -12,6 +12,7 @@
 
 #include "exit_status.h"
 #include "handlers.h"
+#include "identity.h"
 #include "norvo/errors.h"
 #include "norvo/norvodir.h"
 #include "norvo/norvomisc.h"
@@ -35,29 +36,6 @@ void DefaultClient() {
     }
 }
 
-// CheckFile takes the user's identity for good, as a CGI program's request does; the command
-// gives it back before it exits, as the other commands do (the real uid stays root).
-class SavedIdentity {
-public:
-    SavedIdentity() : uid_(geteuid()), gid_(getegid()), groups_(size_t(std::max(getgroups(0, nullptr), 0))) {
-        const int n = getgroups(int(groups_.size()), groups_.data());
-        groups_.resize(n > 0 ? size_t(n) : 0);
-    }
-    ~SavedIdentity() {
-        if (seteuid(uid_) == 0) {
-            (void)setgroups(groups_.size(), groups_.data());
-            (void)setegid(gid_);
-        }
-    }
-    SavedIdentity(const SavedIdentity &) = delete;
-    SavedIdentity &operator=(const SavedIdentity &) = delete;
-
-private:
-    uid_t uid_;
-    gid_t gid_;
-    std::vector<gid_t> groups_;
-};
-
 }  // namespace
 
 int RunUpload(const Invocation &inv) {
@@ -77,6 +55,7 @@ int RunUpload(const Invocation &inv) {
         return ReportLibraryFailure(inv, "resolving " + dst);
     }
     // As the upload program: checked, then moved as the user, who owns the result.
+    // CheckFile takes the user's identity for good; given back before the command exits.
     const SavedIdentity saved;
     if (const int code = CheckFile(dst, user.c_str(), inv.CStr("sid"), &type)) {
         return ReportFailure(inv, code, "checking " + dst);

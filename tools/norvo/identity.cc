@@ -5,6 +5,7 @@
 #include <string.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <iostream>
 
 namespace norvo::cli {
@@ -63,6 +64,19 @@ UserIdentity::~UserIdentity() {
     if (seteuid(savedUid_) != 0 || setegid(savedGid_) != 0 ||
         setgroups(savedGroups_.size(), savedGroups_.data()) != 0) {
         std::cerr << "norvo: cannot take the own identity back: " << strerror(errno) << '\n';
+    }
+}
+
+SavedIdentity::SavedIdentity()
+    : uid_(geteuid()), gid_(getegid()), groups_(static_cast<size_t>(std::max(getgroups(0, nullptr), 0))) {
+    const int n = getgroups(static_cast<int>(groups_.size()), groups_.data());
+    groups_.resize(n > 0 ? static_cast<size_t>(n) : 0);
+}
+
+SavedIdentity::~SavedIdentity() {
+    if (seteuid(uid_) == 0) {
+        (void)setgroups(groups_.size(), groups_.data());
+        (void)setegid(gid_);
     }
 }
 

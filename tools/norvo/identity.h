@@ -29,4 +29,19 @@ private:
     std::vector<gid_t> savedGroups_;
 };
 
+// The effective ids and groups at construction, given back when it goes (the real uid stays
+// root, so seteuid can return): for code that takes the user's identity for good.
+class SavedIdentity {
+public:
+    SavedIdentity();
+    ~SavedIdentity();
+    SavedIdentity(const SavedIdentity &) = delete;
+    SavedIdentity &operator=(const SavedIdentity &) = delete;
+
+private:
+    uid_t uid_;
+    gid_t gid_;
+    std::vector<gid_t> groups_;
+};
+
 }  // namespace norvo::cli

@@ -1,4 +1,5 @@
 #include "output.h"
+#include <time.h>
 
 #include <algorithm>
 #include <iostream>
@@ -175,6 +176,16 @@ int ReportUsageError(const CommandDef *command, const std::string &message) {
     }
     std::cerr << "Try '" << prefix << " --help' for more.\n";
     return kExitUsage;
+}
+
+std::string Date(int32_t seconds) {
+    const time_t when = seconds;
+    struct tm parts;
+    char buf[32];
+    if (localtime_r(&when, &parts) == nullptr || strftime(buf, sizeof buf, "%Y-%m-%d %H:%M", &parts) == 0) {
+        return "?";
+    }
+    return buf;
 }
 
 }  // namespace norvo::cli

@@ -1,6 +1,8 @@
 // Printing results: aligned text or one JSON object, and the three kinds of ending (success,
 // failure with the library's code and key, usage error).
 #pragma once
+#include <stdint.h>
+
 #include <json/json.h>
 
 #include <ostream>
@@ -33,6 +35,9 @@ private:
 // A library code and its message key, for JSON and text.
 Json::Value ErrorJson(int code);
 std::string ErrorText(int code);  // "error 408 (error:error_no_path)"
+
+// A modification time as a listing shows it, local time ("2024-05-01 13:45"; "?" if unprintable).
+std::string Date(int32_t seconds);
 
 // {"success":true,"data":data} or the text; returns kExitOk.
 int ReportSuccess(const Invocation &inv, const Json::Value &data, const TextTable &text);
