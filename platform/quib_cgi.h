@@ -44,6 +44,13 @@ QUIB_API int QuibCgiEndCriticalSection(int handle);
 // file can't be read (0x0900): the caller then uses its own default.
 QUIB_API int VLIBCConfGetOBXTimeout(void);
 
+// The language of the web interface for this request: the language of HTTP_ACCEPT_LANGUAGE
+// with the highest q-value (RFC 9110; equal values in header order) that the interface has,
+// a range such as "de-CH" also taking "de" and "zh" taking "zh-tw"; "en" when none matches or
+// the header is absent or malformed. The interface has the languages whose folders exist
+// under /usr/quib/quibman/webman/texts ("en" always). Never null; valid until the next call.
+QUIB_API const char *QuibCgiSelectDefLang(void);
+
 QUIB_END_C
 
 namespace QUIB {
@@ -69,6 +76,11 @@ public:
     // the object's life; null when there is none. Values may hold any byte but NUL (an
     // escaped LF included): callers check what they put into files or headers.
     const char *In(const char *name) const;
+    // The same with fallback (which may be null) for a request without it.
+    const char *In(const char *name, const char *fallback) const {
+        const char *value = In(name);
+        return value != nullptr ? value : fallback;
+    }
     // The value of the first cookie called name when it is a token (quotes removed); null when
     // there is none or the first one's value is not a token.
     const char *GetCookie(const char *name) const;

@@ -20,4 +20,8 @@ public:
     // followed), and "" with the error slot set for a bad path (as IsMountPoint) or a table or
     // working directory that can't be read.
     static std::string getMountType(const std::string &path);
+    // The modification time of path (a link followed) as decimal seconds since the epoch, the
+    // version stamp of the web interface's resources; "" with the slot set when it can't be
+    // examined (the errno's code) or for a bad path (as IsMountPoint).
+    static std::string GetModifyTime(const std::string &path);
 };

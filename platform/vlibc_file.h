@@ -36,3 +36,9 @@ QUIB_API int VLIBCFileCheckKeyValue(const char *file, const char *key, const cha
 QUIB_API int VLIBCFileGetKeys(const char *file, PSZLIST *keys, PSZLIST *values);
 
 QUIB_END_C
+
+// The hash form: sets every key of the file in hash to the value readers see (the first line
+// of a key counts; keys enter in file order). flags must be 0 and separator "=", the one this
+// format has. Returns the number of keys (0 for none); -1 on failure (0x0900 file missing or
+// unreadable, 0x0D00 bad argument, 0x2B00), and then the hash is unchanged.
+QUIB_API int VLIBCFileGetKeys(const char *file, int flags, PSZHASH hash, const char *separator);

@@ -44,4 +44,23 @@ QUIB_API int VLIBCSzListCount(const PSZLIST list);
 // null argument, 0x2B00 when out of memory, and then nothing is appended.
 QUIB_API int VLIBCStrTok(const char *text, const char *delims, PSZLIST *plist);
 
+// A string hash: owned keys, each with one owned value, enumerated in the order they were
+// first set. Made by VLIBCSzHashAlloc, freed by VLIBCSzHashFree.
+typedef struct _tag_SZHASH_ SZHASH, *PSZHASH;
+
+// A new empty hash sized for about size keys (it grows past that); null with 0x2B00.
+QUIB_API PSZHASH VLIBCSzHashAlloc(int size);
+// Frees the hash, its keys and values; null is ignored.
+QUIB_API void VLIBCSzHashFree(PSZHASH hash);
+// Sets key to a copy of value (a key set again keeps its place). 0; -1 with 0x0D00 for a null
+// argument, 0x2B00 when out of memory (the hash is then unchanged).
+QUIB_API int VLIBCSzHashSetValue(PSZHASH hash, const char *key, const char *value);
+// The value of key, owned by the hash until it changes; null when absent or for null arguments.
+QUIB_API const char *VLIBCSzHashGetValue(PSZHASH hash, const char *key);
+// Number of keys (0 for null).
+QUIB_API int VLIBCSzHashCount(PSZHASH hash);
+// Appends every key to *plist in the order they were first set. Returns how many; -1 with
+// 0x0D00 for null arguments or 0x2B00, and then nothing is appended.
+QUIB_API int VLIBCSzHashEnumKey(PSZHASH hash, PSZLIST *plist);
+
 QUIB_END_C

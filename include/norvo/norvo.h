@@ -7,6 +7,7 @@
 #include "norvo/norvomisc.h"
 #include "norvo/norvoprogress.h"
 #include "norvo/norvosearch.h"
+#include "norvo/norvosharing.h"
 #include "norvo/norvoupload.h"
 #include "norvo/norvouser.h"
 #include "norvo/nvoman.h"

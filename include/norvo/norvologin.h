@@ -79,6 +79,15 @@ public:
     // Counts a failed login of the client's address for the automatic blocking.
     void folderSharingFailLoginSet();
     std::string GetLoginUserName() const;
+    // The folder of the sharing link whose id is "HTTP_FOLDER_SHARING" or else the parameter
+    // "FOLDER_SHARING": the "filepath" of its row in /usr/quib/etc/filebrowser/fbsharing.db
+    // when the link is within its validity dates; "" otherwise (unknown link, out of its
+    // period, database failure: logged).
+    std::string GetSharingFolderPath(QUIB::WebCGI &cgi) const;
+    // Writes the response header and the landing page of a sharing link for folderPath to
+    // standard output. What reaches the page is escaped for where it goes; an md5 that is not
+    // hexadecimal and a "tunnel" that is not a plain same-site path are left out.
+    void WriteWebPage(QUIB::WebCGI &cgi, const std::string &md5, const std::string &folderPath);
 
 private:
     std::string user_;

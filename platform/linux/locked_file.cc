@@ -37,6 +37,18 @@ int LockFile(int fd, int operation) {
     return 0;
 }
 
+int LockFileForProcess(int fd) {
+    struct flock whole {};
+    whole.l_type = F_WRLCK;
+    whole.l_whence = SEEK_SET;
+    while (fcntl(fd, F_SETLKW, &whole) != 0) {
+        if (errno != EINTR) {
+            return errno;
+        }
+    }
+    return 0;
+}
+
 int ReadAll(int fd, std::string *text) {
     std::string out;
     char chunk[16384];

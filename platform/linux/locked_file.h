@@ -32,6 +32,13 @@ inline constexpr size_t kMaxSettingsFileSize = 64u << 20;
 // flock that retries when a signal interrupts the wait. 0 or the errno.
 [[nodiscard]] int LockFile(int fd, int operation);
 
+// An exclusive POSIX record lock on the whole file, waiting for it (signals retried): the
+// lock settings writers take. It belongs to the process, so a process that holds the file's
+// flock (a different kind of lock on Linux) can still write through the writer, and two
+// processes exclude each other. fd must be open for writing. Closing any descriptor of the
+// file releases it. 0 or the errno.
+[[nodiscard]] int LockFileForProcess(int fd);
+
 // Reads the rest of fd. 0 and *text, or the errno (EFBIG past kMaxSettingsFileSize).
 [[nodiscard]] int ReadAll(int fd, std::string *text);
 

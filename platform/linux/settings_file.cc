@@ -1,4 +1,4 @@
-// VLIBCFile*: the appliance's key="value" settings files. Writers hold an exclusive flock and
+// VLIBCFile*: the appliance's key="value" settings files. Writers hold an exclusive lock and
 // replace the file by rename, so a reader needs no lock: it sees the old text or the new, never
 // a mixture.
 #include <ctype.h>
@@ -23,6 +23,7 @@
 #include "api_guard.h"
 #include "locked_file.h"
 #include "settings_format.h"
+#include "szhash.h"
 #include "text_util.h"
 #include "vlibc_file.h"
 
@@ -121,13 +122,13 @@ struct LockedTarget {
 int LockTarget(const std::string &target, bool create, LockedTarget *out) {
     const auto deadline = std::chrono::steady_clock::now() + kMaxLockWait;
     while (std::chrono::steady_clock::now() < deadline) {
-        FileDescriptor fd(open(target.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK));
+        FileDescriptor fd(open(target.c_str(), O_RDWR | O_CLOEXEC | O_NONBLOCK));
         bool created = false;
         if (!fd.IsOpen()) {
             if (errno != ENOENT || !create) {
                 return errno;
             }
-            fd.Reset(open(target.c_str(), O_RDONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0644));
+            fd.Reset(open(target.c_str(), O_RDWR | O_CREAT | O_EXCL | O_CLOEXEC, 0644));
             if (!fd.IsOpen()) {
                 if (errno == EEXIST) {
                     continue;
@@ -143,7 +144,9 @@ int LockTarget(const std::string &target, bool create, LockedTarget *out) {
         if (!S_ISREG(st.st_mode)) {
             return S_ISDIR(st.st_mode) ? EISDIR : EINVAL;
         }
-        if (int err = LockFile(fd.Get(), LOCK_EX); err != 0) {
+        // A process lock, not flock: a caller may hold the file's flock around its writes
+        // (the sharing privileges do), and a second flock of ours would wait for it forever.
+        if (int err = LockFileForProcess(fd.Get()); err != 0) {
             return err;
         }
         struct stat now;
@@ -455,3 +458,25 @@ int VLIBCFileGetKeys(const char *file, PSZLIST *keys, PSZLIST *values) {
 }
 
 }  // extern "C"
+
+int VLIBCFileGetKeys(const char *file, int flags, PSZHASH hash, const char *separator) {
+    if (!np::CheckFileArg(file)) {
+        return -1;
+    }
+    if (flags != 0 || hash == nullptr || separator == nullptr || strcmp(separator, "=") != 0) {
+        QUIB_SET_ERR(QUIB_ERR_BAD_PARAMETER);
+        return -1;
+    }
+    return np::ReadSettings(file, [&](const np::Lines &lines) {
+        // Filled aside and swapped in, so a failure leaves the caller's hash as it was.
+        SZHASH filled = *hash;
+        std::set<std::string> seen;
+        for (const np::SettingsLine &line : lines) {
+            if (line.isEntry && seen.insert(line.key).second) {
+                filled.Set(line.key, line.value);
+            }
+        }
+        std::swap(*hash, filled);
+        return static_cast<int>(seen.size());
+    });
+}

@@ -96,3 +96,17 @@ std::string WebUtils::getMountType(const std::string &path) {
         return ListedAsMount(path, &type) ? type : std::string();
     });
 }
+
+std::string WebUtils::GetModifyTime(const std::string &path) {
+    if (CheckPathString(path) != 0) {
+        return std::string();
+    }
+    return Guarded(std::string(), [&] {
+        struct stat st;
+        if (stat(path.c_str(), &st) != 0) {
+            QUIB_SET_ERRNO(errno);
+            return std::string();
+        }
+        return std::to_string(static_cast<long long>(st.st_mtime));
+    });
+}

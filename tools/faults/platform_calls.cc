@@ -8,6 +8,7 @@
 
 #include "quib_autoblock.h"
 #include "quib_cgi.h"
+#include "quib_db.h"
 
 #include "fileidx.h"
 #include "quib_dir_pass.h"
@@ -203,6 +204,9 @@ SEAM_OPENER(PSZLIST, QuibCgiLDAPValidShareGen,
             (const char *context, const char *user, int sort, int writable), (context, user, sort, writable))
 SEAM_OPENER(QUIBDirPass *, QUIBDirPassBegin, (const char *dirPath), (dirPath))
 SEAM_OPENER(QuibCgi *, QuibCgiAlloc, (const char *recordFile, const char *lockName), (recordFile, lockName))
+SEAM_OPENER(PSZHASH, VLIBCSzHashAlloc, (int size), (size))
+SEAM_OPENER(PQUIBDB, QUIBDBConnect, (const char *host, const char *user, const char *password, const char *path),
+            (host, user, password, path))
 
 // Calls that release one.
 #define SEAM_RELEASER(type, fn) \
@@ -220,6 +224,9 @@ SEAM_RELEASER(PQUIBGROUP_DB, QUIBGroupDBClose)
 SEAM_RELEASER(PSZLIST, VLIBCSzListFree)
 SEAM_RELEASER(QUIBDirPass *, QUIBDirPassEnd)
 SEAM_RELEASER(QuibCgi *, QuibCgiFree)
+SEAM_RELEASER(PSZHASH, VLIBCSzHashFree)
+SEAM_RELEASER(PQUIBDB, QUIBDBClose)
+SEAM_RELEASER(PQUIBDB_RESULT, QUIBDBFreeResult)
 
 // Calls that refill a caller's slot (a cursor's record, a list that may move as it grows).
 #define SEAM_REFILL(fn, slot, params, args)                     \
@@ -245,8 +252,25 @@ SEAM_REFILL(VLIBCStrTok, plist, (const char *text, const char *delims, PSZLIST *
 SEAM_REFILL(QUIBGroupInfoGetgroupList, plist, (const char *user, PSZLIST *plist, int flags),
             (user, plist, flags))
 
+SEAM_REFILL(VLIBCSzHashEnumKey, plist, (PSZHASH hash, PSZLIST *plist), (hash, plist))
+
+int QUIBDBExecute(PQUIBDB db, const char *sql, PQUIBDB_RESULT *result) {
+    SEAM_REAL(QUIBDBExecute);
+    if (ShouldFailPlatform("QUIBDBExecute")) {
+        if (result != nullptr) {
+            *result = nullptr;
+        }
+        return -1;
+    }
+    const int rc = real(db, sql, result);
+    if (rc == 0) {
+        seam::Track(*result, "QUIBDBExecute");
+    }
+    return rc;
+}
+
 int VLIBCFileGetKeys(const char *file, PSZLIST *keys, PSZLIST *values) {
-    SEAM_REAL(VLIBCFileGetKeys);
+    static const auto real = reinterpret_cast<int (*)(const char *, PSZLIST *, PSZLIST *)>(seam::Next("VLIBCFileGetKeys"));
     if (ShouldFailPlatform("VLIBCFileGetKeys")) {
         return -1;
     }
@@ -263,6 +287,18 @@ int VLIBCFileGetKeys(const char *file, PSZLIST *keys, PSZLIST *values) {
 }
 
 // The C++ entry points, found by their mangled names.
+int VLIBCFileGetKeys(const char *file, int flags, PSZHASH hash, const char *separator) {
+    static const auto real = reinterpret_cast<int (*)(const char *, int, PSZHASH, const char *)>(
+        seam::Next("_Z16VLIBCFileGetKeysPKciP12_tag_SZHASH_S0_"));
+    return ShouldFailPlatform("VLIBCFileGetKeys") ? -1 : real(file, flags, hash, separator);
+}
+
+std::string WebUtils::GetModifyTime(const std::string &path) {
+    static const auto real = reinterpret_cast<std::string (*)(const std::string &)>(
+        seam::Next("_ZN8WebUtils13GetModifyTimeERKNSt7__cxx1112basic_stringIcSt11char_traitsIcESaIcEEE"));
+    return ShouldFailPlatform("WebUtils::GetModifyTime") ? std::string() : real(path);
+}
+
 int QUIB::WebAPIUtil::ParseToArray(const char *value, Json::Value &array) {
     static const auto real = reinterpret_cast<int (*)(const char *, Json::Value &)>(
         seam::Next("_ZN4QUIB10WebAPIUtil12ParseToArrayEPKcRN4Json5ValueE"));
