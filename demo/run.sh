@@ -27,4 +27,4 @@ fi
 
 # --no-log: the library's syslog lines would mix with the tour.
 "$build/tools/sandbox/norvo-sandbox" --no-log "$root/demo/appliance.conf" -- \
-    /usr/bin/env NORVO_IN_SANDBOX=1 NORVO="$build/tools/norvo" /bin/sh "$root/demo/tour.sh"
+    /usr/bin/env NORVO_IN_SANDBOX=1 NORVO="$build/tools/norvo" NORVO_CGI="$build/tools/norvo.cgi" /bin/sh "$root/demo/tour.sh"

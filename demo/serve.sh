@@ -10,12 +10,11 @@ fi
 port=${NORVO_PORT:-8080}
 dir=$(mktemp -d /tmp/webfront.XXXXXX)
 mkdir "$dir/htdocs"
-# Two links: alice's photos of 2024, and public's top level shared by bob.
-printf 'photos="alice:/photo/2024"\nreadme="bob:/public"\n' >/usr/quib/etc/norvo_cgi_links.conf
 bash "$NORVO_SOURCE/tools/cgi/lighttpd-conf.sh" "$dir" "$port" "$NORVO_CGI" "${NORVO_TRUSTED_PROXY:-}" >"$dir/lighttpd.conf"
 url="http://127.0.0.1:$port/cgi-bin/norvo.cgi"
 cat <<TEXT
-Serving the links "photos" and "readme" at $url (Ctrl-C stops). Try:
+Serving the links "photos" and "readme" of the link database at $url (Ctrl-C stops). Try:
+  curl '$url?api=page&FOLDER_SHARING=photos'      (the landing page)
   curl -c jar '$url?api=login&FOLDER_SHARING=photos'
   curl -b jar '$url?api=list&FOLDER_SHARING=photos&sort=size'
 A login takes a second. The library's log lines follow as syslog.err.

@@ -148,4 +148,11 @@ show "bob may only read photo: his upload is refused before anything moves" \
 export HTTP_HOST=nas:5000  # as the web server passes a request's Host header
 show "A download recorded by hand, with the address a client reaches the device under" \
     xferlog --user bob --size 4096 download /archive/2019/report.pdf
+printf '\n== A visitor opens the sharing link "photos": the link database gives its folder, the CGI\n'
+printf '   program answers with the landing page (the first lines; the web server would add its own)\n'
+printf '$ QUERY_STRING='"'"'api=page&FOLDER_SHARING=photos'"'"' norvo.cgi | head -9\n'
+QUERY_STRING='api=page&FOLDER_SHARING=photos' REQUEST_METHOD=GET "$NORVO_CGI" | head -9
+printf '\n== The link "old" expired in 2023: no folder, no page\n'
+printf '$ QUERY_STRING='"'"'api=page&FOLDER_SHARING=old'"'"' norvo.cgi\n'
+QUERY_STRING='api=page&FOLDER_SHARING=old' REQUEST_METHOD=GET "$NORVO_CGI"
 printf '\nEnd of the tour.\n'

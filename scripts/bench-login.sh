@@ -16,7 +16,7 @@ trap 'rm -rf "$work"' EXIT
 cat >"$work/appliance" <<'APPLIANCE'
 basic
 privilege QUIB.TVQ.App.Tovana3.Instance @users
-file /usr/quib/etc/norvo_cgi_links.conf content="L1=\"alice:/public/dir\"\n"
+link L1 owner=alice path=/public/dir
 file /volume1/public/dir/a.txt owner=alice size=100
 file /volume1/public/dir/b.txt owner=bob size=200
 dir /volume1/public/dir/sub owner=alice

@@ -18,7 +18,7 @@ cat >"$work/appliance" <<'APPLIANCE'
 basic
 privilege QUIB.TVQ.App.Tovana3.Instance @users
 setting filebrowserxferlog=yes
-file /usr/quib/etc/norvo_cgi_links.conf content="L1=\"alice:/public/dir\"\n"
+link L1 owner=alice path=/public/dir
 dir /volume1/public/dir owner=alice
 APPLIANCE
 # The program lighttpd runs: norvo.cgi under GNU time, its peak RSS (KiB) appended to a file.

@@ -7,7 +7,7 @@ packages=(
   libjsoncpp-dev libicu-dev libsqlite3-dev libcrypt-dev libacl1-dev acl
   libfuse3-dev fuse3 fusefat dosfstools fuseiso genisoimage sqlite3
   googletest libgtest-dev libgmock-dev libbenchmark-dev
-  lighttpd curl
+  lighttpd curl chromium
 )
 [ "${1:-}" = "--bench" ] && packages+=(hyperfine bfs time)
 

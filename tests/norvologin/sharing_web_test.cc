@@ -42,7 +42,7 @@ protected:
     void SetUp() override {
         app_.Basic().SetAppPrivilege("QUIB.TVQ.App.Tovana3.Instance", "@users").SetSetting("auto_block_attempts", "3");
         app_.WriteFile("/volume1/public/dir/a.txt", "hello", "alice");
-        app_.WriteFile("/usr/quib/etc/norvo_cgi_links.conf", "L1=\"alice:/public/dir\"\n");
+        app_.AddSharingLink({.id = "L1", .owner = "alice", .path = "/public/dir"});
     }
     Appliance app_;
 };

@@ -63,8 +63,9 @@ protected:
         norvo::testing::ShareSpec small;
         small.name = "small", small.volume = "/volume3", small.readWrite = "@users";
         app_.AddShare(small);
-        app_.WriteFile("/usr/quib/etc/norvo_cgi_links.conf",
-                       "L1=\"alice:/public/dir\"\nL2=\"bob:/photo\"\nL3=\"alice:/small\"\n");
+        app_.AddSharingLink({.id = "L1", .owner = "alice", .path = "/public/dir"})
+            .AddSharingLink({.id = "L2", .owner = "bob", .path = "/photo"})
+            .AddSharingLink({.id = "L3", .owner = "alice", .path = "/small"});
     }
     // The cookie header of a logged-in visitor of link.
     std::string Login(const std::string &link) {

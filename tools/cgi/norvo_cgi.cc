@@ -7,10 +7,11 @@
 //   POST ?api=upload&FOLDER_SHARING=LINK   multipart/form-data, one part with a filename: the
 //                                    file lands in the link's folder, the link user's own
 //   ?api=download&FOLDER_SHARING=LINK&file=NAME   the bytes of NAME below the link's folder
+//   ?api=page&FOLDER_SHARING=LINK    the link's landing page (HTML; "tunnel", "noCache", "md5")
 //
 // Answers {"success":true,"data":{...}} or {"success":false,"error":{"code":N,"key":"..."}}.
-// Links come from /usr/quib/etc/norvo_cgi_links.conf, LINK="USER:/user/path", until the link
-// database serves them.
+// A link is a row of the link database: its folder (a user path) while the link is within its
+// dates, and its owner's uid, whose account the visitor acts as.
 #include <errno.h>
 #include <fcntl.h>
 #include <grp.h>
@@ -30,17 +31,18 @@
 #include <vector>
 
 #include <json/json.h>
+#include <sqlite3.h>
 
 #include "identity.h"
 #include "multipart.h"
 #include "norvo/norvo.h"
 #include "quib_cgi.h"
+#include "quib_db.h"
 #include "quib_user.h"
-#include "vlibc_file.h"
 
 namespace {
 
-constexpr char kLinks[] = "/usr/quib/etc/norvo_cgi_links.conf";
+constexpr char kLinkDatabase[] = "/usr/quib/etc/filebrowser/fbsharing.db";
 constexpr int kInfo = NVO_INFO_SIZE | NVO_INFO_OWNER | NVO_INFO_TIME | NVO_INFO_PERM | NVO_INFO_TYPE;
 
 struct Link {
@@ -54,18 +56,37 @@ bool GoodLinkId(const char *id) {
            strspn(id, "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789_-") == n;
 }
 
-bool FindLink(const char *id, Link *link) {
-    char value[4200];
-    if (VLIBCFileGetKeyValue(kLinks, id, value, sizeof value, 0) <= 0) {
-        return false;
+// The account of the link's owner (its "uid"), "" when there is none.
+std::string LinkOwner(const char *id) {
+    std::unique_ptr<char, void (*)(void *)> sql(
+        sqlite3_mprintf("SELECT uid FROM sharingLinks WHERE linkID = %Q LIMIT 1;", id), sqlite3_free);
+    std::unique_ptr<QUIBDB, void (*)(PQUIBDB)> db(QUIBDBConnect(nullptr, nullptr, nullptr, kLinkDatabase),
+                                                  QUIBDBClose);
+    PQUIBDB_RESULT raw = nullptr;
+    if (!sql || !db || QUIBDBExecute(db.get(), sql.get(), &raw) != 0) {
+        return "";
     }
-    const char *colon = strchr(value, ':');
-    if (colon == nullptr || colon[1] != '/') {
-        return false;
+    std::unique_ptr<QUIBDB_RESULT, void (*)(PQUIBDB_RESULT)> result(raw, QUIBDBFreeResult);
+    QUIBDB_ROW row = 0;
+    const char *uid = QUIBDBFetchRow(result.get(), &row) == 0 ? QUIBDBFetchField(result.get(), row, "uid") : nullptr;
+    if (uid == nullptr || uid[0] == '\0' || strspn(uid, "0123456789") != strlen(uid) || strlen(uid) > 9) {
+        return "";
     }
-    link->user.assign(value, static_cast<size_t>(colon - value));
-    link->path = colon + 1;
-    return true;
+    PQUIBUSER user = nullptr;
+    if (QUIBUserGetByUID(static_cast<uid_t>(strtoul(uid, nullptr, 10)), &user, 0) != 0) {
+        return "";
+    }
+    std::string name = user->szName;
+    QUIBUserFree(user);
+    return name;
+}
+
+// The link's folder (within its dates) and owner; false when either is missing.
+bool FindLink(QUIB::WebCGI &cgi, const NorvoLogin::FolderSharingLoginManager &manager, const char *id,
+              Link *link) {
+    link->path = manager.GetSharingFolderPath(cgi);
+    link->user = LinkOwner(id);
+    return link->path.size() > 1 && link->path[0] == '/' && !link->user.empty();
 }
 
 int Answer(QUIB::WebCGI &cgi, const Json::Value &answer) {
@@ -436,7 +457,9 @@ int main() {
     }
     NorvoLogin::FolderSharingLoginManager manager;
     Link link;
-    if (!FindLink(id, &link)) {
+    // The parameter names the link, never the server's header.
+    unsetenv("HTTP_FOLDER_SHARING");
+    if (!FindLink(cgi, manager, id, &link)) {
         manager.folderSharingFailLoginSet();  // guessing link ids counts as failing to log in
         return Fail(cgi, NVO_ERR_NO_PATH);
     }
@@ -448,6 +471,10 @@ int main() {
         answer["success"] = true;
         answer["data"]["user"] = manager.GetLoginUserName();
         return Answer(cgi, answer);
+    }
+    if (strcmp(api, "page") == 0) {
+        manager.WriteWebPage(cgi, cgi.In("md5", ""), link.path);
+        return 0;
     }
     if (strcmp(api, "list") == 0) {
         // The session must be this link's and its user's: another link's cookie is no key here.

@@ -3,6 +3,7 @@
 #include <fcntl.h>
 #include <sched.h>
 #include <signal.h>
+#include <sys/stat.h>
 #include <sys/wait.h>
 #include <syslog.h>
 #include <time.h>
@@ -26,6 +27,8 @@
 #include "unique_fd.h"
 
 #include "quib_paths.h"
+
+#include <sqlite3.h>
 
 namespace norvo::testing {
 
@@ -209,6 +212,26 @@ Appliance &Appliance::SetDefaultSetting(const std::string &key, const std::strin
 
 Appliance &Appliance::SetAppPrivilege(const std::string &privilege, const std::string &holders) {
     impl_->privileges.Set(privilege, holders);
+    return *this;
+}
+
+Appliance &Appliance::AddSharingLink(const SharingLinkSpec &link) {
+    MakeDirectory("/usr/quib/etc/filebrowser", 0, 0, 0755);
+    sqlite3 *db = nullptr;
+    const std::string file = "/usr/quib/etc/filebrowser/fbsharing.db";
+    const std::string name = link.path.substr(link.path.rfind('/') + 1);
+    char *sql = sqlite3_mprintf(
+        "CREATE TABLE IF NOT EXISTS sharingLinks (linkID TEXT PRIMARY KEY, uid TEXT, filepath TEXT, "
+        "filename TEXT, password TEXT, AvailDate TEXT, ExpDate TEXT);"
+        "INSERT OR REPLACE INTO sharingLinks VALUES (%Q, '%u', %Q, %Q, '', %Q, %Q);",
+        link.id.c_str(), static_cast<unsigned>(Uid(link.owner)), link.path.c_str(), name.c_str(),
+        link.availDate.c_str(), link.expDate.c_str());
+    if (sql == nullptr || sqlite3_open(file.c_str(), &db) != SQLITE_OK ||
+        sqlite3_exec(db, sql, nullptr, nullptr, nullptr) != SQLITE_OK || chmod(file.c_str(), 0644) != 0) {
+        Fail("can't add sharing link %s", link.id.c_str());
+    }
+    sqlite3_free(sql);
+    sqlite3_close(db);
     return *this;
 }
 

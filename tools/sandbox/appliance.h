@@ -42,6 +42,15 @@ struct ShareSpec {
     std::string comment;
 };
 
+// A row of the sharing link database /usr/quib/etc/filebrowser/fbsharing.db.
+struct SharingLinkSpec {
+    std::string id;
+    std::string owner;           // an appliance user; the row holds its uid
+    std::string path;            // the shared folder, a user path ("/photo/2024")
+    std::string availDate = "0";  // seconds since 1970, as text (any text: tests give bad ones)
+    std::string expDate = "0";    // "0": never expires
+};
+
 // One captured syslog line.
 struct LogLine {
     int priority;      // LOG_ERR, ...; -1 for a datagram not in syslog form (text is all of it)
@@ -101,6 +110,8 @@ public:
     Appliance &SetDefaultSetting(const std::string &key, const std::string &value);
     // Grants an application privilege to a comma-separated list of users and @groups.
     Appliance &SetAppPrivilege(const std::string &privilege, const std::string &holders);
+    // Adds (or replaces) a link in the sharing link database, creating it (root, 0644).
+    Appliance &AddSharingLink(const SharingLinkSpec &link);
 
     // Files with owner ("user", group: the user's primary; or "user:group") and exactly mode;
     // parents are created as root:root 0755 when missing. An existing file or directory is

@@ -33,6 +33,7 @@ struct ApplianceStep {
         kDeadRemote,
         kDir,
         kFile,
+        kLink,
     };
     Kind kind = Kind::kBasic;
     int line = 0;                // 1-based line in the file
@@ -49,6 +50,7 @@ struct ApplianceStep {
     std::string path;            // kHome root; kVolume, kReadOnly, kFat, kDeadRemote, kDir, kFile
     std::string owner = "root";  // kDir, kFile: "user" or "user:group"
     mode_t mode = 0;             // kDir (default 0755), kFile (default 0644)
+    SharingLinkSpec link;        // kLink
 };
 
 struct ApplianceFile {

@@ -49,6 +49,9 @@ void Apply(Appliance &appliance, const ApplianceStep &step) {
         case Kind::kPrivilege:
             appliance.SetAppPrivilege(step.name, step.value);
             break;
+        case Kind::kLink:
+            appliance.AddSharingLink(step.link);
+            break;
         case Kind::kVolume:
             appliance.AddVolume(step.path);
             break;

@@ -107,6 +107,7 @@ const std::vector<Syntax> &Directives() {
         {"deadremote", Kind::kDeadRemote, 1, {}, {}},
         {"dir", Kind::kDir, 1, {"owner", "mode"}, {}},
         {"file", Kind::kFile, 1, {"owner", "mode", "size", "content"}, {}},
+        {"link", Kind::kLink, 1, {"owner", "path", "avail", "exp"}, {}},
     };
     return directives;
 }
@@ -259,6 +260,9 @@ public:
             case Kind::kFile:
                 Node();
                 break;
+            case Kind::kLink:
+                Link();
+                break;
         }
         return step_;
     }
@@ -281,6 +285,24 @@ private:
                 throw LineError{"option '" + key + "' given twice"};
         }
         return options;
+    }
+
+    void Link() {
+        SharingLinkSpec &link = step_.link;
+        link.id = positionals_[0];
+        for (const auto &[key, value] : Options()) {
+            if (key == "owner")
+                link.owner = value;
+            else if (key == "path")
+                link.path = AbsolutePath(value);
+            else if (key == "avail")
+                link.availDate = std::to_string(Number(key, value, 9223372036854775807ULL));
+            else if (key == "exp")
+                link.expDate = std::to_string(Number(key, value, 9223372036854775807ULL));
+        }
+        if (link.owner.empty() || link.path.empty())
+            throw LineError{"link needs owner= and path="};
+        known_.CheckOwner(link.owner);
     }
 
     void Basic() {
