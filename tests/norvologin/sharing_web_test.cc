@@ -115,8 +115,72 @@ TEST_F(SharingWeb, FailuresBlockAndHostileRequestsForgeNothing) {
     ASSERT_EQ(symlink("/tmp/bob.txt", kFile.c_str()), 0);
     EXPECT_EQ(web.Get("api=login&FOLDER_SHARING=L1").body, kDenied);
     EXPECT_EQ(Read("/tmp/bob.txt"), "bob's\n");
-    EXPECT_EQ(app_.ErrorLines(), (std::vector<std::string>{"norvologin:# QUIBAutoBlockIsDeniedIP",
-                                                            "norvologin:# Failed to get client ip."}));
+    std::vector<std::string> lines;
+    for (int guess = 0; guess < 4; ++guess) {  // each guessed id, looked up in the link database
+        lines.insert(lines.end(), {"norvologin:# faild to fetch query result", "norvologin:# Sharing download DBquery failed"});
+    }
+    lines.insert(lines.end(), {"norvologin:# QUIBAutoBlockIsDeniedIP", "norvologin:# Failed to get client ip."});
+    EXPECT_EQ(app_.ErrorLines(), lines);
+}
+
+// The landing page in a real browser (one launch, every host but 127.0.0.1 unresolvable): a page
+// of the server's own loads each link's landing page in a frame of the same origin and reports
+// what the document and its scripts hold.
+TEST_F(SharingWeb, TheLandingPageInABrowser) {
+    if (access("/usr/bin/chromium", X_OK) != 0) {
+        GTEST_SKIP() << "chromium is not installed (scripts/deps.sh installs it)";
+    }
+    app_.AddSharingLink({.id = "Q", .owner = "alice", .path = "/public/it's a \\ and a \""});
+    app_.AddSharingLink({.id = "X", .owner = "alice", .path = "/public/x</script><script>alert(1)</script>"});
+    WebFront web(NORVO_CGI);
+    std::ofstream(web.DocumentRoot() + "/check.html") << R"(<!DOCTYPE html><html><body><pre id="out"></pre><script>
+const pages = {plain: 'L1', quoted: 'Q', script: 'X', tunnel: 'L1&tunnel=//evil.example&md5=%27%3Balert(1)%2F%2F'};
+const results = {};
+let pending = Object.keys(pages).length;
+for (const [name, link] of Object.entries(pages)) {
+  const frame = document.createElement('iframe');
+  frame.src = '/cgi-bin/norvo.cgi?api=page&FOLDER_SHARING=' + link;
+  frame.onload = () => {
+    const w = frame.contentWindow, d = frame.contentDocument;
+    const urls = [...d.querySelectorAll('[src],[href]')].map(e => e.src || e.href);
+    results[name] = {title: d.title, path: w.g_FolderPath, tunnel: w.g_Tunnel, md5: w.g_MD5,
+                     elements: d.querySelectorAll('*').length, scripts: d.scripts.length,
+                     inline: [...d.scripts].filter(s => !s.src).map(s => s.text.split(' = ')[0]).join(','),
+                     foreign: urls.filter(u => !u.startsWith(location.origin + '/')).length};
+    if (--pending === 0) document.getElementById('out').textContent = JSON.stringify(Object.keys(pages).map(n => results[n]));
+  };
+  document.body.appendChild(frame);
+}
+</script></body></html>)";
+    const std::string netLog = "/tmp/chromium-net.json";
+    const std::string command =
+        "/usr/bin/chromium --headless --no-sandbox --disable-gpu --disable-dev-shm-usage --no-first-run "
+        "--disable-background-networking --disable-component-update --disable-sync --disable-extensions "
+        "--user-data-dir=/tmp/chromium-profile --host-resolver-rules='MAP * ~NOTFOUND, EXCLUDE 127.0.0.1' "
+        "--log-net-log=" + netLog + " --virtual-time-budget=10000 --dump-dom "
+        "http://127.0.0.1:" + std::to_string(web.port()) + "/check.html 2>/dev/null";
+    std::string dom;
+    FILE *browser = popen(command.c_str(), "r");
+    ASSERT_NE(browser, nullptr);
+    char buf[4096];
+    for (size_t got; (got = fread(buf, 1, sizeof buf, browser)) > 0;) {
+        dom.append(buf, got);
+    }
+    EXPECT_EQ(pclose(browser), 0);
+    // The text of <pre id="out">, as the DOM dump writes it (<, > and & escaped).
+    const size_t from = dom.find("<pre id=\"out\">"), to = dom.find("</pre>");
+    ASSERT_TRUE(from != std::string::npos && to != std::string::npos) << dom;
+    const std::string same = R"("tunnel":"","md5":"","elements":27,"scripts":14,)"
+                             R"("inline":"var g_Lang,var g_Tunnel,var g_Version,var g_MD5,var g_FolderPath","foreign":0})";
+    EXPECT_EQ(dom.substr(from + 14, to - from - 14),
+              R"([{"title":"dir","path":"/public/dir",)" + same +
+              R"(,{"title":"it's a \\ and a \"","path":"/public/it's a \\ and a \"",)" + same +
+              R"(,{"title":"script&gt;","path":"/public/x&lt;/script&gt;&lt;script&gt;alert(1)&lt;/script&gt;",)" + same +
+              R"(,{"title":"dir","path":"/public/dir",)" + same + "]");
+    const std::string log = Read(netLog);
+    EXPECT_NE(log.find("check.html"), std::string::npos);  // the log is the browser's
+    EXPECT_NE(log.find("tunnel=//evil.example"), std::string::npos);  // asked for, in the frame's address
+    EXPECT_EQ(log.find("://evil.example"), std::string::npos);        // never loaded from
 }
 
 }  // namespace

@@ -13,6 +13,8 @@ server.modules = ("mod_access", "mod_alias", "mod_setenv", "mod_cgi")
 server.bind = "127.0.0.1"
 server.port = $port
 server.document-root = "$dir/htdocs"
+# Pages put beside the program (a test's own) are HTML, not downloads.
+mimetype.assign = (".html" => "text/html; charset=utf-8")
 server.errorlog = "$dir/error.log"
 server.pid-file = "$dir/lighttpd.pid"
 server.upload-dirs = ("$dir")

@@ -35,6 +35,8 @@ public:
     Reply PostBody(const std::string &query, const std::string &body,
                    const std::vector<std::string> &headers) const;
     int port() const { return port_; }
+    // The server's document root, empty at first: pages a test serves beside the program.
+    std::string DocumentRoot() const { return dir_ + "/htdocs"; }
 
 private:
     Reply Ask(std::vector<std::string> argv, const std::string &query) const;
