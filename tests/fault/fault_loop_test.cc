@@ -31,6 +31,7 @@
 #include "faults.h"
 #include "fileidx.h"
 #include "norvo/norvo.h"
+#include "norvo/norvosharing.h"
 #include "obx_task.h"
 #include "quib_autoblock.h"
 #include "quib_cgi.h"
@@ -219,6 +220,10 @@ long long TaskHits() {
 }
 
 const std::string kSessions = "/tmp/foldersharing.current.users";
+const std::string kSharing = "/usr/quib/etc/quibsharing.conf";
+std::string Shares(const char *user) {
+    return std::to_string(g_app->Uid(user)) + "=\"true\"\n";
+}
 
 void OpenSink() {
     if (g_null < 0) {
@@ -716,6 +721,50 @@ const Op kOps[] = {
              FreshTask(true);
          }
      }},
+    {"SharingSetPrivileges",
+     [] {
+         const bool ok = NorvoSharing::SharingManager().setPrivileges({{"alice", "true"}, {"bob", "no"}});
+         return Expect(ok, Read(kSharing) == Shares("alice"));
+     },
+     kNoSlot, [] { Write(kSharing, Shares("bob")); },
+     [] {
+         // Each key is written whole: alice's added (or not), then bob's removed (or not).
+         const std::string text = Read(kSharing);
+         const bool whole = text == Shares("bob") || text == Shares("bob") + Shares("alice") ||
+                            text == Shares("alice") || text.empty();
+         return (whole ? "" : "torn text: " + text) + Leftovers(kSharing);
+     }},
+    {"SharingGetPrivileges",
+     [] {
+         const auto flags = NorvoSharing::SharingManager().getPrivileges();
+         return Expect(!flags.empty(), flags == std::map<unsigned, bool>{{7, true}, {9, false}});
+     },
+     kNoSlot, [] { Write(kSharing, "7=\"true\"\n9=\"no\"\n"); }},
+    {"SharingFolderPath",
+     [] {
+         setenv("HTTP_FOLDER_SHARING", "L", 1);
+         QUIB::WebCGI cgi;
+         const std::string folder = NorvoLogin::FolderSharingLoginManager().GetSharingFolderPath(cgi);
+         unsetenv("HTTP_FOLDER_SHARING");
+         return Expect(!folder.empty(), folder == "/public");
+     },
+     kNoSlot, [] { g_app->AddSharingLink({.id = "L", .owner = "bob", .path = "/public"}); }},
+    {"SharingLandingPage",
+     [] {
+         OpenSink();
+         fflush(stdout);
+         const int saved = dup(1);
+         dup2(g_null, 1);
+         {
+             QUIB::WebCGI cgi;
+             NorvoLogin::FolderSharingLoginManager().WriteWebPage(cgi, "00", "/public");
+         }
+         fflush(stdout);
+         dup2(saved, 1);
+         close(saved);
+         return Expect(true, true);
+     },
+     kNoSlot, [] { g_app->WriteFile("/usr/quib/quibman/webman/texts/en/filemanager/filetable", "a=\"b\"\n"); }},
 };
 
 // Runs op with call n failing with err for n = 1, 2, ... until a run gets through.
