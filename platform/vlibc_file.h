@@ -1,5 +1,5 @@
 // Settings files in the appliance's form: one key="value" line per key, '#' starts a comment.
-// Writers take an exclusive flock on the file and replace it by rename; readers need no lock.
+// Writers take an exclusive per-process lock and replace the file by rename; readers need no lock.
 // Reading is lenient: spaces around '=', bare values (to the end of the line, trailing spaces
 // dropped), 'single' quotes, CRLF, and \" and \\ escapes inside double quotes. When a key appears
 // twice, the first line is the one read. Writers keep every other line byte for byte.
