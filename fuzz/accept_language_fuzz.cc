@@ -60,7 +60,8 @@ std::string Reference(std::string header) {
         std::smatch m;
         const std::string piece = header.substr(start, comma - start);
         if (std::regex_match(piece, m, element)) {
-            const int q = m[4].matched ? static_cast<int>(strtod(m[4].str().c_str(), nullptr) * 1000 + 0.5) : 1000;
+            const int q =
+                m[4].matched ? static_cast<int>(strtod(m[4].str().c_str(), nullptr) * 1000 + 0.5) : 1000;
             if (q > 0) {
                 wanted.emplace_back(Lower(m[1].str()), q);
             }

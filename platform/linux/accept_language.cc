@@ -103,7 +103,8 @@ std::string Match(const std::string &range, const std::vector<std::string> &avai
         cut.erase(dash);
     }
     for (const std::string &tag : available) {
-        if (tag.size() > range.size() && tag.compare(0, range.size(), range) == 0 && tag[range.size()] == '-') {
+        if (tag.size() > range.size() && tag.compare(0, range.size(), range) == 0 &&
+            tag[range.size()] == '-') {
             return tag;
         }
     }
@@ -119,8 +120,8 @@ std::vector<std::string> InterfaceLanguages() {
     while (const struct dirent *entry = readdir(dir.get())) {
         std::string tag;
         // Only folders named as a lower-case tag count: a name is a language, never a path.
-        if (entry->d_type == DT_DIR && ParseRange(entry->d_name, &tag) && tag == entry->d_name && tag != "*" &&
-            tag != kDefaultLanguage) {
+        if (entry->d_type == DT_DIR && ParseRange(entry->d_name, &tag) && tag == entry->d_name &&
+            tag != "*" && tag != kDefaultLanguage) {
             found.push_back(tag);
         }
     }
@@ -154,7 +155,8 @@ std::string SelectLanguage(std::string_view header, const std::vector<std::strin
             wanted.push_back(std::move(w));
         }
     }
-    std::stable_sort(wanted.begin(), wanted.end(), [](const Wanted &a, const Wanted &b) { return a.q > b.q; });
+    std::stable_sort(wanted.begin(), wanted.end(),
+                     [](const Wanted &a, const Wanted &b) { return a.q > b.q; });
     for (const Wanted &w : wanted) {
         if (w.range == "*") {
             return fallback;

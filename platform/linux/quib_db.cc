@@ -52,7 +52,8 @@ int WalkWithoutLinks(const char *path, struct stat *file) {
             return EINVAL;
         }
         const bool last = slash == std::string::npos;
-        FileDescriptor next(openat(dir.Get(), name.c_str(), O_PATH | O_NOFOLLOW | O_CLOEXEC | (last ? 0 : O_DIRECTORY)));
+        FileDescriptor next(
+            openat(dir.Get(), name.c_str(), O_PATH | O_NOFOLLOW | O_CLOEXEC | (last ? 0 : O_DIRECTORY)));
         if (!next.IsOpen()) {
             return errno == ENOTDIR ? ELOOP : errno;  // a link to a folder is refused as a link
         }
@@ -68,7 +69,7 @@ int WalkWithoutLinks(const char *path, struct stat *file) {
 }
 
 void SetWalkError(int err) {
-    QUIB_SET_ERR(err == ENOENT ? QUIB_ERR_NO_SUCH_FILE
+    QUIB_SET_ERR(err == ENOENT                   ? QUIB_ERR_NO_SUCH_FILE
                  : err == ELOOP || err == EINVAL ? QUIB_ERR_ACCESS_DENIED
                                                  : VLIBCErrFromErrno(err));
 }

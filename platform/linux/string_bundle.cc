@@ -22,8 +22,8 @@ const char *ModuleFolder(int module) {
 // A section or language is one plain name: never a way out of the texts folder.
 bool IsPlainName(const char *name) {
     return name != nullptr && name[0] != '\0' && strcmp(name, ".") != 0 && strcmp(name, "..") != 0 &&
-           strlen(name) <= 64 && strspn(name, "abcdefghijklmnopqrstuvwxyzABCDEFGHIJKLMNOPQRSTUVWXYZ0123456789_.-") ==
-                                     strlen(name);
+           strlen(name) <= 64 &&
+           strspn(name, "abcdefghijklmnopqrstuvwxyzABCDEFGHIJKLMNOPQRSTUVWXYZ0123456789_.-") == strlen(name);
 }
 
 }  // namespace
@@ -54,7 +54,8 @@ StringBundle::StringBundle(int module, const char *section, const char *lang, co
         const std::string base = root != nullptr ? root : kTextsRoot;
         for (const char *language : {lang, fallbackLang}) {
             std::string text;
-            if (np::ReadWholeFile((base + "/" + language + "/" + folder + "/" + section).c_str(), &text) != 0) {
+            if (np::ReadWholeFile((base + "/" + language + "/" + folder + "/" + section).c_str(), &text) !=
+                0) {
                 continue;
             }
             for (const np::SettingsLine &line : np::ParseSettings(text)) {

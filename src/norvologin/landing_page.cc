@@ -23,12 +23,23 @@ std::string HtmlEscaped(const char *text) {
     std::string out;
     for (const char *p = text; *p != '\0'; ++p) {
         switch (*p) {
-            case '&': out += "&amp;"; break;
-            case '<': out += "&lt;"; break;
-            case '>': out += "&gt;"; break;
-            case '"': out += "&quot;"; break;
-            case '\'': out += "&#39;"; break;
-            default: out += *p;
+            case '&':
+                out += "&amp;";
+                break;
+            case '<':
+                out += "&lt;";
+                break;
+            case '>':
+                out += "&gt;";
+                break;
+            case '"':
+                out += "&quot;";
+                break;
+            case '\'':
+                out += "&#39;";
+                break;
+            default:
+                out += *p;
         }
     }
     return out;
@@ -78,8 +89,9 @@ std::string SameSitePath(const char *tunnel) {
 
 std::string TitleOf(const std::string &folderPath) {
     const size_t slash = folderPath.rfind('/');
-    const std::string &shown =
-        slash != std::string::npos && slash + 1 < folderPath.size() ? folderPath.substr(slash + 1) : folderPath;
+    const std::string &shown = slash != std::string::npos && slash + 1 < folderPath.size()
+                                   ? folderPath.substr(slash + 1)
+                                   : folderPath;
     char title[255];
     snprintf(title, sizeof title, "%s", shown.c_str());
     return HtmlEscaped(title);
@@ -130,22 +142,32 @@ void FolderSharingLoginManager::WriteWebPage(QUIB::WebCGI &cgi, const std::strin
     printf("    \t<script type='text/javascript'>var g_FolderPath = '%s';</script>\n", path.c_str());
     puts("    </head>");
     puts("<meta http-equiv='Content-Type' content='text/html; charset=utf-8'>");
-    printf("<link rel='stylesheet' type='text/css' href='%s/scripts/ext-3/resources/css/ext-all.css?v=%s%s' />\n", T,
+    printf(
+        "<link rel='stylesheet' type='text/css' href='%s/scripts/ext-3/resources/css/ext-all.css?v=%s%s' />\n",
+        T, V, S);
+    printf(
+        "<link rel='stylesheet' type='text/css' href='%s/scripts/ext-3/resources/css/xtheme-gray-quib.css?v=%s%s' />\n",
+        T, V, S);
+    printf("<link rel='stylesheet' type='text/css' href='%s/webman/resources/css/desktop.css?v=%s%s' />\n", T,
            V, S);
-    printf("<link rel='stylesheet' type='text/css' href='%s/scripts/ext-3/resources/css/xtheme-gray-quib.css?v=%s%s' />\n",
+    printf(
+        "<link rel='stylesheet' type='text/css' href='%s/webman/resources/css/flexcrollstyles.css?v=%s%s' />\n",
+        T, V, S);
+    printf(
+        "<link rel='stylesheet' type='text/css' href='%s/webman/modules/FileBrowser/style.css?v=%s%s' />\n",
+        T, V, S);
+    printf(
+        "<link rel='stylesheet' type='text/css' href='%s/webman/modules/FileBrowser/norvo/folderSharing/style.css?v=%s%s' />\n",
+        T, V, S);
+    printf("<script type='text/javascript' src='%s/scripts/ext-3/adapter/ext/ext-base.js?%s%s'></script>\n",
            T, V, S);
-    printf("<link rel='stylesheet' type='text/css' href='%s/webman/resources/css/desktop.css?v=%s%s' />\n", T, V, S);
-    printf("<link rel='stylesheet' type='text/css' href='%s/webman/resources/css/flexcrollstyles.css?v=%s%s' />\n", T,
-           V, S);
-    printf("<link rel='stylesheet' type='text/css' href='%s/webman/modules/FileBrowser/style.css?v=%s%s' />\n", T, V,
-           S);
-    printf("<link rel='stylesheet' type='text/css' href='%s/webman/modules/FileBrowser/norvo/folderSharing/style.css?v=%s%s' />\n", T, V, S);
-    printf("<script type='text/javascript' src='%s/scripts/ext-3/adapter/ext/ext-base.js?%s%s'></script>\n", T, V, S);
     printf("<script type='text/javascript' src='%s/scripts/ext-3/ext-all.js?%s%s'></script>\n", T, V, S);
     printf("<script type='text/javascript' src='%s/scripts/ext-3/ux/ux-all.js?%s%s'></script>\n", T, V, S);
-    printf("<script type='text/javascript' src='%s/scripts/scrollbar/flexcroll.js?v=%s%s'></script>\n", T, V, S);
-    printf("<script type='text/javascript' src='%s/webman/modules/FileBrowser/FolderSharingLoader.js?%s%s'></script>\n",
-           T, V, S);
+    printf("<script type='text/javascript' src='%s/scripts/scrollbar/flexcroll.js?v=%s%s'></script>\n", T, V,
+           S);
+    printf(
+        "<script type='text/javascript' src='%s/webman/modules/FileBrowser/FolderSharingLoader.js?%s%s'></script>\n",
+        T, V, S);
     puts("<body>");
     puts("</body></html>");
     fflush(stdout);

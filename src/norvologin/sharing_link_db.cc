@@ -45,7 +45,8 @@ bool InPeriod(long long availDate, long long expDate, long long now) {
 // The link's folder, or false after logging why not (summary: whether the query itself failed).
 bool LookUp(const char *id, std::string *folder, bool *queryFailed) {
     *queryFailed = true;
-    std::unique_ptr<char, SqlFree> sql(sqlite3_mprintf("SELECT * FROM sharingLinks WHERE linkID = %Q LIMIT 1;", id));
+    std::unique_ptr<char, SqlFree> sql(
+        sqlite3_mprintf("SELECT * FROM sharingLinks WHERE linkID = %Q LIMIT 1;", id));
     if (!sql) {
         return false;
     }

@@ -149,8 +149,8 @@ std::map<unsigned int, bool> SharingManager::getPrivileges() try {
     const int count = VLIBCFileGetKeys(kSharingFile.c_str(), 0, hash.get(), "=");
     if (count <= 0) {
         if (count < 0 && static_cast<unsigned int>(VLIBCErrGet()) != kNotFound) {
-            NVO_LOG(kModule, "%s:%d VLIBCFileGetKeys() failed!! szFile=[%s], quiberr=[0x%04X]", kSharingFile.c_str(),
-                    VLIBCErrGet());
+            NVO_LOG(kModule, "%s:%d VLIBCFileGetKeys() failed!! szFile=[%s], quiberr=[0x%04X]",
+                    kSharingFile.c_str(), VLIBCErrGet());
         }
         return privileges;
     }

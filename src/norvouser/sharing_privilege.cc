@@ -32,8 +32,8 @@ int NvoLibUserPrivForSharing(const char *user, int flag) try {
     }
     const int admin = QUIBGroupIsAdminGroupMemEx(user, flag ? 1 : 0);
     if (admin < 0) {
-        NVO_LOG(kNorvoUser, "%s:%d QUIBGroupIsAdminGroupMemEx(%s) failed. [0x%04X %s:%d]", user, VLIBCErrGet(),
-                VLIBCErrorGetFile(), VLIBCErrorGetLine());
+        NVO_LOG(kNorvoUser, "%s:%d QUIBGroupIsAdminGroupMemEx(%s) failed. [0x%04X %s:%d]", user,
+                VLIBCErrGet(), VLIBCErrorGetFile(), VLIBCErrorGetLine());
         return 0;
     }
     char setting[64] = {};

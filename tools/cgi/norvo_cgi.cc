@@ -68,7 +68,8 @@ std::string LinkOwner(const char *id) {
     }
     std::unique_ptr<QUIBDB_RESULT, void (*)(PQUIBDB_RESULT)> result(raw, QUIBDBFreeResult);
     QUIBDB_ROW row = 0;
-    const char *uid = QUIBDBFetchRow(result.get(), &row) == 0 ? QUIBDBFetchField(result.get(), row, "uid") : nullptr;
+    const char *uid =
+        QUIBDBFetchRow(result.get(), &row) == 0 ? QUIBDBFetchField(result.get(), row, "uid") : nullptr;
     if (uid == nullptr || uid[0] == '\0' || strspn(uid, "0123456789") != strlen(uid) || strlen(uid) > 9) {
         return "";
     }

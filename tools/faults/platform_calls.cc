@@ -205,7 +205,8 @@ SEAM_OPENER(PSZLIST, QuibCgiLDAPValidShareGen,
 SEAM_OPENER(QUIBDirPass *, QUIBDirPassBegin, (const char *dirPath), (dirPath))
 SEAM_OPENER(QuibCgi *, QuibCgiAlloc, (const char *recordFile, const char *lockName), (recordFile, lockName))
 SEAM_OPENER(PSZHASH, VLIBCSzHashAlloc, (int size), (size))
-SEAM_OPENER(PQUIBDB, QUIBDBConnect, (const char *host, const char *user, const char *password, const char *path),
+SEAM_OPENER(PQUIBDB, QUIBDBConnect,
+            (const char *host, const char *user, const char *password, const char *path),
             (host, user, password, path))
 
 // Calls that release one.
@@ -270,7 +271,8 @@ int QUIBDBExecute(PQUIBDB db, const char *sql, PQUIBDB_RESULT *result) {
 }
 
 int VLIBCFileGetKeys(const char *file, PSZLIST *keys, PSZLIST *values) {
-    static const auto real = reinterpret_cast<int (*)(const char *, PSZLIST *, PSZLIST *)>(seam::Next("VLIBCFileGetKeys"));
+    static const auto real =
+        reinterpret_cast<int (*)(const char *, PSZLIST *, PSZLIST *)>(seam::Next("VLIBCFileGetKeys"));
     if (ShouldFailPlatform("VLIBCFileGetKeys")) {
         return -1;
     }

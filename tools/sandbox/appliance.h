@@ -45,8 +45,8 @@ struct ShareSpec {
 // A row of the sharing link database /usr/quib/etc/filebrowser/fbsharing.db.
 struct SharingLinkSpec {
     std::string id;
-    std::string owner;           // an appliance user; the row holds its uid
-    std::string path;            // the shared folder, a user path ("/photo/2024")
+    std::string owner;            // an appliance user; the row holds its uid
+    std::string path;             // the shared folder, a user path ("/photo/2024")
     std::string availDate = "0";  // seconds since 1970, as text (any text: tests give bad ones)
     std::string expDate = "0";    // "0": never expires
 };
