@@ -751,7 +751,6 @@ const Op kOps[] = {
      kNoSlot, [] { g_app->AddSharingLink({.id = "L", .owner = "bob", .path = "/public"}); }},
     {"SharingLandingPage",
      [] {
-         OpenSink();
          fflush(stdout);
          const int saved = dup(1);
          dup2(g_null, 1);
@@ -764,7 +763,7 @@ const Op kOps[] = {
          close(saved);
          return Expect(true, true);
      },
-     kNoSlot, [] { g_app->WriteFile("/usr/quib/quibman/webman/texts/en/filemanager/filetable", "a=\"b\"\n"); }},
+     kNoSlot, [] { OpenSink(), g_app->WriteFile("/usr/quib/quibman/webman/texts/en/filemanager/filetable", "a=\"b\"\n"); }},
 };
 
 // Runs op with call n failing with err for n = 1, 2, ... until a run gets through.
