@@ -244,6 +244,26 @@ std::string SessionLines() {
 std::string g_sessions;  // as the run found them
 const char kRefreshed[] = "192\\.0\\.2\\.1,alice,ID,1,[0-9]+,2,0,L\n";
 
+// A search of alice's for "a.txt" below public, initialised only or also run: whether it
+// went through, and how many hits it stored.
+bool SearchAlice(bool walk, unsigned long long *hits) {
+    std::vector<FileSearch::FindComp *> conds;
+    bool ok = FileSearch::FindFactory::createFindOp(FileSearch::FindFactory::FIND_FIELD_NAME, nullptr, "a.txt", conds);
+    {
+        FileSearch::NvoSearchWalker walker("alice", "sid", nullptr);
+        ok = ok && walker.init({"/public"}, conds) && (!walk || walker.Walk({}));
+        const FI_QUERY all{};
+        *hits = 0;
+        if (ok && FILEIDXCountGet(walker.getDBPath().c_str(), &all, hits) != 0) {
+            *hits = ~0ULL;
+        }
+    }
+    for (FileSearch::FindComp *cond : conds) {
+        delete cond;
+    }
+    return ok;
+}
+
 const Op kOps[] = {
     {"DirListing",
      [] {
@@ -716,6 +736,20 @@ const Op kOps[] = {
              FreshTask(true);
          }
      }},
+    {"SearchInit",  // a task and its empty database, the folders mapped
+     [] {
+         unsigned long long hits = 0;
+         const bool ok = SearchAlice(false, &hits);
+         return Expect(ok, hits == 0);
+     },
+     kEitherSlot},
+    {"SearchWalk",
+     [] {
+         unsigned long long hits = 0;
+         const bool ok = SearchAlice(true, &hits);
+         return Expect(ok, hits == 1);
+     },
+     kEitherSlot},
 };
 
 // Runs op with call n failing with err for n = 1, 2, ... until a run gets through.
