@@ -70,6 +70,7 @@ private:
     };
     std::string dbPath;
     std::unique_ptr<FI_OUTPUT_DB, OutputClose> output;
+    std::unique_ptr<FI_FILE_INFO_DATA> record;  // one hit's record, filled anew for each
     bool failed = false;
     // Owner and group names by id, looked up once per search.
     std::map<unsigned int, std::string> userNames;

@@ -40,7 +40,8 @@ const std::string &NameOf(std::map<unsigned int, std::string> &cache, unsigned i
 
 }  // namespace
 
-NvoSearchCallBack::NvoSearchCallBack(const char *path) : dbPath(path == nullptr ? "" : path) {}
+NvoSearchCallBack::NvoSearchCallBack(const char *path)
+    : dbPath(path == nullptr ? "" : path), record(new FI_FILE_INFO_DATA()) {}
 
 NvoSearchCallBack::~NvoSearchCallBack() = default;
 
@@ -62,7 +63,7 @@ bool NvoSearchCallBack::operator()(const std::string &, const std::string &, con
             }
             output.reset(db);
         }
-        auto record = std::make_unique<FI_FILE_INFO_DATA>();
+        // Every field is written below: no need to clear 14 KiB for each hit.
         norvo::search::FillHit(extra != nullptr ? *extra : norvo::search::KeyShare(root.substr(root.rfind('/') + 1)),
                                root, rest, st, record.get());
         snprintf(record->userName, sizeof record->userName, "%s",
