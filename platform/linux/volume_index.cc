@@ -21,6 +21,7 @@
 #include <unicode/utf8.h>
 
 #include <algorithm>
+#include <chrono>
 #include <map>
 #include <memory>
 #include <set>
@@ -968,6 +969,12 @@ public:
             int64_t childId;
             if (found != known_[id].children.end()) {
                 childId = found->second;
+                struct stat cs;
+                const Known &c = known_.at(childId);
+                if (shallow && fstat(child.Get(), &cs) == 0 && c.dev == static_cast<int64_t>(cs.st_dev) &&
+                    c.ino == static_cast<int64_t>(cs.st_ino)) {
+                    continue;  // the same folder: its own reports say when it changes
+                }
             } else {
                 childId = nextId_++;
                 known_[id].children[dir] = childId;
@@ -1027,6 +1034,7 @@ public:
     std::function<void(int64_t, int)> onFolder;
     std::function<void(int64_t)> onDrop;
     unsigned long long foldersRead = 0;
+    bool shallow = false;  // Read leaves known sub-folders that are still the same alone
 
 private:
     int PutFolder(int64_t id, const Known &k, const std::string &names) {
@@ -1397,10 +1405,210 @@ int VolumeIndexStatus(const char *volume, FI_INDEX_STATUS *status) {
     return QUIB_ERR_NONE;
 }
 
+namespace {
+
+// The kernel's change reports, applied as whole re-reads of the folders they name.
+class Watcher {
+public:
+    Watcher(Upkeep &u, const volatile int *stop) : u_(u), stop_(stop) {}
+
+    int Run() {
+        inotify_.Reset(inotify_init1(IN_NONBLOCK | IN_CLOEXEC));
+        if (!inotify_.IsOpen()) {
+            return VLIBCErrFromErrno(errno);
+        }
+        if (const int code = Open()) {
+            return code;
+        }
+        int code = UpdateLocked(u_, db_.get(), writer_.get());  // what changed before the watches
+        flock(u_.lock.Get(), LOCK_UN);
+        using Clock = std::chrono::steady_clock;
+        Clock::time_point firstDirty{}, lastEvent{}, lastFull = Clock::now();
+        while (code == QUIB_ERR_NONE && *stop_ == 0) {
+            struct pollfd p = {inotify_.Get(), POLLIN, 0};
+            const int ready = poll(&p, 1, 100);
+            if (ready < 0 && errno != EINTR) {
+                return VLIBCErrFromErrno(errno);
+            }
+            const Clock::time_point now = Clock::now();
+            if (ready > 0 && ReadEvents()) {
+                lastEvent = now;
+                if (firstDirty == Clock::time_point{}) {
+                    firstDirty = now;
+                }
+            }
+            if (limited_ && now - lastFull >= std::chrono::seconds(1)) {
+                full_ = true;  // no watch for some folders: look at every folder each second
+            }
+            const bool settled = now - lastEvent >= std::chrono::milliseconds(50) ||
+                                 now - firstDirty >= std::chrono::milliseconds(300);
+            if (full_ || (!dirty_.empty() && settled)) {
+                if (full_) {
+                    lastFull = now;
+                }
+                code = Apply();
+                firstDirty = Clock::time_point{};
+            }
+        }
+        return code;
+    }
+
+private:
+    int Open() {
+        writer_.reset();
+        db_.reset();
+        int code = OpenForUpkeep(u_, &db_);
+        if (code != QUIB_ERR_NONE) {
+            db_.reset();
+            if ((code = BuildLocked(u_)) != QUIB_ERR_NONE || (code = OpenForUpkeep(u_, &db_)) != QUIB_ERR_NONE) {
+                return code;
+            }
+        }
+        struct stat st;
+        if (fstatat(u_.dir.Get(), kIndexName, &st, AT_SYMLINK_NOFOLLOW) != 0) {
+            return VLIBCErrFromErrno(errno);
+        }
+        ino_ = st.st_ino;
+        writer_ = std::make_unique<Writer>(db_.get());
+        writer_->onFolder = [this](int64_t id, int fd) { AddWatch(id, fd); };
+        writer_->onDrop = [this](int64_t id) { dirty_.erase(id); };
+        wds_.clear();
+        if ((code = writer_->Prepare()) != QUIB_ERR_NONE) {
+            return code;
+        }
+        return writer_->Load();
+    }
+
+    void AddWatch(int64_t id, int fd) {
+        if (limited_) {
+            return;
+        }
+        const std::string path = "/proc/self/fd/" + std::to_string(fd);
+        const int wd = inotify_add_watch(inotify_.Get(), path.c_str(),
+                                         IN_CREATE | IN_DELETE | IN_MOVED_FROM | IN_MOVED_TO | IN_ONLYDIR |
+                                             IN_EXCL_UNLINK);
+        if (wd >= 0) {
+            wds_[wd] = id;
+        } else if (errno == ENOSPC) {
+            limited_ = true;
+        }
+    }
+
+    // true when something is to be done.
+    bool ReadEvents() {
+        alignas(struct inotify_event) char buffer[16384];
+        bool any = false;
+        for (;;) {
+            const ssize_t n = read(inotify_.Get(), buffer, sizeof buffer);
+            if (n <= 0) {
+                return any;
+            }
+            for (ssize_t at = 0; at < n;) {
+                const auto *e = reinterpret_cast<const struct inotify_event *>(buffer + at);
+                at += static_cast<ssize_t>(sizeof *e + e->len);
+                if ((e->mask & IN_Q_OVERFLOW) != 0) {
+                    full_ = any = true;
+                } else if ((e->mask & IN_IGNORED) != 0) {
+                    wds_.erase(e->wd);
+                } else if (const auto it = wds_.find(e->wd); it != wds_.end()) {
+                    dirty_.insert(it->second);
+                    any = true;
+                }
+            }
+        }
+    }
+
+    // The folder open for reading, reached from the volume by the names the index holds.
+    int OpenFolder(int64_t id, FileDescriptor *fd, int *depth) {
+        std::vector<std::string> names;
+        for (int64_t at = id; at != kRootId; at = writer_->KnownOf(at).parent) {
+            if (!writer_->IsKnown(at)) {
+                return ENOENT;
+            }
+            names.push_back(writer_->KnownOf(at).name);
+        }
+        *depth = static_cast<int>(names.size());
+        FileDescriptor dir(openat(u_.volume.Get(), ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+        for (auto it = names.rbegin(); it != names.rend() && dir.IsOpen(); ++it) {
+            dir.Reset(openat(dir.Get(), it->c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+        }
+        if (!dir.IsOpen()) {
+            return errno;
+        }
+        *fd = std::move(dir);
+        return 0;
+    }
+
+    int Apply() {
+        if (flock(u_.lock.Get(), LOCK_EX) != 0) {
+            return VLIBCErrFromErrno(errno);
+        }
+        const ScopeExit unlock([this] { flock(u_.lock.Get(), LOCK_UN); });
+        struct stat st;
+        if (fstatat(u_.dir.Get(), kIndexName, &st, AT_SYMLINK_NOFOLLOW) != 0 || st.st_ino != ino_) {
+            if (const int code = Open()) {  // built anew meanwhile
+                return code;
+            }
+            full_ = true;
+        }
+        if (full_) {
+            full_ = false;
+            dirty_.clear();
+            return UpdateLocked(u_, db_.get(), writer_.get());
+        }
+        int code = Exec(db_.get(), "BEGIN IMMEDIATE");
+        const std::set<int64_t> dirty = std::move(dirty_);
+        dirty_.clear();
+        for (const int64_t id : dirty) {
+            if (code != QUIB_ERR_NONE || !writer_->IsKnown(id)) {
+                continue;  // dropped with a folder above it
+            }
+            FileDescriptor fd;
+            int depth = 0;
+            if (OpenFolder(id, &fd, &depth) != 0) {
+                continue;  // gone: its parent's report drops it
+            }
+            struct stat folder;
+            if (fstat(fd.Get(), &folder) != 0) {
+                continue;
+            }
+            const Known &k = writer_->KnownOf(id);
+            writer_->shallow = true;
+            code = writer_->Read(id, k.parent, std::string(k.name), fd.Get(), folder, depth);
+            writer_->shallow = false;
+        }
+        if (code == QUIB_ERR_NONE) {
+            code = SetMeta(db_.get(), "updated", Now());
+        }
+        if (code == QUIB_ERR_NONE) {
+            code = Exec(db_.get(), "COMMIT");
+        }
+        if (code != QUIB_ERR_NONE) {
+            sqlite3_exec(db_.get(), "ROLLBACK", nullptr, nullptr, nullptr);
+        }
+        return code;
+    }
+
+    Upkeep &u_;
+    const volatile int *stop_;
+    FileDescriptor inotify_;
+    FileIdxDb db_;
+    std::unique_ptr<Writer> writer_;
+    ino_t ino_ = 0;
+    std::unordered_map<int, int64_t> wds_;
+    std::set<int64_t> dirty_;
+    bool full_ = false;
+    bool limited_ = false;
+};
+
+}  // namespace
+
 int WatchVolumeIndex(const char *volume, const volatile int *stop) {
-    (void)volume;
-    (void)stop;
-    return QUIB_ERR_FAILED;
+    Upkeep u;
+    if (const int code = BeginUpkeep(volume, &u)) {
+        return code;
+    }
+    return Watcher(u, stop).Run();
 }
 
 }  // namespace norvo::platform

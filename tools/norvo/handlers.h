@@ -20,5 +20,6 @@ int RunTasks(const Invocation &inv);       // cmd_tasks.cc
 int RunSearchDb(const Invocation &inv);    // cmd_search_db.cc
 int RunUpload(const Invocation &inv);      // cmd_upload.cc
 int RunXferlog(const Invocation &inv);     // cmd_upload.cc
+int RunIndex(const Invocation &inv);       // cmd_index.cc
 
 }  // namespace norvo::cli
