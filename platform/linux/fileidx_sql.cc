@@ -466,6 +466,19 @@ int OpenFileIdxDb(const char *path, DbOwner owner, FileIdxDb *db) {
     return Open(path, db);
 }
 
+int OpenMemoryFileIdxDb(FileIdxDb *db) {
+    sqlite3 *raw = nullptr;
+    const int rc = sqlite3_open_v2(":memory:", &raw, SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE, nullptr);
+    db->reset(raw);
+    if (rc != SQLITE_OK) {
+        return FileIdxCodeOf(raw, rc);
+    }
+    if (const int code = RegisterFunctions(raw)) {
+        return code;
+    }
+    return FileIdxCodeOf(raw, sqlite3_exec(raw, kSchema, nullptr, nullptr, nullptr));
+}
+
 int AppendWhere(const __tag_FI_SQL_COND *head, SqlText *sql) {
     if (head == nullptr) {
         sql->text += '1';

@@ -30,6 +30,8 @@ enum class DbOwner {
 [[nodiscard]] int CreateFileIdxDb(const char *path);
 // Opens an existing database read-write with our functions registered. 0 and *db, or a code.
 [[nodiscard]] int OpenFileIdxDb(const char *path, DbOwner owner, FileIdxDb *db);
+// An empty result database in memory, with our functions. 0 and *db, or a code.
+[[nodiscard]] int OpenMemoryFileIdxDb(FileIdxDb *db);
 
 // A statement's text with the values to bind, in order.
 struct SqlText {

@@ -278,6 +278,19 @@ std::vector<CommandDef> MakeCommands() {
           {"desc", nullptr, false, "with --sort, descending"}},
          {},
          RunSearchResults},
+        {"index",
+         "a volume's file index: build, update, status, watch (root)",
+         "Works on the file index of VOLUME (/volume1), which searches use instead of walking\n"
+         "when it is ready. ACTION is one of:\n"
+         "  build    walks the whole volume into a new index that replaces the old one when done\n"
+         "  update   reads again only the folders whose times moved, and new ones\n"
+         "  status   ready, damaged or none; entries, folders, size, when built and updated\n"
+         "  watch    an update, then every change as it happens (inotify), until Ctrl-C or\n"
+         "           SIGTERM; a file created is found within a second\n"
+         "Without watch, the index is as fresh as its last build or update.",
+         {},
+         {{"ACTION", "build, update, status or watch"}, {"VOLUME", "the volume: /volume1, ..."}},
+         RunIndex},
         {"upload",
          "an upload's last steps: check the target, move the file in, log it",
          "Does what the upload program does once the file has arrived: CheckFile for DEST (a\n"

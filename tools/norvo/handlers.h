@@ -22,5 +22,6 @@ int RunSearch(const Invocation &inv);      // cmd_search.cc
 int RunSearchResults(const Invocation &inv);  // cmd_search.cc
 int RunUpload(const Invocation &inv);      // cmd_upload.cc
 int RunXferlog(const Invocation &inv);     // cmd_upload.cc
+int RunIndex(const Invocation &inv);       // cmd_index.cc
 
 }  // namespace norvo::cli
