@@ -19,6 +19,7 @@
 
 #include "../norvodir/find_oracle.h"
 #include "appliance.h"
+#include "norvo/norvouser.h"
 #include "norvo/searchdb.h"
 #include "norvo/searchwalker.h"
 #include "vlibc_err.h"
@@ -93,11 +94,13 @@ Result SearchHere(const std::string &user, const std::vector<std::string> &folde
     return result;
 }
 
-// The same as user, in a child; the result travels through a file.
+// The same in a child, the result travelling through a file: as user through and through, or
+// (asRequest) as a request runs, the real user root and the effective one user's, so that the
+// platform may read a volume's index.
 Result Search(Appliance &app, const std::string &user, const std::vector<std::string> &folders,
-              const std::vector<Field> &fields, bool currentDirOnly = false) {
+              const std::vector<Field> &fields, bool currentDirOnly = false, bool asRequest = false) {
     const std::string file = "/tmp/hits." + user;
-    app.RunAs(user, [&] {
+    const auto run = [&] {
         const Result r = SearchHere(user, folders, fields, currentDirOnly);
         std::ofstream out(file, std::ios::binary | std::ios::trunc);
         out << r.ok << ' ' << r.error << '\0';
@@ -105,7 +108,15 @@ Result Search(Appliance &app, const std::string &user, const std::vector<std::st
             out << hit << '\0';
         }
         return 0;
-    });
+    };
+    if (!asRequest) {
+        app.RunAs(user, run);
+    } else if (const pid_t child = fork(); child == 0) {
+        _exit(NvoLibUGIDSet(nullptr, user.c_str()) == 0 ? run() : 1);
+    } else {
+        int status = 0;
+        waitpid(child, &status, 0);
+    }
     Result r{};
     const std::string text = norvo::testing::ReadFile(file);
     int ok = 0;
@@ -115,6 +126,30 @@ Result Search(Appliance &app, const std::string &user, const std::vector<std::st
         r.hits.insert(text.substr(at, end - at));
     }
     return r;
+}
+
+// Every kind of condition, with the find(1) test that says the same.
+struct Row {
+    std::vector<Field> fields;
+    std::string find;
+};
+std::vector<Row> Rows(const std::string &uid, const std::string &gid) {
+    return {
+        {{{FindFactory::FIND_FIELD_NAME, nullptr, "report"}}, "-iname '*report*'"},
+        {{{FindFactory::FIND_FIELD_NAME, nullptr, "x, \"a\", Ünï,b"}},
+         "\\( -iname '*a*' -o -iname '*Ünï*' -o -iname '*b*' \\)"},
+        {{{FindFactory::FIND_FIELD_EXT, nullptr, "txt,doc"}}, "-type f \\( -iname '*.txt' -o -iname '*.doc' \\)"},
+        {{{FindFactory::FIND_FIELD_TYPE, "dir", ""}}, "-type d"},
+        {{{FindFactory::FIND_FIELD_TYPE, "FILE", ""}, {FindFactory::FIND_FIELD_NAME, nullptr, "b"}},
+         "-type f -iname '*b*'"},
+        {{{FindFactory::FIND_FIELD_USER, nullptr, "alice"}}, "-uid " + uid},
+        {{{FindFactory::FIND_FIELD_GROUP, nullptr, "staff"}}, "-gid " + gid},
+        {{{FindFactory::FIND_FIELD_SIZE, "greater", "3"}}, "-type f -size +3c"},
+        {{{FindFactory::FIND_FIELD_SIZE, "less", "2"}}, "\\( -type d -o -size -2c \\)"},
+        {{{FindFactory::FIND_FIELD_MTIME, "before", "1050000000"}}, "! -newermt @1050000000"},
+        {{{FindFactory::FIND_FIELD_ATIME, "Before", "1200000000"}, {FindFactory::FIND_FIELD_NAME, nullptr, "b"}},
+         "! -newerat @1200000000 -iname '*b*'"},
+    };
 }
 
 class SearchWalker : public ::testing::Test {
@@ -176,26 +211,7 @@ TEST_F(SearchWalker, FindsWhatFindFindsForTheUser) {
     const std::vector<std::string> folders = {"/public", "/photo", "/video/2013", "/docs", "/public/#recycle",
                                               "/docs/@sharebin", "/photo/2013/b.txt"};
     const std::string uid = std::to_string(app.Uid("alice")), gid = std::to_string(app.Gid("staff"));
-    const struct {
-        std::vector<Field> fields;
-        std::string find;
-    } rows[] = {
-        {{{FindFactory::FIND_FIELD_NAME, nullptr, "report"}}, "-iname '*report*'"},
-        {{{FindFactory::FIND_FIELD_NAME, nullptr, "x, \"a\", Ünï,b"}},
-         "\\( -iname '*a*' -o -iname '*Ünï*' -o -iname '*b*' \\)"},
-        {{{FindFactory::FIND_FIELD_EXT, nullptr, "txt,doc"}}, "-type f \\( -iname '*.txt' -o -iname '*.doc' \\)"},
-        {{{FindFactory::FIND_FIELD_TYPE, "dir", ""}}, "-type d"},
-        {{{FindFactory::FIND_FIELD_TYPE, "FILE", ""}, {FindFactory::FIND_FIELD_NAME, nullptr, "b"}},
-         "-type f -iname '*b*'"},
-        {{{FindFactory::FIND_FIELD_USER, nullptr, "alice"}}, "-uid " + uid},
-        {{{FindFactory::FIND_FIELD_GROUP, nullptr, "staff"}}, "-gid " + gid},
-        {{{FindFactory::FIND_FIELD_SIZE, "greater", "3"}}, "-type f -size +3c"},
-        {{{FindFactory::FIND_FIELD_SIZE, "less", "2"}}, "\\( -type d -o -size -2c \\)"},
-        {{{FindFactory::FIND_FIELD_MTIME, "before", "1050000000"}}, "! -newermt @1050000000"},
-        {{{FindFactory::FIND_FIELD_ATIME, "Before", "1200000000"}, {FindFactory::FIND_FIELD_NAME, nullptr, "b"}},
-         "! -newerat @1200000000 -iname '*b*'"},
-    };
-    for (const auto &row : rows) {
+    for (const Row &row : Rows(uid, gid)) {
         for (const bool currentDirOnly : {false, true}) {
             for (const std::string user : {"alice", "bob"}) {
                 SCOPED_TRACE(row.find + " as " + user + (currentDirOnly ? ", current folder only" : ""));
@@ -215,7 +231,48 @@ TEST_F(SearchWalker, FindsWhatFindFindsForTheUser) {
               (std::set<std::string>{"norvomisc.cpp:# Failed to chdir /volume1/photo/2013/b.txt. [Not a directory]",
                                      "norvomisc.cpp:# No privilege in path /docs",
                                      "norvomisc.cpp:# No privilege in path /docs/@sharebin"}));
-    EXPECT_EQ(lines.size(), std::size(rows) * 2 * 4u);
+    EXPECT_EQ(lines.size(), Rows(uid, gid).size() * 2 * 4u);
+}
+
+// With each volume's index built, the same searches give exactly what walking gave, for every
+// kind of condition, at a share's top and below, with --current-dir-only, for "2013" folders
+// of two shares beside a third share's that was not chosen, for a user who may not list docs
+// and for an administrator; and they do come from the index: a file made after it was built
+// is found by walking only.
+TEST_F(SearchWalker, IndexFindsWhatTheWalkFinds) {
+    BuildTrees();
+    const std::vector<std::string> folders = {"/photo/2013", "/video/2013", "/docs", "/public/#recycle",
+                                              "/docs/@sharebin"};
+    const std::vector<Row> rows = Rows(std::to_string(app.Uid("alice")), std::to_string(app.Gid("staff")));
+    const auto searchAll = [&] {
+        std::vector<Result> results;
+        for (const Row &row : rows) {
+            for (const bool currentDirOnly : {false, true}) {
+                for (const std::string user : {"alice", "bob", "admin"}) {
+                    results.push_back(Search(app, user, folders, row.fields, currentDirOnly, true));
+                }
+            }
+        }
+        return results;
+    };
+    const std::vector<Result> walked = searchAll();
+    for (const char *volume : {"/volume1", "/volume2"}) {
+        ASSERT_EQ(FILEIDXIndexBuild(volume), 0);
+        ASSERT_EQ(FILEIDXIsIndexEnable(volume), 1);
+    }
+    app.WriteFile("/volume2/docs/report-late.txt", "", "alice");
+    const std::vector<Result> indexed = searchAll();
+    ASSERT_EQ(indexed.size(), walked.size());
+    for (size_t i = 0; i < walked.size(); ++i) {
+        const char *users[] = {"alice", "bob", "admin"};
+        SCOPED_TRACE(rows[i / 6].find + " as " + users[i % 3] + (i / 3 % 2 ? ", current folder only" : ""));
+        EXPECT_TRUE(walked[i].ok && indexed[i].ok);
+        EXPECT_EQ(indexed[i].hits, walked[i].hits);
+    }
+    EXPECT_EQ(walked[0].hits.count("photo/2013/report-photo.txt"), 1u);
+    EXPECT_EQ(walked[0].hits.count("public/2013/report-public.txt"), 0u);
+    EXPECT_EQ(Search(app, "alice", {"/docs"}, rows[0].fields, false, true).hits.count("docs/report-late.txt"), 0u);
+    EXPECT_EQ(Search(app, "alice", {"/docs"}, rows[0].fields).hits.count("docs/report-late.txt"), 1u) << "walked";
 }
 
 // A cancel mid-walk ends the search with success and keeps what was found; a chosen folder
