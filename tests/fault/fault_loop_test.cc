@@ -750,6 +750,17 @@ const Op kOps[] = {
          return Expect(ok, hits == 1);
      },
      kEitherSlot},
+    {"SearchWalkDB",  // through the volume's index
+     [] {
+         unsigned long long hits = 0;
+         const bool ok = SearchAlice(true, &hits);
+         return Expect(ok, hits == 1);
+     },
+     kEitherSlot, [] {
+         if (FILEIDXIsIndexEnable("/volume1") != 1) {
+             ASSERT_EQ(FILEIDXIndexBuild("/volume1"), 0);
+         }
+     }},
 };
 
 // Runs op with call n failing with err for n = 1, 2, ... until a run gets through.
