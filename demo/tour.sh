@@ -147,6 +147,10 @@ search_as() {
 }
 search_as alice "alice searches three shares on two volumes (walked: no volume index yet)"
 search_as carol "carol may list public only: photo is skipped, and alice's private folder in public too"
+show "root builds /volume1's index (/volume2 is read-only: it stays walked)" \
+    index build /volume1
+search_as alice "The same search again: /volume1 through its index, with the same hits"
+search_as carol "carol again: the index's rows are held to what she may list"
 # An upload's last steps: the file has arrived in a folder of alice's beside the shares.
 mkdir -p /volume1/@tmp/upload && chown "$(id -u alice)" /volume1/@tmp/upload
 printf 'sand and sea\n' > /volume1/@tmp/upload/part && chown "$(id -u alice)" /volume1/@tmp/upload/part
