@@ -21,7 +21,8 @@ int main(int argc, char **argv) {
         return 2;
     }
     std::vector<FileSearch::FindComp *> conds;
-    if (!FileSearch::FindFactory::createFindOp(FileSearch::FindFactory::FIND_FIELD_NAME, nullptr, argv[3], conds)) {
+    if (!FileSearch::FindFactory::createFindOp(FileSearch::FindFactory::FIND_FIELD_NAME, nullptr, argv[3],
+                                               conds)) {
         return 1;
     }
     unsigned long long hits = 0;

@@ -157,7 +157,8 @@ bool NvoSearchDBTask::delRecs(std::string share, std::string path) {
             return false;
         }
         __tag_FI_SQL_COND below{};
-        SetSqlCondText(below, FI_COND_PATH, FI_OP_PATH_LIKE, BelowPattern(key.rest).c_str(), &key.share, nullptr);
+        SetSqlCondText(below, FI_COND_PATH, FI_OP_PATH_LIKE, BelowPattern(key.rest).c_str(), &key.share,
+                       nullptr);
         if (FILEIDXDBDel(dbPath.c_str(), &key.path) < 0 || FILEIDXDBDel(dbPath.c_str(), &below) < 0) {
             NVO_LOG(kNorvoSearch, "%s:%d Fail to delete data in DB %s", dbPath.c_str());
             return false;
@@ -217,7 +218,8 @@ bool NvoSearchDBTask::updateFileInFolder(std::string share, std::string path, st
             return false;
         }
         __tag_FI_SQL_COND below{};
-        SetSqlCondText(below, FI_COND_PATH, FI_OP_PATH_LIKE, BelowPattern(key.rest).c_str(), &key.share, nullptr);
+        SetSqlCondText(below, FI_COND_PATH, FI_OP_PATH_LIKE, BelowPattern(key.rest).c_str(), &key.share,
+                       nullptr);
         FI_QUERY query{};
         query.where = &below;
         // Collected first: no update may run while the select is open.

@@ -35,12 +35,12 @@ namespace {
 
 struct FilterContext {
     DirPrivilegeMap privileges;
-    std::vector<FindComp *> recheck;      // the search's conditions and the access-time extras
-    bool logStat = false;                 // extras given: a row that can't be read is logged
+    std::vector<FindComp *> recheck;  // the search's conditions and the access-time extras
+    bool logStat = false;             // extras given: a row that can't be read is logged
     const std::vector<PathInfo> *folders = nullptr;
     bool currentDirOnly = false;
-    bool admin = false;                   // told, but an administrator sees what they may list too
-    std::map<std::string, bool> direct;   // folder: reached from its share without a link
+    bool admin = false;                  // told, but an administrator sees what they may list too
+    std::map<std::string, bool> direct;  // folder: reached from its share without a link
     std::map<std::string, std::string> shareReal;
 };
 
@@ -52,9 +52,9 @@ std::string Resolved(const std::string &path) {
 // The chosen folder dir lies in (or is, with currentDirOnly); null when none.
 const PathInfo *FolderOf(const FilterContext &ctx, const std::string &dir) {
     for (const PathInfo &folder : *ctx.folders) {
-        if (dir == folder.fullPath ||
-            (!ctx.currentDirOnly && dir.size() > folder.fullPath.size() &&
-             dir.compare(0, folder.fullPath.size(), folder.fullPath) == 0 && dir[folder.fullPath.size()] == '/')) {
+        if (dir == folder.fullPath || (!ctx.currentDirOnly && dir.size() > folder.fullPath.size() &&
+                                       dir.compare(0, folder.fullPath.size(), folder.fullPath) == 0 &&
+                                       dir[folder.fullPath.size()] == '/')) {
             return &folder;
         }
     }
@@ -71,7 +71,8 @@ bool Direct(FilterContext &ctx, const PathInfo &folder, const std::string &dir) 
     if (share == ctx.shareReal.end()) {
         share = ctx.shareReal.emplace(folder.sharePath, Resolved(folder.sharePath)).first;
     }
-    const bool direct = !share->second.empty() && dir.compare(0, folder.sharePath.size(), folder.sharePath) == 0 &&
+    const bool direct = !share->second.empty() &&
+                        dir.compare(0, folder.sharePath.size(), folder.sharePath) == 0 &&
                         Resolved(dir) == share->second + dir.substr(folder.sharePath.size());
     ctx.direct.emplace(dir, direct);
     return direct;
@@ -147,24 +148,24 @@ bool NvoSearchWalker::WalkDB(const std::string &volume, const std::vector<PathIn
         for (const PathInfo &info : folders) {
             std::string root, rest;
             switch (norvo::search::SplitRealPath(info.fullPath, &root, &rest)) {
-            case norvo::search::SplitResult::kNoShare:
-                NVO_LOG(kNorvoSearch, "%s:%d Can't find volume name %s", info.fullPath.c_str());
-                return false;
-            case norvo::search::SplitResult::kNoPath:
-                // The share's top: the path has nothing below the share.
-                if (info.fullPath.back() == '/') {
-                    NVO_LOG(kNorvoSearch, "%s:%d Fail to find the share name %s from %s", info.shareName.c_str(),
-                            info.fullPath.c_str());
+                case norvo::search::SplitResult::kNoShare:
+                    NVO_LOG(kNorvoSearch, "%s:%d Can't find volume name %s", info.fullPath.c_str());
                     return false;
-                }
-                rest.clear();
-                break;
-            case norvo::search::SplitResult::kOk:
-                break;
+                case norvo::search::SplitResult::kNoPath:
+                    // The share's top: the path has nothing below the share.
+                    if (info.fullPath.back() == '/') {
+                        NVO_LOG(kNorvoSearch, "%s:%d Fail to find the share name %s from %s",
+                                info.shareName.c_str(), info.fullPath.c_str());
+                        return false;
+                    }
+                    rest.clear();
+                    break;
+                case norvo::search::SplitResult::kOk:
+                    break;
             }
             folderConds.emplace_back();
-            setSqlCond(folderConds.back(), FI_COND_PATH, FI_OP_PATH_LIKE, norvo::search::BelowPattern(rest), nullptr,
-                       nullptr);
+            setSqlCond(folderConds.back(), FI_COND_PATH, FI_OP_PATH_LIKE, norvo::search::BelowPattern(rest),
+                       nullptr, nullptr);
         }
         // Below any chosen folder; which share, and how deep, the row filter decides: in a chain
         // an exclusion of one folder would also apply to the rows of every other.
@@ -186,8 +187,9 @@ bool NvoSearchWalker::WalkDB(const std::string &volume, const std::vector<PathIn
         std::map<const __tag_FI_SQL_COND *, __tag_FI_SQL_COND *> copied;
         const __tag_FI_SQL_COND *where = WithoutAccessTimes(firstCond, &indexConds, &copied);
         const FI_TABLE_GEN_CONTEXT table{dbPath.c_str(), &ctx};
-        if (FILEIDXResultGetAndTableGen(volume.c_str(), where, folderConds.empty() ? nullptr : &folderConds.front(),
-                                        KeepRow, &table) < 0) {
+        if (FILEIDXResultGetAndTableGen(volume.c_str(), where,
+                                        folderConds.empty() ? nullptr : &folderConds.front(), KeepRow,
+                                        &table) < 0) {
             NVO_LOG(kNorvoSearch, "%s:%d Fail to query data from DB in share %s",
                     folders.empty() ? "" : folders.front().userPath.c_str());
             return false;

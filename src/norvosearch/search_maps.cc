@@ -22,8 +22,10 @@ bool SearchShareDirMap::insertDir(const char *user, const char *context, const s
     }
     // A folder in a bin or under a hidden name is one no walk from above would enter.
     std::string root, rest;
-    const bool below = norvo::search::SplitRealPath(info.fullPath, &root, &rest) == norvo::search::SplitResult::kOk;
-    if (QUIBShareIsShareRecycle(info.fullPath.c_str()) == 1 || (below && norvo::search::OutOfSight(root, rest)) ||
+    const bool below =
+        norvo::search::SplitRealPath(info.fullPath, &root, &rest) == norvo::search::SplitResult::kOk;
+    if (QUIBShareIsShareRecycle(info.fullPath.c_str()) == 1 ||
+        (below && norvo::search::OutOfSight(root, rest)) ||
         CheckDirListPrivilege(info.fullPath.c_str()) != 1) {
         return true;
     }

@@ -24,7 +24,8 @@ namespace {
 
 // Looks a name up once per search; "" when the platform does not know the id.
 template <typename Record, typename Get, typename Free>
-const std::string &NameOf(std::map<unsigned int, std::string> &cache, unsigned int id, Get get, Free release) {
+const std::string &NameOf(std::map<unsigned int, std::string> &cache, unsigned int id, Get get,
+                          Free release) {
     const auto found = cache.find(id);
     if (found != cache.end()) {
         return found->second;
@@ -64,8 +65,9 @@ bool NvoSearchCallBack::operator()(const std::string &, const std::string &, con
             output.reset(db);
         }
         // Every field is written below: no need to clear 14 KiB for each hit.
-        norvo::search::FillHit(extra != nullptr ? *extra : norvo::search::KeyShare(root.substr(root.rfind('/') + 1)),
-                               root, rest, st, record.get());
+        norvo::search::FillHit(
+            extra != nullptr ? *extra : norvo::search::KeyShare(root.substr(root.rfind('/') + 1)), root, rest,
+            st, record.get());
         snprintf(record->userName, sizeof record->userName, "%s",
                  NameOf<QUIBUSER>(userNames, st.st_uid, QUIBUserGetByUID, QUIBUserFree).c_str());
         snprintf(record->groupName, sizeof record->groupName, "%s",
@@ -86,14 +88,15 @@ bool NvoSearchCallBack::flush() {
     });
 }
 
-NvoSearchCompWalkerCB::NvoSearchCompWalkerCB(const char *dbPath, const std::vector<FindComp *> &list, int *flag)
+NvoSearchCompWalkerCB::NvoSearchCompWalkerCB(const char *dbPath, const std::vector<FindComp *> &list,
+                                             int *flag)
     : hitCB(new NvoSearchCallBack(dbPath)), conds(list), cancel(flag) {}
 
 NvoSearchCompWalkerCB::~NvoSearchCompWalkerCB() = default;
 
 bool NvoSearchCompWalkerCB::operator()(const std::string &userPath, const std::string &basePath,
-                                       const std::string &realPath, const std::string &name, _tag_QUIBSTAT_ &st,
-                                       const std::string *extra) {
+                                       const std::string &realPath, const std::string &name,
+                                       _tag_QUIBSTAT_ &st, const std::string *extra) {
     return norvo::Guarded(false, [&] {
         if (!conds.empty() && !S_ISREG(st.st_mode) && !S_ISDIR(st.st_mode)) {
             return true;
@@ -192,7 +195,8 @@ bool NvoSearchWalker::Walk(const std::vector<FindATimeComp *> &extra) {
                         NVO_SET_QUIB_ERR(kNorvoSearch, QUIB_ERR_ACCESS_DENIED);
                     } else {
                         NVO_SET_QUIB_ERR(kNorvoSearch, QUIB_ERR_FAILED);
-                        NVO_LOG(kNorvoSearch, "%s:%d Fail to Stat %s, %s", info.fullPath.c_str(), strerror(err));
+                        NVO_LOG(kNorvoSearch, "%s:%d Fail to Stat %s, %s", info.fullPath.c_str(),
+                                strerror(err));
                     }
                     compCB->flush();
                     return false;
@@ -200,8 +204,9 @@ bool NvoSearchWalker::Walk(const std::vector<FindATimeComp *> &extra) {
                 if (!S_ISDIR(st.st_mode)) {
                     continue;
                 }
-                const bool walked = walker->Walk_FirstFolder_First(info.userPath, info.sharePath, info.fullPath,
-                                                                   *compCB, &info.shareName, true, searchCurrentDir);
+                const bool walked =
+                    walker->Walk_FirstFolder_First(info.userPath, info.sharePath, info.fullPath, *compCB,
+                                                   &info.shareName, true, searchCurrentDir);
                 // What was found stays, whatever ended the walk.
                 if (!compCB->flush() || !walked) {
                     NVO_SET_QUIB_ERR(kNorvoSearch, QUIB_ERR_INTERNAL);

@@ -57,7 +57,8 @@ struct Conditions {
 };
 
 // "before:T" or "after:T" (times), "equal:B", "less:B" or "greater:B" (sizes) into op and value.
-bool SplitOp(const std::string &text, const std::vector<std::string> &ops, std::string *op, std::string *value) {
+bool SplitOp(const std::string &text, const std::vector<std::string> &ops, std::string *op,
+             std::string *value) {
     const size_t colon = text.find(':');
     if (colon == std::string::npos || text.find_first_not_of("0123456789", colon + 1) != std::string::npos ||
         colon + 1 == text.size()) {
@@ -102,8 +103,8 @@ bool BuildConditions(const Invocation &inv, Conditions *conds, int *status) {
             }
             op = value;
         } else if (!spec.ops.empty() && !SplitOp(value, spec.ops, &op, &value)) {
-            *status = ReportUsageError(inv.command, std::string("--") + spec.option + " wants OP:NUMBER, not " +
-                                                        *inv.Value(spec.option));
+            *status = ReportUsageError(inv.command, std::string("--") + spec.option +
+                                                        " wants OP:NUMBER, not " + *inv.Value(spec.option));
             return false;
         }
         if (!FindFactory::createFindOp(spec.field, op.c_str(), value.c_str(), conds->list)) {
@@ -137,7 +138,8 @@ int RunSearch(const Invocation &inv) {
     struct sigaction action {};
     action.sa_handler = Cancel;
     sigaction(SIGINT, &action, nullptr);
-    FileSearch::NvoSearchWalker walker(userName.c_str(), inv.Has("sid") ? inv.CStr("sid") : "norvo", &g_cancel);
+    FileSearch::NvoSearchWalker walker(userName.c_str(), inv.Has("sid") ? inv.CStr("sid") : "norvo",
+                                       &g_cancel);
     walker.setSearchCurrentDir(inv.Has("current-dir-only"));
     if (!walker.init(inv.arguments, conds.list)) {
         return Failure(inv, "the search could not start");
@@ -159,8 +161,8 @@ int RunSearch(const Invocation &inv) {
     data["done"] = done;
     const bool saved = SaveTaskData(task.get(), data, 1.0F) && task->setFinished();
     if (!done) {
-        return Failure(inv, "the search failed after " + std::to_string(hits) + " hits of task " +
-                                walker.getDBTaskId());
+        return Failure(
+            inv, "the search failed after " + std::to_string(hits) + " hits of task " + walker.getDBTaskId());
     }
     if (!saved) {
         return Failure(inv, "the task record of " + walker.getDBTaskId());
@@ -190,7 +192,8 @@ int RunSearchResults(const Invocation &inv) {
     const std::unique_ptr<OBX::Task> record(mgr.getTask(RecordId(id).c_str()));
     const Json::Value volume = record ? record->getProperty("data")["volume"] : Json::Value();
     std::unique_ptr<NvoSearchDBTask> task(
-        volume.isString() ? NvoSearchDBTaskMgr(userName.c_str()).getDBTask(volume.asCString(), id.c_str()) : nullptr);
+        volume.isString() ? NvoSearchDBTaskMgr(userName.c_str()).getDBTask(volume.asCString(), id.c_str())
+                          : nullptr);
     if (!task) {
         return ReportFailure(inv, 408, "no search " + id + " of " + userName);
     }

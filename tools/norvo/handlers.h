@@ -18,10 +18,12 @@ int RunWalk(const Invocation &inv);        // cmd_walk.cc
 int RunSubdirs(const Invocation &inv);     // cmd_subdirs.cc
 int RunTasks(const Invocation &inv);       // cmd_tasks.cc
 int RunSearchDb(const Invocation &inv);    // cmd_search_db.cc
-int RunSearch(const Invocation &inv);      // cmd_search.cc
-int RunSearchResults(const Invocation &inv);  // cmd_search.cc
 int RunUpload(const Invocation &inv);      // cmd_upload.cc
 int RunXferlog(const Invocation &inv);     // cmd_upload.cc
 int RunIndex(const Invocation &inv);       // cmd_index.cc
+
+// cmd_search.cc
+int RunSearch(const Invocation &inv);
+int RunSearchResults(const Invocation &inv);
 
 }  // namespace norvo::cli
