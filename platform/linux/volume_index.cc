@@ -9,7 +9,6 @@
 #include <fcntl.h>
 #include <stdint.h>
 #include <string.h>
-#include <sys/file.h>
 #include <sys/inotify.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
@@ -1105,6 +1104,14 @@ std::string Now() {
     return std::to_string(static_cast<long long>(time(nullptr)));
 }
 
+// Takes (waiting) or gives back the writers' lock: an open file description lock, so that
+// status can look at it without taking it.
+int Lock(int fd, short type) {
+    struct flock lock = {};
+    lock.l_type = type;
+    return fcntl(fd, F_OFD_SETLKW, &lock);
+}
+
 // The index's folder, made root's 0700, and its lock, held exclusively by a writer.
 struct Upkeep {
     FileDescriptor dir;
@@ -1133,7 +1140,7 @@ int BeginUpkeep(const char *volume, Upkeep *u) {
     if (!u->lock.IsOpen()) {
         return VLIBCErrFromErrno(errno);
     }
-    return flock(u->lock.Get(), LOCK_EX) == 0 ? QUIB_ERR_NONE : VLIBCErrFromErrno(errno);
+    return Lock(u->lock.Get(), F_WRLCK) == 0 ? QUIB_ERR_NONE : VLIBCErrFromErrno(errno);
 }
 
 int OpenForWrite(const std::string &path, FileIdxDb *db) {
@@ -1359,7 +1366,9 @@ int VolumeIndexStatus(const char *volume, FI_INDEX_STATUS *status) {
         return opened;
     }
     FileDescriptor lock(openat(dir.Get(), kLockName, O_RDONLY | O_NOFOLLOW | O_CLOEXEC));
-    if (lock.IsOpen() && flock(lock.Get(), LOCK_SH | LOCK_NB) != 0) {
+    struct flock probe = {};
+    probe.l_type = F_WRLCK;
+    if (lock.IsOpen() && fcntl(lock.Get(), F_OFD_GETLK, &probe) == 0 && probe.l_type != F_UNLCK) {
         status->building = 1;
     }
     struct stat st;
@@ -1421,7 +1430,7 @@ public:
             return code;
         }
         int code = UpdateLocked(u_, db_.get(), writer_.get());  // what changed before the watches
-        flock(u_.lock.Get(), LOCK_UN);
+        Lock(u_.lock.Get(), F_UNLCK);
         using Clock = std::chrono::steady_clock;
         Clock::time_point firstDirty{}, lastEvent{}, lastFull = Clock::now();
         while (code == QUIB_ERR_NONE && *stop_ == 0) {
@@ -1540,10 +1549,10 @@ private:
     }
 
     int Apply() {
-        if (flock(u_.lock.Get(), LOCK_EX) != 0) {
+        if (Lock(u_.lock.Get(), F_WRLCK) != 0) {
             return VLIBCErrFromErrno(errno);
         }
-        const ScopeExit unlock([this] { flock(u_.lock.Get(), LOCK_UN); });
+        const ScopeExit unlock([this] { Lock(u_.lock.Get(), F_UNLCK); });
         struct stat st;
         if (fstatat(u_.dir.Get(), kIndexName, &st, AT_SYMLINK_NOFOLLOW) != 0 || st.st_ino != ino_) {
             if (const int code = Open()) {  // built anew meanwhile
