@@ -182,38 +182,6 @@ TEST_F(FileIdx, ChainsSelectWhatTheConditionsAccept) {
     EXPECT_GT(informative, queries.size() / 2);
 }
 
-// The SQL LIKE is the name matcher on generated pairs, SQLite's own wildcards included.
-TEST_F(FileIdx, LikeIsTheNameMatcher) {
-    std::mt19937 random(5);
-    const std::vector<std::string> pieces{"a", "A", "é", "É", "ß", "ss", "*", "?", "%", "_", "\\", "\n", "\xff", "\xc3", "\xe2\x82", "/"};
-    const auto text = [&](int most) {
-        std::string s;
-        for (int n = static_cast<int>(random() % most); n > 0; --n) {
-            s += pieces[random() % pieces.size()];
-        }
-        return s;
-    };
-    std::vector<FI_FILE_INFO_DATA> hits;
-    std::vector<std::string> names;
-    for (int i = 0; i < 300; ++i) {
-        names.push_back(text(5));
-        hits.push_back(Hit("s", std::to_string(i)));
-        snprintf(hits.back().name, sizeof hits.back().name, "%s", names.back().c_str());
-    }
-    Insert(hits);
-    for (int p = 0; p < 300; ++p) {
-        const std::string pattern = text(4);
-        std::vector<std::string> expected;
-        for (size_t i = 0; i < names.size(); ++i) {
-            if (NvoLibStrLikeCompare(pattern.c_str(), names[i].c_str(), '\\') == 1) {
-                expected.push_back("s:" + std::to_string(i));
-            }
-        }
-        __tag_FI_SQL_COND like = Cond(FI_COND_NAME, FI_OP_LIKE, pattern);
-        ASSERT_EQ(Where(&like), expected) << pattern;
-    }
-}
-
 // The chain's shape decides, not the order of records: alternatives through orNext, and an
 // andNext anywhere among them holds for the whole group. Paths match by components.
 TEST_F(FileIdx, ChainShapesAndPaths) {
