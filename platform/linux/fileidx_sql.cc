@@ -398,6 +398,10 @@ int Open(const char *path, FileIdxDb *db) {
 
 }  // namespace
 
+bool FileIdxPathLike(std::string_view pattern, std::string_view path) {
+    return PathLikeMatch(pattern, path);
+}
+
 const char kFileIdxColumns[] =
     "name, real_path, parent_path, share, path, is_dir, size, type, crtime, ctime, atime, mtime, posix, mode, "
     "uid, gid, user_name, group_name";

@@ -9,7 +9,6 @@
 #include <fcntl.h>
 #include <stdint.h>
 #include <string.h>
-#include <sys/file.h>
 #include <sys/inotify.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
@@ -35,6 +34,7 @@
 #include "private_dir.h"
 #include "quib_share.h"
 #include "vlibc_err.h"
+#include "vlibc_unicode.h"
 
 namespace norvo::platform {
 namespace {
@@ -459,7 +459,8 @@ public:
         if (const int code = ReadIndex()) {
             return code;
         }
-        if (conditions_ != nullptr || folderConditions_ != nullptr) {
+        decided_ = Direct();
+        if (!decided_) {
             if (const int code = PrepareCheck()) {
                 return code;
             }
@@ -474,7 +475,9 @@ public:
                     return code;
                 }
             }
-            fds_.clear();  // folders are visited in id order, which is walk order: few reopen
+            if (fds_.size() > 1024) {
+                fds_.clear();  // folders come in walk order: their ancestors stay useful a while
+            }
         }
         return Flush();
     }
@@ -692,8 +695,11 @@ private:
             share.realPath.size() >= sizeof(FI_FILE_INFO_DATA::realPath)) {
             return QUIB_ERR_NONE;  // a record could not hold it; the walk cannot reach it either
         }
-        batch_.emplace_back(std::make_unique<__tag_FI_FILE_INFO_DATA>());
-        __tag_FI_FILE_INFO_DATA &r = *batch_.back();
+        if (used_ == batch_.size()) {
+            batch_.emplace_back(std::make_unique<__tag_FI_FILE_INFO_DATA>());
+        }
+        __tag_FI_FILE_INFO_DATA &r = *batch_[used_++];
+        r.type[0] = '\0';
         const bool isDir = S_ISDIR(sx.stx_mode);
         snprintf(r.name, sizeof r.name, "%s", name.c_str());
         snprintf(r.realPath, sizeof r.realPath, "%s", share.realPath.c_str());
@@ -726,7 +732,7 @@ private:
         r.gid = sx.stx_gid;
         snprintf(r.userName, sizeof r.userName, "%s", NameOfUid(sx.stx_uid).c_str());
         snprintf(r.groupName, sizeof r.groupName, "%s", NameOfGid(sx.stx_gid).c_str());
-        return batch_.size() >= kBatch ? Flush() : QUIB_ERR_NONE;
+        return used_ >= kBatch ? Flush() : QUIB_ERR_NONE;
     }
 
     // The chains are decided by the SQL of the result databases over the live records, so an
@@ -752,15 +758,69 @@ private:
         return code == QUIB_ERR_NONE ? PrepareBound(check_.get(), select, &select_) : code;
     }
 
+    // Chains of names, paths and shares only are decided here, as the SQL functions decide
+    // them; any other chain goes through the SQL of the result databases.
+    bool Direct() {
+        for (const __tag_FI_SQL_COND *chain : {conditions_, folderConditions_}) {
+            std::set<const __tag_FI_SQL_COND *> seen;
+            if (chain != nullptr && !Conjuncts(chain, &seen, &direct_)) {
+                return false;
+            }
+        }
+        for (const Alternatives &alts : direct_) {
+            for (const __tag_FI_SQL_COND *c : alts) {
+                const bool ok = (c->type == FI_COND_NAME && (c->op == FI_OP_LIKE || c->op == FI_OP_EQ)) ||
+                                (c->type == FI_COND_PATH && (c->op == FI_OP_PATH_LIKE ||
+                                                             c->op == FI_OP_PATH_NOT_LIKE || c->op == FI_OP_EQ)) ||
+                                (c->type == FI_COND_SHARE && c->op == FI_OP_EQ);
+                if (!ok) {
+                    return false;
+                }
+            }
+        }
+        return true;
+    }
+
+    bool Holds(const __tag_FI_FILE_INFO_DATA &r) const {
+        for (const Alternatives &alts : direct_) {
+            bool any = false;
+            for (size_t i = 0; !any && i < alts.size(); ++i) {
+                const __tag_FI_SQL_COND &c = *alts[i];
+                const std::string operand = Operand(c);
+                const char *field = c.type == FI_COND_NAME ? r.name : c.type == FI_COND_PATH ? r.path : r.share;
+                switch (c.op) {
+                    case FI_OP_LIKE:
+                        any = VLIBCUnicodeUTF8LikeMatch(operand.c_str(), field, '\\') != 0;
+                        break;
+                    case FI_OP_PATH_LIKE:
+                        any = FileIdxPathLike(operand, field);
+                        break;
+                    case FI_OP_PATH_NOT_LIKE:
+                        any = !FileIdxPathLike(operand, field);
+                        break;
+                    default:
+                        any = operand == field;
+                        break;
+                }
+            }
+            if (!any) {
+                return false;
+            }
+        }
+        return true;
+    }
+
     int Flush() {
         std::vector<size_t> kept;
-        if (!check_) {
-            for (size_t i = 0; i < batch_.size(); ++i) {
-                kept.push_back(i);
+        if (decided_) {
+            for (size_t i = 0; i < used_; ++i) {
+                if (Holds(*batch_[i])) {
+                    kept.push_back(i);
+                }
             }
-        } else if (!batch_.empty()) {
+        } else if (used_ > 0) {
             int code = Exec(check_.get(), "DELETE FROM fileinfo");
-            for (size_t i = 0; code == QUIB_ERR_NONE && i < batch_.size(); ++i) {
+            for (size_t i = 0; code == QUIB_ERR_NONE && i < used_; ++i) {
                 code = BindRecord(insert_.get(), *batch_[i]);
                 if (code == QUIB_ERR_NONE) {
                     sqlite3_bind_int64(insert_.get(), 19, static_cast<sqlite3_int64>(i) + 1);
@@ -781,14 +841,15 @@ private:
                 return FileIdxCodeOf(check_.get(), rc);
             }
         }
+        used_ = 0;
         for (const size_t i : kept) {
             if (const int code = keep_(*batch_[i])) {
                 return code;
             }
         }
-        batch_.clear();
         return QUIB_ERR_NONE;
     }
+
 
     static constexpr size_t kBatch = 256;
     const std::string volume_;
@@ -803,7 +864,10 @@ private:
     std::unordered_map<int64_t, FileDescriptor> fds_;
     std::unordered_map<uid_t, std::string> users_;
     std::unordered_map<gid_t, std::string> groups_;
-    std::vector<std::unique_ptr<__tag_FI_FILE_INFO_DATA>> batch_;
+    std::vector<std::unique_ptr<__tag_FI_FILE_INFO_DATA>> batch_;  // reused; used_ of them hold rows
+    size_t used_ = 0;
+    std::vector<Alternatives> direct_;  // the chains' conjuncts when decided here, see Direct
+    bool decided_ = false;
     FileIdxDb check_;
     Statement insert_;
     Statement select_;
@@ -1105,6 +1169,14 @@ std::string Now() {
     return std::to_string(static_cast<long long>(time(nullptr)));
 }
 
+// Takes (waiting) or gives back the writers' lock: an open file description lock, so that
+// status can look at it without taking it.
+int Lock(int fd, short type) {
+    struct flock lock = {};
+    lock.l_type = type;
+    return fcntl(fd, F_OFD_SETLKW, &lock);
+}
+
 // The index's folder, made root's 0700, and its lock, held exclusively by a writer.
 struct Upkeep {
     FileDescriptor dir;
@@ -1133,7 +1205,7 @@ int BeginUpkeep(const char *volume, Upkeep *u) {
     if (!u->lock.IsOpen()) {
         return VLIBCErrFromErrno(errno);
     }
-    return flock(u->lock.Get(), LOCK_EX) == 0 ? QUIB_ERR_NONE : VLIBCErrFromErrno(errno);
+    return Lock(u->lock.Get(), F_WRLCK) == 0 ? QUIB_ERR_NONE : VLIBCErrFromErrno(errno);
 }
 
 int OpenForWrite(const std::string &path, FileIdxDb *db) {
@@ -1359,7 +1431,9 @@ int VolumeIndexStatus(const char *volume, FI_INDEX_STATUS *status) {
         return opened;
     }
     FileDescriptor lock(openat(dir.Get(), kLockName, O_RDONLY | O_NOFOLLOW | O_CLOEXEC));
-    if (lock.IsOpen() && flock(lock.Get(), LOCK_SH | LOCK_NB) != 0) {
+    struct flock probe = {};
+    probe.l_type = F_WRLCK;
+    if (lock.IsOpen() && fcntl(lock.Get(), F_OFD_GETLK, &probe) == 0 && probe.l_type != F_UNLCK) {
         status->building = 1;
     }
     struct stat st;
@@ -1421,7 +1495,7 @@ public:
             return code;
         }
         int code = UpdateLocked(u_, db_.get(), writer_.get());  // what changed before the watches
-        flock(u_.lock.Get(), LOCK_UN);
+        Lock(u_.lock.Get(), F_UNLCK);
         using Clock = std::chrono::steady_clock;
         Clock::time_point firstDirty{}, lastEvent{}, lastFull = Clock::now();
         while (code == QUIB_ERR_NONE && *stop_ == 0) {
@@ -1540,10 +1614,10 @@ private:
     }
 
     int Apply() {
-        if (flock(u_.lock.Get(), LOCK_EX) != 0) {
+        if (Lock(u_.lock.Get(), F_WRLCK) != 0) {
             return VLIBCErrFromErrno(errno);
         }
-        const ScopeExit unlock([this] { flock(u_.lock.Get(), LOCK_UN); });
+        const ScopeExit unlock([this] { Lock(u_.lock.Get(), F_UNLCK); });
         struct stat st;
         if (fstatat(u_.dir.Get(), kIndexName, &st, AT_SYMLINK_NOFOLLOW) != 0 || st.st_ino != ino_) {
             if (const int code = Open()) {  // built anew meanwhile

@@ -537,6 +537,32 @@ const Op kOps[] = {
          return Expect(closed && ok, IndexedHits() == 1);
      },
      kPlatformSlot, [] { FreshIndexDb(false); }},
+    {"VolumeIndexBuild",  // the index whole, or the old state and no scratch file left
+     [] {
+         const bool ok = FILEIDXIndexBuild("/volume1") == 0;
+         return Expect(ok, FILEIDXIsIndexEnable("/volume1") == 1);
+     },
+     kPlatformSlot, [] { fs::remove_all("/volume1/@fileidx"); },
+     [] {
+         return std::string(fs::exists("/volume1/@fileidx/fileidx.db.new") ? "scratch left " : "") +
+                (fs::exists("/volume1/@fileidx/fileidx.db") && FILEIDXIsIndexEnable("/volume1") != 1 ? "torn index" : "");
+     }},
+    {"VolumeIndexQuery",
+     [] {
+         __tag_FI_SQL_COND name{};
+         FileSearch::setSqlCond(name, FI_COND_NAME, FI_OP_LIKE, std::string("*.IDXQ"), nullptr, nullptr);
+         FI_TABLE_GEN_CONTEXT context{kIndexDb, nullptr};
+         const bool ok = FILEIDXResultGetAndTableGen("/volume1", &name, nullptr, nullptr, &context) == 0;
+         return Expect(ok, IndexedHits() == 2);
+     },
+     kPlatformSlot,
+     [] {
+         if (!fs::exists("/volume1/@fileidx/fileidx.db")) {
+             g_app->WriteFile(kDir + "/a.idxq").WriteFile(kDir + "/b.idxq");
+             ASSERT_EQ(FILEIDXIndexBuild("/volume1"), 0);
+         }
+         FreshIndexDb(false);
+     }},
     {"IndexSelect",
      [] {
          __tag_FI_SQL_COND below{};

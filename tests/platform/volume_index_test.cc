@@ -27,13 +27,14 @@
 #include "quib_stat.h"
 #include "vlibc_err.h"
 #include "vlibc_file.h"
+#include "vlibc_unicode.h"
 
 namespace {
 
 using norvo::testing::Failed;
 
 const char kVolume[] = "/volume1";
-const std::string kOut = "/volume1/public/.out.db";  // left out of the oracle by name
+const std::string kOut = "/volume1/@tmp/out.db";  // outside the index
 
 __tag_FI_SQL_COND Cond(__tag_FI_SQL_COND_TYPE type, __tag_FI_SQL_COND_OP op, const std::string &value) {
     __tag_FI_SQL_COND c{};
@@ -74,7 +75,7 @@ void Walk(const std::string &share, const std::string &root, const std::string &
     ASSERT_NE(d, nullptr) << dir;
     while (const dirent *e = readdir(d)) {
         const std::string name = e->d_name;
-        if (name == "." || name == ".." || dir + "/" + name == kOut || name.rfind(".out.db", 0) == 0) {
+        if (name == "." || name == "..") {
             continue;
         }
         const std::string path = rest.empty() ? name : rest + "/" + name;
@@ -132,11 +133,11 @@ protected:
     // links, odd bytes, and a deep chain.
     void MakeTree() {
         std::mt19937 random(7);
-        const std::vector<std::string> pieces{"report", "Report", "REP", "a", "é", "É", "ß", "\xe2\x84\xaa", "\xc5\xbf",
-                                              "\xc1\xa1", "*", "?", "\\", "\n", "\xff", ".txt", ".PNG", "x", " "};
+        const std::vector<std::string> pieces{"report", "Report", "ab", "AB", "k", "\xe2\x84\xaa", "s", "S", "\xc5\xbf",
+                                              "é", "É", "ß", "\xc1\xa1", "*", "?", "\\", "\n", "\xff", ".txt", ".PNG", " ", "%", "_"};
         auto name = [&] {
             std::string n;
-            for (int i = 1 + static_cast<int>(random() % 4); i > 0; --i) {
+            for (int i = 2 + static_cast<int>(random() % 4); i > 0; --i) {
                 n += pieces[random() % pieces.size()];
             }
             return n;
@@ -167,7 +168,7 @@ protected:
 
     // The reference rows of both chains.
     std::vector<std::string> Expected(__tag_FI_SQL_COND *conditions, __tag_FI_SQL_COND *folders) {
-        const std::string db = "/volume1/public/.out.db.ref";
+        const std::string db = "/volume1/@tmp/ref.db";
         unlink(db.c_str());
         EXPECT_EQ(FILEIDXDBCreate(db.c_str()), 0);
         std::vector<FI_FILE_INFO_DATA> all;
@@ -235,6 +236,181 @@ TEST_F(VolumeIndex, AnswersAsAWalkedResultDatabase) {
         EXPECT_EQ(Indexed(conditions, folders), expected) << "case " << i;
         EXPECT_TRUE(i != 1 || expected.size() > 10) << "the tree must hold what the cases ask for";
     }
+}
+
+// Names found through the trigram table are every name the matcher accepts: generated
+// patterns (wildcards, SQLite's too, escapes, case, non-ASCII, fewer than three characters)
+// against VLIBCUnicodeUTF8LikeMatch over every walked name.
+TEST_F(VolumeIndex, GeneratedPatternsMissNoName) {
+    // Every three-letter name over letters that fold alike in different ways.
+    const std::vector<std::string> letters{"a", "B", "k", "\xe2\x84\xaa", "\xc5\xbf", "S", "\xc1\xa1", "é"};
+    app.MakeDir("/volume1/public/abc");
+    for (const std::string &x : letters) {
+        for (const std::string &y : letters) {
+            for (const std::string &z : letters) {
+                app.WriteFile("/volume1/public/abc/" + x + y + z);
+            }
+        }
+    }
+    ASSERT_EQ(FILEIDXIndexBuild(kVolume), 0);
+    std::vector<FI_FILE_INFO_DATA> all;
+    Walk("public", "/volume1/public", "", &all);
+    Walk("photo", "/volume1/photo", "", &all);
+    std::mt19937 random(3);
+    const std::vector<std::string> pieces{"ab", "aB", "b", "k", "K", "\xe2\x84\xaa", "s", "S", "\xc5\xbf", "é", "É", "ß",
+                                          "\xc1\xa1", "a", "*", "?", "\\*", "\\?", "\\\\", "rep", "t", "\n", "%", "_"};
+    int nonEmpty = 0;
+    for (int round = 0; round < 200; ++round) {
+        std::string pattern = random() % 2 ? "*" : "";
+        for (int i = 1 + static_cast<int>(random() % 4); i > 0; --i) {
+            pattern += round % 2 ? pieces[random() % pieces.size()] : letters[random() % letters.size()];
+        }
+        pattern += random() % 2 ? "*" : "";
+        std::vector<std::string> expected;
+        for (const FI_FILE_INFO_DATA &r : all) {
+            if (VLIBCUnicodeUTF8LikeMatch(pattern.c_str(), r.name, '\\')) {
+                expected.push_back(Text(r));
+            }
+        }
+        std::sort(expected.begin(), expected.end());
+        __tag_FI_SQL_COND name = Cond(FI_COND_NAME, FI_OP_LIKE, pattern);
+        EXPECT_EQ(Indexed(&name, nullptr), expected) << pattern;
+        nonEmpty += !expected.empty();
+    }
+    EXPECT_GT(nonEmpty, 30);
+}
+
+// The index as it is: entries and folders, and every row a query returns.
+struct Snapshot {
+    unsigned long long entries, folders;
+    std::vector<std::string> rows;
+    bool operator==(const Snapshot &) const = default;
+};
+
+// After creates, deletes, renames of files and folders and a folder's times alone, an update
+// reads only what moved and leaves what a fresh build makes.
+TEST_F(VolumeIndex, UpdateEqualsAFreshBuild) {
+    const auto snapshot = [&] {
+        FI_INDEX_STATUS status;
+        EXPECT_EQ(FILEIDXIndexStatus(kVolume, &status), 0);
+        EXPECT_EQ(status.state, FI_INDEX_READY);
+        return Snapshot{status.entries, status.folders, Indexed(nullptr, nullptr)};
+    };
+    ASSERT_EQ(FILEIDXIndexBuild(kVolume), 0);
+    unsigned long long read = 99;
+    ASSERT_EQ(FILEIDXIndexUpdate(kVolume, &read), 0);
+    EXPECT_EQ(read, 0u) << "nothing moved";
+    app.WriteFile("/volume1/public/2013/new report.txt");
+    ASSERT_EQ(unlink("/volume1/photo/2013/x/MyReport.TXT"), 0);
+    ASSERT_EQ(rename("/volume1/public/2013/x", "/volume1/photo/2013/x2"), 0);  // a folder moves share
+    ASSERT_EQ(rename("/volume1/photo/@eaDir", "/volume1/photo/@eaDir2"), 0);
+    app.MakeDir("/volume1/public/fresh").MakeDir("/volume1/public/fresh/er").WriteFile("/volume1/public/fresh/er/f");
+    const timespec times[2] = {{0, UTIME_OMIT}, {12345, 0}};
+    ASSERT_EQ(utimensat(AT_FDCWD, "/volume1/public/.hidden", times, AT_SYMLINK_NOFOLLOW), 0);
+    ASSERT_EQ(FILEIDXIndexUpdate(kVolume, &read), 0);
+    // public, public/2013, public/.hidden, photo, photo/2013, photo/2013/x, and the four new
+    // or moved folders; none that stayed as they were.
+    EXPECT_EQ(read, 10u);
+    const Snapshot updated = snapshot();
+    ASSERT_EQ(FILEIDXIndexBuild(kVolume), 0);
+    EXPECT_EQ(updated, snapshot());
+}
+
+bool Eventually(const std::function<bool()> &done) {
+    for (int i = 0; i < 1000; ++i) {
+        if (done()) {
+            return true;
+        }
+        std::this_thread::sleep_for(std::chrono::milliseconds(10));
+    }
+    return false;
+}
+
+// While watch runs, a file created is found, found under its new name once renamed, and gone
+// from the index once deleted; so is a folder made with a file in it.
+TEST_F(VolumeIndex, WatchAppliesChangesAsTheyHappen) {
+    ASSERT_EQ(FILEIDXIndexBuild(kVolume), 0);
+    volatile int stop = 0;
+    int watched = -2;
+    std::thread watcher([&] { watched = FILEIDXIndexWatch(kVolume, &stop); });
+    const auto entries = [] {
+        FI_INDEX_STATUS status{};
+        return FILEIDXIndexStatus(kVolume, &status) == 0 ? status.entries : 0ull;
+    };
+    const auto found = [&](const std::string &pattern) {
+        __tag_FI_SQL_COND name = Cond(FI_COND_NAME, FI_OP_EQ, pattern);
+        return Indexed(&name, nullptr).size();
+    };
+    const unsigned long long before = entries();
+    app.WriteFile("/volume1/photo/2013/just made");
+    EXPECT_TRUE(Eventually([&] { return found("just made") == 1; }));
+    ASSERT_EQ(rename("/volume1/photo/2013/just made", "/volume1/public/renamed"), 0);
+    EXPECT_TRUE(Eventually([&] { return found("renamed") == 1 && entries() == before + 1; }));
+    app.MakeDir("/volume1/public/2013/new").WriteFile("/volume1/public/2013/new/inside");
+    EXPECT_TRUE(Eventually([&] { return found("inside") == 1; }));
+    ASSERT_EQ(unlink("/volume1/public/renamed"), 0);
+    ASSERT_EQ(unlink("/volume1/public/2013/new/inside"), 0);
+    ASSERT_EQ(rmdir("/volume1/public/2013/new"), 0);
+    EXPECT_TRUE(Eventually([&] { return entries() == before; }));
+    stop = 1;
+    watcher.join();
+    EXPECT_EQ(watched, 0);
+}
+
+// A query works only on a whole index of root's that this process can read as root: missing,
+// half-built, foreign, damaged, or out of reach (no saved root) all say 0 and the search walks.
+// Read as a user with root saved, every look at the tree is the user's.
+TEST_F(VolumeIndex, UsedOnlyWhenWholeRootsAndReachable) {
+    EXPECT_EQ(FILEIDXIsIndexEnable(kVolume), 0);
+    app.MakeDir("/volume1/@fileidx", "root", 0700).WriteFile("/volume1/@fileidx/fileidx.db.new", "half", "root", 0600);
+    EXPECT_EQ(FILEIDXIsIndexEnable(kVolume), 0);
+    app.MakeDir("/volume1/photo/2013/x/mine", "alice", 0700).WriteFile("/volume1/photo/2013/x/mine/report.a", "", "alice");
+    ASSERT_EQ(FILEIDXIndexBuild(kVolume), 0);
+    EXPECT_EQ(FILEIDXIsIndexEnable(kVolume), 1);
+    const auto asUser = [&](const std::string &user, const std::function<int()> &fn) {
+        return app.RunAs("root", [&] {
+            return setegid(app.Gid("users")) == 0 && seteuid(app.Uid(user)) == 0 ? fn() : 99;
+        });
+    };
+    // bob sees none of alice's folder; the filter sees each row's folder and name.
+    const auto reports = [&](const std::string &user) {
+        return asUser(user, [&] {
+            if (FILEIDXIsIndexEnable(kVolume) != 1 || FILEIDXDBCreate("/volume1/@tmp/u.db") != 0) return -1;
+            __tag_FI_SQL_COND name = Cond(FI_COND_NAME, FI_OP_LIKE, "report.*");
+            FI_TABLE_GEN_CONTEXT context{"/volume1/@tmp/u.db", nullptr};
+            const auto filter = [](const char *dir, const char *file, void *) {
+                return strcmp(dir, "/volume1/photo/2013/x/mine") == 0 && strcmp(file, "report.a") == 0 ? 1 : 0;
+            };
+            if (FILEIDXResultGetAndTableGen(kVolume, &name, nullptr, filter, &context) != 0) return -2;
+            unsigned long long total = 99;
+            FI_QUERY all{};
+            const int rc = FILEIDXCountGet(context.outputDbPath, &all, &total);
+            unlink(context.outputDbPath);
+            return rc == 0 && geteuid() == app.Uid(user) ? static_cast<int>(total) : -3;
+        });
+    };
+    EXPECT_EQ(reports("alice"), 1);
+    EXPECT_EQ(reports("bob"), 0);
+    EXPECT_EQ(app.RunAs("alice", [] { return FILEIDXIsIndexEnable(kVolume); }), 0);
+    const std::string index = "/volume1/@fileidx/fileidx.db";
+    ASSERT_EQ(chown(index.c_str(), app.Uid("bob"), 0), 0);
+    EXPECT_EQ(FILEIDXIsIndexEnable(kVolume), 0);
+    ASSERT_EQ(chown(index.c_str(), 0, 0), 0);
+    EXPECT_EQ(FILEIDXIsIndexEnable(kVolume), 1);
+    {
+        std::fstream damage(index, std::ios::in | std::ios::out | std::ios::binary);
+        damage.seekp(0);
+        damage << "not a database at all";
+    }
+    EXPECT_EQ(FILEIDXIsIndexEnable(kVolume), 0);
+    FI_TABLE_GEN_CONTEXT context{kOut.c_str(), nullptr};
+    ASSERT_EQ(FILEIDXDBCreate(kOut.c_str()), 0);
+    EXPECT_EQ(OUTCOME(FILEIDXResultGetAndTableGen(kVolume, nullptr, nullptr, nullptr, &context)), Failed(QUIB_ERR_FAILED));
+    FI_INDEX_STATUS status;
+    ASSERT_EQ(FILEIDXIndexStatus(kVolume, &status), 0);
+    EXPECT_EQ(status.state, FI_INDEX_DAMAGED);
+    // Upkeep is root's.
+    EXPECT_EQ(app.RunAs("alice", [] { return FILEIDXIndexBuild(kVolume) == -1 ? VLIBCErrGet() >> 8 : 0; }), 0x03);
 }
 
 }  // namespace
