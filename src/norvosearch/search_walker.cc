@@ -175,14 +175,18 @@ bool NvoSearchWalker::Walk(const std::vector<FindATimeComp *> &extra) {
             if (cancel != nullptr && *cancel != 0) {
                 return true;
             }
-            if (FILEIDXIsIndexEnable(volume.c_str()) == 1) {
-                if (!WalkDB(volume, folders, extra)) {
-                    NVO_SET_QUIB_ERR(kNorvoSearch, QUIB_ERR_BAD_PARAMETER);
-                    return false;
-                }
-                continue;
-            }
+            // The index knows the shares' folders; home folders lie in none of them and are
+            // walked, so that a search below /home finds what it would find without an index.
+            std::vector<PathInfo> indexed, walked;
+            const bool index = FILEIDXIsIndexEnable(volume.c_str()) == 1;
             for (const PathInfo &info : folders) {
+                (index && info.shareName != "homes" ? indexed : walked).push_back(info);
+            }
+            if (!indexed.empty() && !WalkDB(volume, indexed, extra)) {
+                NVO_SET_QUIB_ERR(kNorvoSearch, QUIB_ERR_BAD_PARAMETER);
+                return false;
+            }
+            for (const PathInfo &info : walked) {
                 if (cancel != nullptr && *cancel != 0) {
                     break;
                 }
@@ -204,11 +208,11 @@ bool NvoSearchWalker::Walk(const std::vector<FindATimeComp *> &extra) {
                 if (!S_ISDIR(st.st_mode)) {
                     continue;
                 }
-                const bool walked =
+                const bool done =
                     walker->Walk_FirstFolder_First(info.userPath, info.sharePath, info.fullPath, *compCB,
                                                    &info.shareName, true, searchCurrentDir);
                 // What was found stays, whatever ended the walk.
-                if (!compCB->flush() || !walked) {
+                if (!compCB->flush() || !done) {
                     NVO_SET_QUIB_ERR(kNorvoSearch, QUIB_ERR_INTERNAL);
                     NVO_LOG(kNorvoSearch, "%s:%d Fail to walk %s", info.fullPath.c_str());
                     return false;

@@ -236,13 +236,17 @@ TEST_F(SearchWalker, FindsWhatFindFindsForTheUser) {
 
 // With each volume's index built, the same searches give exactly what walking gave, for every
 // kind of condition, at a share's top and below, with --current-dir-only, for "2013" folders
-// of two shares beside a third share's that was not chosen, for a user who may not list docs
-// and for an administrator; and they do come from the index: a file made after it was built
+// of two shares beside a third share's that was not chosen, a home folder (which no share
+// holds: walked), for a user who may not list docs and for an administrator; and they do come from the index: a file made after it was built
 // is found by walking only.
 TEST_F(SearchWalker, IndexFindsWhatTheWalkFinds) {
     BuildTrees();
+    for (const char *user : {"alice", "bob", "admin"}) {
+        app.MakeDir("/volume1/homes/" + std::string(user), user, 0700)
+            .WriteFile("/volume1/homes/" + std::string(user) + "/b-report.txt", "", user);
+    }
     const std::vector<std::string> folders = {"/photo/2013", "/video/2013", "/docs", "/public/#recycle",
-                                              "/docs/@sharebin"};
+                                              "/docs/@sharebin", "/home"};
     const std::vector<Row> rows = Rows(std::to_string(app.Uid("alice")), std::to_string(app.Gid("staff")));
     const auto searchAll = [&] {
         std::vector<Result> results;
@@ -271,6 +275,7 @@ TEST_F(SearchWalker, IndexFindsWhatTheWalkFinds) {
     }
     EXPECT_EQ(walked[0].hits.count("photo/2013/report-photo.txt"), 1u);
     EXPECT_EQ(walked[0].hits.count("public/2013/report-public.txt"), 0u);
+    EXPECT_EQ(indexed[0].hits.count("homes/alice/b-report.txt"), 1u);
     EXPECT_EQ(Search(app, "alice", {"/docs"}, rows[0].fields, false, true).hits.count("docs/report-late.txt"), 0u);
     EXPECT_EQ(Search(app, "alice", {"/docs"}, rows[0].fields).hits.count("docs/report-late.txt"), 1u) << "walked";
 }
