@@ -98,6 +98,10 @@ bool NvoSearchCompWalkerCB::operator()(const std::string &userPath, const std::s
                                        const std::string &realPath, const std::string &name,
                                        _tag_QUIBSTAT_ &st, const std::string *extra) {
     return norvo::Guarded(false, [&] {
+        // Cancelled: the walk stops before the next entry; nothing more is stored meanwhile.
+        if (cancel != nullptr && __atomic_load_n(cancel, __ATOMIC_RELAXED) != 0) {
+            return true;
+        }
         if (!conds.empty() && !S_ISREG(st.st_mode) && !S_ISDIR(st.st_mode)) {
             return true;
         }
