@@ -5,6 +5,7 @@
 #include <sys/stat.h>
 
 #include <memory>
+#include <new>
 #include <string>
 #include <vector>
 
@@ -42,14 +43,14 @@ const std::string &NameOf(std::map<unsigned int, std::string> &cache, unsigned i
 }  // namespace
 
 NvoSearchCallBack::NvoSearchCallBack(const char *path)
-    : dbPath(path == nullptr ? "" : path), record(new FI_FILE_INFO_DATA()) {}
+    : dbPath(path == nullptr ? "" : path), record(new (std::nothrow) FI_FILE_INFO_DATA()) {}
 
 NvoSearchCallBack::~NvoSearchCallBack() = default;
 
 bool NvoSearchCallBack::operator()(const std::string &, const std::string &, const std::string &realPath,
                                    const std::string &, _tag_QUIBSTAT_ &st, const std::string *extra) {
     return norvo::Guarded(false, [&] {
-        if (failed) {
+        if (failed || !record) {
             return false;
         }
         std::string root, rest;
