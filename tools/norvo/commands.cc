@@ -253,7 +253,7 @@ std::vector<CommandDef> MakeCommands() {
          "the hits); its hits are kept in a result database that search-results pages. Ctrl-C\n"
          "stops it and keeps the hits found so far. Prints the task id and the number of hits.",
          {{"user", "USER", true, kUserHelp},
-          {"sid", "SID", false, "the login sid of the account (default: norvo)"},
+          {"sid", "SID", false, "the login sid (default: norvo; domain and directory accounts need theirs)"},
           {"name", "TERMS", true, "name terms, comma-separated"},
           {"ext", "EXTS", false, "extensions, comma-separated (files only)"},
           {"type", "WORD", false, "file or dir"},
