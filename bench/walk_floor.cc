@@ -7,6 +7,7 @@
 // With --naive: the classic walk, for comparison: chdir into each folder by
 // its absolute path, opendir and readdir it, and stat each entry by its absolute path.
 //   walk_floor [--naive] DIR PATTERN     prints the number of names that match
+// With --icase before the rest: the pattern's letters match either case (a search's name test).
 #include <dirent.h>
 #include <fcntl.h>
 #include <fnmatch.h>
@@ -26,6 +27,7 @@ constexpr unsigned kFields = STATX_TYPE | STATX_MODE | STATX_UID | STATX_GID | S
                              STATX_MTIME | STATX_CTIME | STATX_BTIME;
 
 const char *g_pattern;
+int g_flags;
 long g_matches;
 
 bool Hidden(const char *name) {
@@ -61,7 +63,7 @@ void Floor(int fd, size_t depth) {
             if (statx(fd, entry->d_name, AT_SYMLINK_NOFOLLOW | AT_NO_AUTOMOUNT, kFields, &st) != 0) {
                 continue;
             }
-            if (fnmatch(g_pattern, entry->d_name, 0) == 0) {
+            if (fnmatch(g_pattern, entry->d_name, g_flags) == 0) {
                 ++g_matches;
             }
             if (S_ISDIR(st.stx_mode)) {
@@ -92,7 +94,7 @@ void Naive(const std::string &dir) {
         if (statx(AT_FDCWD, path.c_str(), AT_SYMLINK_NOFOLLOW | AT_NO_AUTOMOUNT, kFields, &st) != 0) {
             continue;
         }
-        if (fnmatch(g_pattern, entry->d_name, 0) == 0) {
+        if (fnmatch(g_pattern, entry->d_name, g_flags) == 0) {
             ++g_matches;
         }
         if (S_ISDIR(st.stx_mode)) {
@@ -105,6 +107,11 @@ void Naive(const std::string &dir) {
 }  // namespace
 
 int main(int argc, char **argv) {
+    if (argc > 1 && strcmp(argv[1], "--icase") == 0) {
+        g_flags = FNM_CASEFOLD;
+        --argc;
+        ++argv;
+    }
     const bool naive = argc == 4 && strcmp(argv[1], "--naive") == 0;
     if (argc != 3 + (naive ? 1 : 0)) {
         fprintf(stderr, "usage: walk_floor [--naive] DIR PATTERN\n");

@@ -137,6 +137,20 @@ show "A later request pages the hits sorted by size, largest first" \
     search-db --user alice --volume /volume1 --task "$task" list --sort size --desc --limit 10
 show "A task id that getUniqueID would never make reaches no path: no such task" \
     search-db --user alice --volume /volume1 --task ../../etc list
+# search_as USER EXPLANATION: USER's search for txt, beach and diary in three shares, then its hits.
+search_as() {
+    show "$2" search --user "$1" --name txt,beach,diary /public /photo /archive
+    id=$("$NORVO" --json search --user "$1" --name txt,beach,diary /public /photo /archive |
+        sed 's/.*"task":"\([0-9A-F]*\)".*/\1/')
+    show "... and a later request pages $1's hits (search task $id), largest first" \
+        search-results --user "$1" --task "$id" --sort size --desc
+}
+search_as alice "alice searches three shares on two volumes (walked: no volume index yet)"
+search_as carol "carol may list public only: photo is skipped, and alice's private folder in public too"
+show "root builds /volume1's index (/volume2 is read-only: it stays walked)" \
+    index build /volume1
+search_as alice "The same search again: /volume1 through its index, with the same hits"
+search_as carol "carol again: the index's rows are held to what she may list"
 # An upload's last steps: the file has arrived in a folder of alice's beside the shares.
 mkdir -p /volume1/@tmp/upload && chown "$(id -u alice)" /volume1/@tmp/upload
 printf 'sand and sea\n' > /volume1/@tmp/upload/part && chown "$(id -u alice)" /volume1/@tmp/upload/part

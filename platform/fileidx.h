@@ -176,14 +176,53 @@ QUIB_API int FILEIDXOutputDBInsert(FI_OUTPUT_DB *db, const __tag_FI_FILE_INFO_DA
 QUIB_API int FILEIDXOutputDBCommit(FI_OUTPUT_DB *db);
 QUIB_API int FILEIDXOutputDBClose(FI_OUTPUT_DB *db);
 
-// 1 when volume keeps a file index (a database of hits of every entry at
-// "<volume>/@tmp/norvo/fileidx.db", root's own), 0 when not, -1 on failure.
+// 1 when volume keeps a file index that a query can use now: "<volume>/@fileidx/fileidx.db",
+// root's, finished, whole and readable by this process (root, or a process whose saved user is
+// root). 0 when it is missing, being built, damaged or out of reach (the search then walks);
+// -1 on a bad argument.
 QUIB_API int FILEIDXIsIndexEnable(const char *volume);
 
-// Copies into context->outputDbPath every row of volume's index that conditions (null: all)
-// and folderConditions (null: all) select and filter (null: keep) keeps.
+// Copies into context->outputDbPath every entry of volume's index that lies in a share and
+// that conditions (null: all) and folderConditions (null: all) select, with the share's name and
+// real path, and filter (null: keep) keeps. Each row is the entry's status now (lstat as the
+// caller, no link followed); an entry gone since the index last saw it is left out. The index
+// is read as root only while it is read.
 QUIB_API int FILEIDXResultGetAndTableGen(const char *volume, const __tag_FI_SQL_COND *conditions,
                                          const __tag_FI_SQL_COND *folderConditions, FILEIDX_ROW_FILTER filter,
                                          const FI_TABLE_GEN_CONTEXT *context);
+
+// The upkeep of a volume's index; root only (0x0300 otherwise). The whole volume is walked
+// without following a link, "@tmp" and "@fileidx" at its top left out.
+
+// Builds the index anew into a scratch file that replaces the index when whole.
+QUIB_API int FILEIDXIndexBuild(const char *volume);
+
+// Brings the index up to date: every known folder is looked at, and only those whose change
+// or modify time moved (or that are new) are read again. *foldersRead (may be null) says how
+// many were read. Without an index it builds one.
+QUIB_API int FILEIDXIndexUpdate(const char *volume, unsigned long long *foldersRead);
+
+enum {
+    FI_INDEX_NONE = 0,     // no index
+    FI_INDEX_READY = 1,    // a query can use it
+    FI_INDEX_DAMAGED = 2,  // present but unusable
+};
+
+typedef struct __tag_FI_INDEX_STATUS {
+    int state;                   // FI_INDEX_*
+    int building;                // 1 while a build, update or watch holds the index
+    unsigned long long entries;  // names, sub-folders included
+    unsigned long long folders;
+    unsigned long long bytes;  // the database's size on disk
+    long long built;           // seconds since the epoch; 0 unknown
+    long long updated;
+} FI_INDEX_STATUS;
+
+QUIB_API int FILEIDXIndexStatus(const char *volume, FI_INDEX_STATUS *status);
+
+// Keeps the index current until *stop becomes non-zero: an update first, then the changes the
+// kernel reports (inotify) as they happen, each applied within a second. When the kernel drops
+// events or runs out of watches it falls back to an update (once, or every second).
+QUIB_API int FILEIDXIndexWatch(const char *volume, const volatile int *stop);
 
 QUIB_END_C

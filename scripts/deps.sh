@@ -9,7 +9,7 @@ packages=(
   googletest libgtest-dev libgmock-dev libbenchmark-dev
   lighttpd curl chromium
 )
-[ "${1:-}" = "--bench" ] && packages+=(hyperfine bfs time)
+[ "${1:-}" = "--bench" ] && packages+=(hyperfine bfs time plocate)
 
 missing=()
 for p in "${packages[@]}"; do

@@ -13,4 +13,5 @@
 #include "norvo/nvoman.h"
 #include "norvo/pathinfo.h"
 #include "norvo/searchdb.h"
+#include "norvo/searchwalker.h"
 #include "norvo/subdirs.h"

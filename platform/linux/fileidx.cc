@@ -14,6 +14,7 @@
 #include "fileidx_sql.h"
 #include "fs_path.h"
 #include "vlibc_err.h"
+#include "volume_index.h"
 
 using norvo::platform::DbOwner;
 using norvo::platform::FileIdxDb;
@@ -72,27 +73,6 @@ int RunWrite(const char *dbPath, const SqlText &sql, int *changes = nullptr) {
         *changes = sqlite3_changes(db.get());
     }
     return code;
-}
-
-int SelectInto(sqlite3 *db, const SqlText &sql, FILEIDX_SELECT_CB callback, void *arg) {
-    FileIdxStatement statement;
-    if (const int code = norvo::platform::PrepareBound(db, sql, &statement)) {
-        return code;
-    }
-    auto record = std::make_unique<__tag_FI_FILE_INFO_DATA>();
-    for (;;) {
-        const int rc = sqlite3_step(statement.get());
-        if (rc == SQLITE_DONE) {
-            return QUIB_ERR_NONE;
-        }
-        if (rc != SQLITE_ROW) {
-            return norvo::platform::FileIdxCodeOf(db, rc);
-        }
-        norvo::platform::ReadRecord(statement.get(), record.get());
-        if (callback(record.get(), arg) == 0) {
-            return QUIB_ERR_NONE;
-        }
-    }
 }
 
 // Reads the hits whose rowids sql selects, in its order, in one read transaction so that the
@@ -191,10 +171,6 @@ int OutputOpen(const char *dbPath, DbOwner owner, std::unique_ptr<__tag_FI_OUTPU
     }
     *out = std::move(db);
     return QUIB_ERR_NONE;
-}
-
-std::string IndexPath(const char *volume) {
-    return std::string(volume) + "/@tmp/norvo/fileidx.db";
 }
 
 }  // namespace
@@ -363,41 +339,9 @@ int FILEIDXIsIndexEnable(const char *volume) {
         if (const int err = norvo::platform::CheckPathArgument(volume)) {
             return FILEIDX_FAIL(VLIBCErrFromErrno(err));
         }
-        struct stat st;
-        if (lstat(IndexPath(volume).c_str(), &st) != 0) {
-            return errno == ENOENT || errno == ENOTDIR ? 0 : FILEIDX_FAIL(VLIBCErrFromErrno(errno));
-        }
-        // Only root's index counts: anyone may write below a volume's temporary folder.
-        return S_ISREG(st.st_mode) && st.st_uid == 0 ? 1 : 0;
+        return norvo::platform::VolumeIndexUsable(volume) ? 1 : 0;
     });
 }
-
-namespace {
-
-struct TableGen {
-    __tag_FI_OUTPUT_DB *out;
-    FILEIDX_ROW_FILTER filter;
-    void *filterArg;
-    int code = QUIB_ERR_NONE;
-};
-
-int CopyRow(__tag_FI_FILE_INFO_DATA *record, void *arg) {
-    auto *gen = static_cast<TableGen *>(arg);
-    if (gen->filter != nullptr) {
-        std::string dir = record->realPath;
-        if (record->parentPath[0] != '\0') {
-            dir += '/';
-            dir += record->parentPath;
-        }
-        if (gen->filter(dir.c_str(), record->name, gen->filterArg) == 0) {
-            return 1;
-        }
-    }
-    gen->code = OutputInsert(gen->out, *record);
-    return gen->code == QUIB_ERR_NONE;
-}
-
-}  // namespace
 
 int FILEIDXResultGetAndTableGen(const char *volume, const __tag_FI_SQL_COND *conditions,
                                 const __tag_FI_SQL_COND *folderConditions, FILEIDX_ROW_FILTER filter,
@@ -406,32 +350,62 @@ int FILEIDXResultGetAndTableGen(const char *volume, const __tag_FI_SQL_COND *con
         if (context == nullptr || norvo::platform::CheckPathArgument(volume) != 0) {
             return FILEIDX_FAIL(QUIB_ERR_BAD_PARAMETER);
         }
-        SqlText sql;
-        sql.text = std::string("SELECT ") + norvo::platform::kFileIdxColumns + " FROM fileinfo WHERE ";
-        int code = norvo::platform::AppendWhere(conditions, &sql);
-        sql.text += " AND ";
-        if (code == QUIB_ERR_NONE) {
-            code = norvo::platform::AppendWhere(folderConditions, &sql);
-        }
-        sql.text += " ORDER BY rowid";
-        FileIdxDb index;
         std::unique_ptr<__tag_FI_OUTPUT_DB> out;
+        int code = OutputOpen(context->outputDbPath, DbOwner::kCaller, &out);
+        std::string dir;
+        auto keep = [&](const __tag_FI_FILE_INFO_DATA &record) -> int {
+            if (filter != nullptr) {
+                dir = record.realPath;
+                if (record.parentPath[0] != '\0') {
+                    dir += '/';
+                    dir += record.parentPath;
+                }
+                if (filter(dir.c_str(), record.name, context->filterArg) == 0) {
+                    return QUIB_ERR_NONE;
+                }
+            }
+            return OutputInsert(out.get(), record);
+        };
         if (code == QUIB_ERR_NONE) {
-            code = norvo::platform::OpenFileIdxDb(IndexPath(volume).c_str(), DbOwner::kRoot, &index);
-        }
-        if (code == QUIB_ERR_NONE) {
-            code = OutputOpen(context->outputDbPath, DbOwner::kCaller, &out);
-        }
-        TableGen gen{out.get(), filter, context->filterArg};
-        if (code == QUIB_ERR_NONE) {
-            code = SelectInto(index.get(), sql, CopyRow, &gen);
-        }
-        if (code == QUIB_ERR_NONE) {
-            code = gen.code;
+            code = norvo::platform::QueryVolumeIndex(volume, conditions, folderConditions, keep);
         }
         if (code == QUIB_ERR_NONE) {
             code = OutputCommit(out.get());
         }
+        return code == QUIB_ERR_NONE ? 0 : FILEIDX_FAIL(code);
+    });
+}
+
+int FILEIDXIndexBuild(const char *volume) {
+    return Guarded(-1, [&] {
+        const int code = norvo::platform::BuildVolumeIndex(volume);
+        return code == QUIB_ERR_NONE ? 0 : FILEIDX_FAIL(code);
+    });
+}
+
+int FILEIDXIndexUpdate(const char *volume, unsigned long long *foldersRead) {
+    return Guarded(-1, [&] {
+        const int code = norvo::platform::UpdateVolumeIndex(volume, foldersRead);
+        return code == QUIB_ERR_NONE ? 0 : FILEIDX_FAIL(code);
+    });
+}
+
+int FILEIDXIndexStatus(const char *volume, FI_INDEX_STATUS *status) {
+    return Guarded(-1, [&] {
+        if (status == nullptr) {
+            return FILEIDX_FAIL(QUIB_ERR_BAD_PARAMETER);
+        }
+        const int code = norvo::platform::VolumeIndexStatus(volume, status);
+        return code == QUIB_ERR_NONE ? 0 : FILEIDX_FAIL(code);
+    });
+}
+
+int FILEIDXIndexWatch(const char *volume, const volatile int *stop) {
+    return Guarded(-1, [&] {
+        if (stop == nullptr) {
+            return FILEIDX_FAIL(QUIB_ERR_BAD_PARAMETER);
+        }
+        const int code = norvo::platform::WatchVolumeIndex(volume, stop);
         return code == QUIB_ERR_NONE ? 0 : FILEIDX_FAIL(code);
     });
 }

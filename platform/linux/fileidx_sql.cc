@@ -398,6 +398,10 @@ int Open(const char *path, FileIdxDb *db) {
 
 }  // namespace
 
+bool FileIdxPathLike(std::string_view pattern, std::string_view path) {
+    return PathLikeMatch(pattern, path);
+}
+
 const char kFileIdxColumns[] =
     "name, real_path, parent_path, share, path, is_dir, size, type, crtime, ctime, atime, mtime, posix, mode, "
     "uid, gid, user_name, group_name";
@@ -464,6 +468,19 @@ int OpenFileIdxDb(const char *path, DbOwner owner, FileIdxDb *db) {
         return code;
     }
     return Open(path, db);
+}
+
+int OpenMemoryFileIdxDb(FileIdxDb *db) {
+    sqlite3 *raw = nullptr;
+    const int rc = sqlite3_open_v2(":memory:", &raw, SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE, nullptr);
+    db->reset(raw);
+    if (rc != SQLITE_OK) {
+        return FileIdxCodeOf(raw, rc);
+    }
+    if (const int code = RegisterFunctions(raw)) {
+        return code;
+    }
+    return FileIdxCodeOf(raw, sqlite3_exec(raw, kSchema, nullptr, nullptr, nullptr));
 }
 
 int AppendWhere(const __tag_FI_SQL_COND *head, SqlText *sql) {

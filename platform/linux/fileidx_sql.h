@@ -6,6 +6,7 @@
 
 #include <memory>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "fileidx.h"
@@ -30,6 +31,8 @@ enum class DbOwner {
 [[nodiscard]] int CreateFileIdxDb(const char *path);
 // Opens an existing database read-write with our functions registered. 0 and *db, or a code.
 [[nodiscard]] int OpenFileIdxDb(const char *path, DbOwner owner, FileIdxDb *db);
+// An empty result database in memory, with our functions. 0 and *db, or a code.
+[[nodiscard]] int OpenMemoryFileIdxDb(FileIdxDb *db);
 
 // A statement's text with the values to bind, in order.
 struct SqlText {
@@ -51,6 +54,9 @@ struct SqlText {
 
 // Prepares sql on db and binds its values. 0 or a code.
 [[nodiscard]] int PrepareBound(sqlite3 *db, const SqlText &sql, FileIdxStatement *out);
+
+// FI_OP_PATH_LIKE of pattern against path, as the SQL function does it.
+[[nodiscard]] bool FileIdxPathLike(std::string_view pattern, std::string_view path);
 
 // The columns of a hit in storage order, for SELECT and INSERT.
 extern const char kFileIdxColumns[];

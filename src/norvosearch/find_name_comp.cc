@@ -79,6 +79,11 @@ bool FindNameComp::operator()(const char *path, const _tag_QUIBSTAT_ &st) {
                 return true;
             }
         }
+        // A walk's paths never end in "/": their base name is tested where it lies.
+        const char *slash = strrchr(path, '/');
+        if (slash != nullptr && slash[1] != '\0') {
+            return NvoLibStrLikeCompare(pattern, slash + 1, '\\') == 1;
+        }
         norvo::CString base(BaseNameOf(path));
         return base && NvoLibStrLikeCompare(pattern, base.get(), '\\') == 1;
     });

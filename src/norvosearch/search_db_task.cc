@@ -15,6 +15,7 @@
 #include "norvo/norvosearch.h"
 #include "norvo/searchdb.h"
 #include "norvosearch/search_db_record.h"
+#include "norvosearch/search_scope.h"
 #include "norvosearch/sql_cond_text.h"
 #include "quib_user.h"
 #include "vlibc_err.h"
@@ -46,19 +47,6 @@ bool Split(const std::string &share, const std::string &path, std::string *root,
             break;
     }
     return true;
-}
-
-// The pattern of everything below the folder rest: its own "*" and "\\" are escaped, so a
-// folder named "*" reaches only its own hits, never every deeper path of the share.
-std::string Below(const std::string &rest) {
-    std::string pattern;
-    for (const char c : rest) {
-        if (c == '*' || c == '\\') {
-            pattern += '\\';
-        }
-        pattern += c;
-    }
-    return pattern + "/*";
 }
 
 bool MakeKey(const std::string &share, const std::string &path, Key *key) {
@@ -169,7 +157,8 @@ bool NvoSearchDBTask::delRecs(std::string share, std::string path) {
             return false;
         }
         __tag_FI_SQL_COND below{};
-        SetSqlCondText(below, FI_COND_PATH, FI_OP_PATH_LIKE, Below(key.rest).c_str(), &key.share, nullptr);
+        SetSqlCondText(below, FI_COND_PATH, FI_OP_PATH_LIKE, BelowPattern(key.rest).c_str(), &key.share,
+                       nullptr);
         if (FILEIDXDBDel(dbPath.c_str(), &key.path) < 0 || FILEIDXDBDel(dbPath.c_str(), &below) < 0) {
             NVO_LOG(kNorvoSearch, "%s:%d Fail to delete data in DB %s", dbPath.c_str());
             return false;
@@ -229,7 +218,8 @@ bool NvoSearchDBTask::updateFileInFolder(std::string share, std::string path, st
             return false;
         }
         __tag_FI_SQL_COND below{};
-        SetSqlCondText(below, FI_COND_PATH, FI_OP_PATH_LIKE, Below(key.rest).c_str(), &key.share, nullptr);
+        SetSqlCondText(below, FI_COND_PATH, FI_OP_PATH_LIKE, BelowPattern(key.rest).c_str(), &key.share,
+                       nullptr);
         FI_QUERY query{};
         query.where = &below;
         // Collected first: no update may run while the select is open.

@@ -249,6 +249,26 @@ std::string SessionLines() {
 std::string g_sessions;  // as the run found them
 const char kRefreshed[] = "192\\.0\\.2\\.1,alice,ID,1,[0-9]+,2,0,L\n";
 
+// A search of alice's for "a.txt" below public, initialised only or also run: whether it
+// went through, and how many hits it stored.
+bool SearchAlice(bool walk, unsigned long long *hits) {
+    std::vector<FileSearch::FindComp *> conds;
+    bool ok = FileSearch::FindFactory::createFindOp(FileSearch::FindFactory::FIND_FIELD_NAME, nullptr, "a.txt", conds);
+    {
+        FileSearch::NvoSearchWalker walker("alice", "sid", nullptr);
+        ok = ok && walker.init({"/public"}, conds) && (!walk || walker.Walk({}));
+        const FI_QUERY all{};
+        *hits = 0;
+        if (ok && FILEIDXCountGet(walker.getDBPath().c_str(), &all, hits) != 0) {
+            *hits = ~0ULL;
+        }
+    }
+    for (FileSearch::FindComp *cond : conds) {
+        delete cond;
+    }
+    return ok;
+}
+
 const Op kOps[] = {
     {"DirListing",
      [] {
@@ -522,6 +542,32 @@ const Op kOps[] = {
          return Expect(closed && ok, IndexedHits() == 1);
      },
      kPlatformSlot, [] { FreshIndexDb(false); }},
+    {"VolumeIndexBuild",  // the index whole, or the old state and no scratch file left
+     [] {
+         const bool ok = FILEIDXIndexBuild("/volume1") == 0;
+         return Expect(ok, FILEIDXIsIndexEnable("/volume1") == 1);
+     },
+     kPlatformSlot, [] { fs::remove_all("/volume1/@fileidx"); },
+     [] {
+         return std::string(fs::exists("/volume1/@fileidx/fileidx.db.new") ? "scratch left " : "") +
+                (fs::exists("/volume1/@fileidx/fileidx.db") && FILEIDXIsIndexEnable("/volume1") != 1 ? "torn index" : "");
+     }},
+    {"VolumeIndexQuery",
+     [] {
+         __tag_FI_SQL_COND name{};
+         FileSearch::setSqlCond(name, FI_COND_NAME, FI_OP_LIKE, std::string("*.IDXQ"), nullptr, nullptr);
+         FI_TABLE_GEN_CONTEXT context{kIndexDb, nullptr};
+         const bool ok = FILEIDXResultGetAndTableGen("/volume1", &name, nullptr, nullptr, &context) == 0;
+         return Expect(ok, IndexedHits() == 2);
+     },
+     kPlatformSlot,
+     [] {
+         if (!fs::exists("/volume1/@fileidx/fileidx.db")) {
+             g_app->WriteFile(kDir + "/a.idxq").WriteFile(kDir + "/b.idxq");
+             ASSERT_EQ(FILEIDXIndexBuild("/volume1"), 0);
+         }
+         FreshIndexDb(false);
+     }},
     {"IndexSelect",
      [] {
          __tag_FI_SQL_COND below{};
@@ -764,6 +810,31 @@ const Op kOps[] = {
          return Expect(true, true);
      },
      kNoSlot, [] { OpenSink(), g_app->WriteFile("/usr/quib/quibman/webman/texts/en/filemanager/filetable", "a=\"b\"\n"); }},
+    {"SearchInit",  // a task and its empty database, the folders mapped
+     [] {
+         unsigned long long hits = 0;
+         const bool ok = SearchAlice(false, &hits);
+         return Expect(ok, hits == 0);
+     },
+     kEitherSlot},
+    {"SearchWalk",
+     [] {
+         unsigned long long hits = 0;
+         const bool ok = SearchAlice(true, &hits);
+         return Expect(ok, hits == 1);
+     },
+     kEitherSlot},
+    {"SearchWalkDB",  // through the volume's index
+     [] {
+         unsigned long long hits = 0;
+         const bool ok = SearchAlice(true, &hits);
+         return Expect(ok, hits == 1);
+     },
+     kEitherSlot, [] {
+         if (FILEIDXIsIndexEnable("/volume1") != 1) {
+             ASSERT_EQ(FILEIDXIndexBuild("/volume1"), 0);
+         }
+     }},
 };
 
 // Runs op with call n failing with err for n = 1, 2, ... until a run gets through.

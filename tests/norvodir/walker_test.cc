@@ -20,11 +20,15 @@
 #include <gtest/gtest.h>
 
 #include "appliance.h"
+#include "find_oracle.h"
 #include "norvo/norvodir.h"
 
 namespace {
 
 using norvo::testing::Appliance;
+using norvo::testing::FindAs;
+using norvo::testing::FindPrune;
+using norvo::testing::TreeMaker;
 using norvo::testing::LogLine;
 
 const std::string kTop = "/volume1/public";
@@ -79,49 +83,6 @@ bool RunWalk(Order order, _enum_ignore_err_ mode, bool skipRecycle, std::vector<
     }
 }
 
-std::string Read(const std::string &path) {
-    std::ifstream in(path, std::ios::binary);
-    std::stringstream text;
-    text << in.rdbuf();
-    return text.str();
-}
-
-// Makes the tree relative to descriptors, so that it may be deeper than PATH_MAX.
-class TreeMaker {
-public:
-    explicit TreeMaker(uint32_t seed) : random_(seed) {}
-
-    void Build(int dir, int depth) {
-        static const char *const kNames[] = {"a",      "B",           "b",        ".dot",   "@eaDir",
-                                             ".DS_Store", "line\nbreak", "\xff\xfe", "sp ace", "@tmp", "Ünïcode"};
-        const int count = depth == 0 ? 24 : std::uniform_int_distribution<int>(0, 6)(random_);
-        for (int i = 0; i < count; ++i) {
-            const std::string name = std::string(kNames[Pick(std::size(kNames))]) + (Pick(2) ? std::to_string(Pick(3)) : "");
-            switch (Pick(depth < 4 ? 6 : 3)) {
-            case 0:
-                close(openat(dir, name.c_str(), O_CREAT | O_WRONLY, 0644));
-                break;
-            case 1:
-                (void)!symlinkat(Pick(2) ? ".." : "gone", dir, name.c_str());
-                break;
-            case 2:
-                (void)!symlinkat("/volume1/photo", dir, name.c_str());
-                break;
-            default:
-                if (mkdirat(dir, name.c_str(), 0755) == 0) {
-                    const int child = openat(dir, name.c_str(), O_RDONLY | O_DIRECTORY);
-                    Build(child, depth + 1);
-                    close(child);
-                }
-            }
-        }
-    }
-
-private:
-    size_t Pick(size_t n) { return std::uniform_int_distribution<size_t>(0, n - 1)(random_); }
-    std::mt19937 random_;
-};
-
 void MakeChain(const std::string &top, int depth, const char *name) {
     int dir = open(top.c_str(), O_RDONLY | O_DIRECTORY);
     for (int i = 0; i < depth; ++i) {
@@ -134,22 +95,11 @@ void MakeChain(const std::string &top, int depth, const char *name) {
     close(dir);
 }
 
-// What find reports for alice, without the names the platform hides (and their subtrees), the
-// recycle bin when asked, and what lies in the folder alice may read but not enter (find lists
-// those names; a walk passes such a folder over).
+// What find reports for alice (see FindAs).
 std::set<Event> FindAsAlice(Appliance &app, bool skipRecycle) {
-    const std::string prune = std::string("\\( -name @eaDir -o -name @tmp -o -name .DS_Store -o -name @sharebin ") +
-                              "-o -name '#snapshot'" + (skipRecycle ? " -o -path '" + kTop + "/#recycle'" : "") +
-                              " \\) -prune -o -printf '%y\\t%h\\t%p\\0'";
-    const std::string command = "find -P " + kTop + " -mindepth 1 " + prune + " >/tmp/find.out 2>/dev/null";
-    app.RunAs("alice", [&] { return system(command.c_str()) == -1 ? 1 : 0; });
     std::set<Event> found;
-    std::istringstream in(Read("/tmp/find.out"));
-    for (std::string record; std::getline(in, record, '\0');) {
-        const size_t tab = record.find('\t', 2);
-        if (record.substr(2, tab - 2) != kTop + "/read-only") {
-            found.insert({"pre", record[0], record.substr(tab + 1)});
-        }
+    for (const std::string &r : FindAs(app, "alice", kTop, FindPrune(kTop, skipRecycle), "", "%y\\t%p")) {
+        found.insert({"pre", r[0], r.substr(2)});
     }
     return found;
 }
@@ -187,7 +137,7 @@ TEST(Walker, ReportsWhatFindReportsForTheUser) {
                 });
                 ASSERT_EQ(result, 0);
                 std::vector<Event> events;
-                std::istringstream in(Read("/tmp/walk.out"));
+                std::istringstream in(norvo::testing::ReadFile("/tmp/walk.out"));
                 for (std::string phase, type, real; std::getline(in, phase, '\0') && std::getline(in, type, '\0') &&
                                                     std::getline(in, real, '\0');) {
                     events.push_back({phase, type[0], real});

@@ -182,38 +182,6 @@ TEST_F(FileIdx, ChainsSelectWhatTheConditionsAccept) {
     EXPECT_GT(informative, queries.size() / 2);
 }
 
-// The SQL LIKE is the name matcher on generated pairs, SQLite's own wildcards included.
-TEST_F(FileIdx, LikeIsTheNameMatcher) {
-    std::mt19937 random(5);
-    const std::vector<std::string> pieces{"a", "A", "é", "É", "ß", "ss", "*", "?", "%", "_", "\\", "\n", "\xff", "\xc3", "\xe2\x82", "/"};
-    const auto text = [&](int most) {
-        std::string s;
-        for (int n = static_cast<int>(random() % most); n > 0; --n) {
-            s += pieces[random() % pieces.size()];
-        }
-        return s;
-    };
-    std::vector<FI_FILE_INFO_DATA> hits;
-    std::vector<std::string> names;
-    for (int i = 0; i < 300; ++i) {
-        names.push_back(text(5));
-        hits.push_back(Hit("s", std::to_string(i)));
-        snprintf(hits.back().name, sizeof hits.back().name, "%s", names.back().c_str());
-    }
-    Insert(hits);
-    for (int p = 0; p < 300; ++p) {
-        const std::string pattern = text(4);
-        std::vector<std::string> expected;
-        for (size_t i = 0; i < names.size(); ++i) {
-            if (NvoLibStrLikeCompare(pattern.c_str(), names[i].c_str(), '\\') == 1) {
-                expected.push_back("s:" + std::to_string(i));
-            }
-        }
-        __tag_FI_SQL_COND like = Cond(FI_COND_NAME, FI_OP_LIKE, pattern);
-        ASSERT_EQ(Where(&like), expected) << pattern;
-    }
-}
-
 // The chain's shape decides, not the order of records: alternatives through orNext, and an
 // andNext anywhere among them holds for the whole group. Paths match by components.
 TEST_F(FileIdx, ChainShapesAndPaths) {
@@ -409,37 +377,6 @@ TEST_F(FileIdx, OutputBatchesCommitAsTheyFill) {
     ASSERT_EQ(FILEIDXOutputDBInsert(out, &last), 0);
     ASSERT_EQ(FILEIDXOutputDBClose(out), 0);
     EXPECT_EQ(count(), FILEIDX_OUTPUT_BATCH + 4);
-}
-
-// The volume index: root's own file only; rows copied through the filter into the task database.
-TEST_F(FileIdx, VolumeIndexCopiesFilteredRows) {
-    EXPECT_EQ(FILEIDXIsIndexEnable("/volume1"), 0);
-    const std::string index = "/volume1/@tmp/norvo/fileidx.db";
-    app.MakeDir("/volume1/@tmp/norvo", "root", 0777);
-    ASSERT_EQ(FILEIDXDBCreate(index.c_str()), 0);
-    std::vector<FI_FILE_INFO_DATA> rows;
-    for (const char *path : {"a/x.txt", "a/y.png", "b/x.txt", "a/deny/x.txt"}) {
-        rows.push_back(Hit("public", path));
-    }
-    ASSERT_EQ(FILEIDXDBInsert(index.c_str(), rows.data(), static_cast<int>(rows.size())), 0);
-    EXPECT_EQ(FILEIDXIsIndexEnable("/volume1"), 1);
-    __tag_FI_SQL_COND name = Cond(FI_COND_NAME, FI_OP_LIKE, "*.TXT");
-    __tag_FI_SQL_COND folders[2] = {Cond(FI_COND_PATH, FI_OP_PATH_LIKE, "a/*"), Cond(FI_COND_PATH, FI_OP_PATH_LIKE, "b/*")};
-    folders[0].orNext = &folders[1];
-    std::vector<std::string> asked;
-    FI_TABLE_GEN_CONTEXT context{kDb.c_str(), &asked};
-    const auto filter = [](const char *dir, const char *file, void *arg) {
-        static_cast<std::vector<std::string> *>(arg)->push_back(std::string(dir) + "|" + file);
-        return strstr(dir, "deny") == nullptr ? 1 : 0;
-    };
-    ASSERT_EQ(FILEIDXResultGetAndTableGen("/volume1", &name, folders, filter, &context), 0);
-    EXPECT_EQ(asked, (std::vector<std::string>{"/volume1/public/a|x.txt", "/volume1/public/b|x.txt",
-                                               "/volume1/public/a/deny|x.txt"}));
-    EXPECT_EQ(Where(nullptr), (std::vector<std::string>{"public:a/x.txt", "public:b/x.txt"}));
-    ASSERT_EQ(chown(index.c_str(), app.Uid("bob"), 0), 0);
-    EXPECT_EQ(FILEIDXIsIndexEnable("/volume1"), 0);
-    EXPECT_EQ(OUTCOME(FILEIDXResultGetAndTableGen("/volume1", nullptr, nullptr, nullptr, &context)),
-              Failed(QUIB_ERR_ACCESS_DENIED));
 }
 
 // Databases are made 0600 for their creator, never through a link; files that are not ours,

@@ -238,6 +238,27 @@ TEST_F(NorvoCliTest, TasksStartWaitKillAndList) {
     EXPECT_EQ(RunNorvo({"tasks", "--user", "alice", "frob"}).exitStatus, 2);
 }
 
+// norvo search: a task of the store that ends with its hit count; search-results pages the
+// hits for their owner only.
+TEST_F(NorvoCliTest, SearchIsATaskWhoseHitsPageForTheirOwner) {
+    appliance_.WriteFile("/volume1/photo/report-a.txt", "12345", "alice").WriteFile("/volume1/public/Report.pdf");
+    appliance_.WriteFile("/volume1/public/old/report-b.txt", "1234", "bob");
+    const Json::Value search = RunJson({"search", "--user", "bob", "--name", "report", "--size", "greater:2", "/photo",
+                                        "/public", "/secret"})["data"];
+    EXPECT_EQ(search["hits"].asUInt64(), 2u);
+    const std::string id = search["task"].asString();
+    const Json::Value record = RunJson({"tasks", "--user", "bob", "show", "Tovana_" + id})["data"];
+    EXPECT_EQ(record["progress"].asDouble(), 1.0);
+    EXPECT_TRUE(record["finished"].asBool());
+    EXPECT_EQ(record["data"]["volume"].asString(), "/volume1");
+    Strings paths;
+    const Json::Value page = RunJson({"search-results", "--user", "bob", "--task", id, "--sort", "size"});
+    for (const Json::Value &hit : page["data"]["hits"])
+        paths.push_back(hit["share"].asString() + ":" + hit["path"].asString());
+    EXPECT_EQ(paths, (Strings{"public:old/report-b.txt", "photo:report-a.txt"}));
+    EXPECT_EQ(RunNorvo({"search-results", "--user", "alice", "--task", id}).exitStatus, 1);
+}
+
 TEST_F(NorvoCliTest, UsageErrorsExitTwoAndSayWhy) {
     const std::vector<std::pair<Strings, std::string>> cases = {
         {{}, "norvo: no command given"},
@@ -270,6 +291,8 @@ TEST_F(NorvoCliTest, UsageErrorsExitTwoAndSayWhy) {
         {{"walk", "--user", "alice", "--first-only", "/photo"}, "norvo walk: --first-only goes with --order"},
         {{"walk", "--user", "alice", "--ignore", "some", "/photo"}, "norvo walk: --ignore wants permission"},
         {{"walk", "--user", "alice", "/"}, "norvo walk: PATH must be a folder's user-visible path"},
+        {{"search", "--user", "alice", "--name", "a", "--size", "big", "/photo"}, "norvo search: --size wants OP:NUMBER"},
+        {{"search", "--user", "alice", "--name", "a", "--type", "link", "/photo"}, "norvo search: --type wants file or dir"},
     };
     for (const auto &[args, message] : cases) {
         Strings withJson = args;

@@ -14,6 +14,7 @@
 #include "norvo/searchdb.h"
 #include "number.h"
 #include "output.h"
+#include "search_hits.h"
 #include "text_safe.h"
 #include "vlibc_err.h"
 
@@ -64,7 +65,9 @@ int PrintHit(FI_FILE_INFO_DATA *r, void *arg) {
     return 1;
 }
 
-int List(const Invocation &inv, const NvoSearchDBTask &task) {
+}  // namespace
+
+int ListTaskHits(const Invocation &inv, const NvoSearchDBTask &task) {
     int offset = 0, limit = 50;
     if ((inv.Has("offset") && !ParseNumber(*inv.Value("offset"), 0, 1 << 30, &offset)) ||
         (inv.Has("limit") && !ParseNumber(*inv.Value("limit"), 0, 1 << 30, &limit))) {
@@ -94,8 +97,6 @@ int List(const Invocation &inv, const NvoSearchDBTask &task) {
     text.Row("total", std::to_string(total));
     return ReportSuccess(inv, data, text);
 }
-
-}  // namespace
 
 int RunSearchDb(const Invocation &inv) {
     const std::string &action = inv.arguments[0];
@@ -142,7 +143,7 @@ int RunSearchDb(const Invocation &inv) {
         return ReportFailure(inv, 408, "no such task of " + userName + " on that volume");
     }
     if (action == "list") {
-        return List(inv, *task);
+        return ListTaskHits(inv, *task);
     }
     bool ok = true;
     if (action == "remove") {

@@ -240,6 +240,57 @@ std::vector<CommandDef> MakeCommands() {
          {{"ACTION", "create, insert, list, delete or remove"},
           {"PATH...", "real paths for insert and delete"}},
          RunSearchDb},
+        {"search",
+         "search folders as a user, by walking or through the volume index",
+         "Searches the user-visible FOLDERs as USER (initgroups, setegid, seteuid: needs root) for\n"
+         "entries that meet every condition given: --name (comma-separated terms, each a substring\n"
+         "unless it holds * or ?; a term in double quotes must match on its own), --ext, --type,\n"
+         "--owner, --group, --mtime, --atime (before:T or after:T, T in seconds since the epoch)\n"
+         "and --size (equal:B, less:B or greater:B; equal allows a twentieth either way). A volume\n"
+         "with a ready index is searched through it, the others by walking; either way USER finds\n"
+         "only what USER may list, never hidden names nor recycle bins. The search is a task of\n"
+         "the task store (\"Tovana_\" and its id; \"progress\", and \"data\" with the volume and\n"
+         "the hits); its hits are kept in a result database that search-results pages. Ctrl-C\n"
+         "stops it and keeps the hits found so far. Prints the task id and the number of hits.",
+         {{"user", "USER", true, kUserHelp},
+          {"sid", "SID", false, "the login sid (default: norvo; domain and directory accounts need theirs)"},
+          {"name", "TERMS", true, "name terms, comma-separated"},
+          {"ext", "EXTS", false, "extensions, comma-separated (files only)"},
+          {"type", "WORD", false, "file or dir"},
+          {"owner", "USER", false, "the owner's name"},
+          {"group", "GROUP", false, "the group's name"},
+          {"mtime", "OP:T", false, "modified before:T or after:T"},
+          {"atime", "OP:T", false, "accessed before:T or after:T"},
+          {"size", "OP:B", false, "equal:B, less:B or greater:B bytes"},
+          {"current-dir-only", nullptr, false, "the folders' own entries, nothing deeper"}},
+         {{"FOLDER...", "user-visible folders: /share/dir, /home/..."}},
+         RunSearch},
+        {"search-results",
+         "a page of a search's hits",
+         "Pages the hits of USER's search TASK (the id search printed), as USER: --offset,\n"
+         "--limit (default 50), --sort KEY (name, size, mtime, crtime, ctime, atime, user, group,\n"
+         "posix, type, ppath) with --desc. A search still running shows the hits so far.",
+         {{"user", "USER", true, kUserHelp},
+          {"task", "ID", true, "the search's task id"},
+          {"offset", "N", false, "the first hit of the page (default 0)"},
+          {"limit", "N", false, "the page's size (default 50)"},
+          {"sort", "KEY", false, "the sort key"},
+          {"desc", nullptr, false, "with --sort, descending"}},
+         {},
+         RunSearchResults},
+        {"index",
+         "a volume's file index: build, update, status, watch (root)",
+         "Works on the file index of VOLUME (/volume1), which searches use instead of walking\n"
+         "when it is ready. ACTION is one of:\n"
+         "  build    walks the whole volume into a new index that replaces the old one when done\n"
+         "  update   reads again only the folders whose times moved, and new ones\n"
+         "  status   ready, damaged or none; entries, folders, size, when built and updated\n"
+         "  watch    an update, then every change as it happens (inotify), until Ctrl-C or\n"
+         "           SIGTERM; a file created is found within a second\n"
+         "Without watch, the index is as fresh as its last build or update.",
+         {},
+         {{"ACTION", "build, update, status or watch"}, {"VOLUME", "the volume: /volume1, ..."}},
+         RunIndex},
         {"upload",
          "an upload's last steps: check the target, move the file in, log it",
          "Does what the upload program does once the file has arrived: CheckFile for DEST (a\n"

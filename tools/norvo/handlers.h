@@ -20,5 +20,10 @@ int RunTasks(const Invocation &inv);       // cmd_tasks.cc
 int RunSearchDb(const Invocation &inv);    // cmd_search_db.cc
 int RunUpload(const Invocation &inv);      // cmd_upload.cc
 int RunXferlog(const Invocation &inv);     // cmd_upload.cc
+int RunIndex(const Invocation &inv);       // cmd_index.cc
+
+// cmd_search.cc
+int RunSearch(const Invocation &inv);
+int RunSearchResults(const Invocation &inv);
 
 }  // namespace norvo::cli
