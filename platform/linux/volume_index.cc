@@ -1,6 +1,7 @@
 // The volume index: one row per folder (its place, its identity and times, and the names in it
-// as one blob) and a contentless FTS5 trigram table over the names, keyed by folder id and
-// position. A query takes candidates by name and folder from it and looks at each candidate
+// as one blob) and a contentless FTS5 trigram table over the names. A folder's names have the
+// consecutive keys first .. first + count - 1 in the trigram table, new ones each time the folder
+// is read: dense keys keep the trigram lists' deltas small. A query takes candidates by name and folder from it and looks at each candidate
 // live, so what it returns is what a walk would find now, less what the index has not seen.
 #include "volume_index.h"
 
@@ -43,10 +44,9 @@ constexpr char kIndexDir[] = "@fileidx";
 constexpr char kIndexName[] = "fileidx.db";
 constexpr char kScratchName[] = "fileidx.db.new";
 constexpr char kLockName[] = "fileidx.lock";
-constexpr char kVersion[] = "1";
-// An entry's key in the trigram table: folder id above, position in the folder below.
-constexpr int kPositionBits = 24;
-constexpr int64_t kPositionMask = (int64_t{1} << kPositionBits) - 1;
+constexpr char kVersion[] = "2";
+// The most names a folder keeps (more are left out of the index).
+constexpr size_t kMaxNames = 1 << 24;
 constexpr int kMaxDepth = 1000;  // a descriptor per level is held while walking
 constexpr int kRootId = 1;
 
@@ -54,7 +54,7 @@ constexpr char kIndexSchema[] =
     "CREATE TABLE meta(key TEXT PRIMARY KEY, value) WITHOUT ROWID;"
     "CREATE TABLE folders(id INTEGER PRIMARY KEY, parent INTEGER NOT NULL, name BLOB NOT NULL, "
     "dev INTEGER NOT NULL, ino INTEGER NOT NULL, ctime INTEGER NOT NULL, mtime INTEGER NOT NULL, "
-    "names BLOB NOT NULL);"
+    "first INTEGER NOT NULL, count INTEGER NOT NULL, names BLOB NOT NULL);"
     "CREATE VIRTUAL TABLE names USING fts5(name, content='', detail='none', columnsize=0, "
     "tokenize='trigram case_sensitive 1');";
 
@@ -107,14 +107,20 @@ std::string MatchQuery(const std::vector<std::string> &trigrams) {
     return query;
 }
 
+// A folder's names, sorted, front-coded: for each, one byte of the length it shares with the
+// one before (names are at most 255 bytes), the rest of it, and a NUL.
 std::vector<std::string> SplitNames(const void *blob, int size) {
     std::vector<std::string> names;
     const char *p = static_cast<const char *>(blob);
     const char *end = p + (size > 0 ? size : 0);
+    std::string previous;
     while (p < end) {
+        const size_t shared = std::min(static_cast<size_t>(static_cast<unsigned char>(*p++)), previous.size());
         const char *nul = static_cast<const char *>(memchr(p, '\0', static_cast<size_t>(end - p)));
         const char *stop = nul == nullptr ? end : nul;
-        names.emplace_back(p, stop);
+        previous.resize(shared);
+        previous.append(p, stop);
+        names.push_back(previous);
         p = stop + 1;
     }
     return names;
@@ -122,9 +128,19 @@ std::vector<std::string> SplitNames(const void *blob, int size) {
 
 std::string JoinNames(const std::vector<std::string> &names) {
     std::string blob;
+    const std::string *previous = nullptr;
     for (const std::string &n : names) {
-        blob += n;
+        size_t shared = 0;
+        if (previous != nullptr) {
+            const size_t most = std::min({previous->size(), n.size(), size_t{255}});
+            while (shared < most && (*previous)[shared] == n[shared]) {
+                ++shared;
+            }
+        }
+        blob += static_cast<char>(shared);
+        blob.append(n, shared, std::string::npos);
         blob += '\0';
+        previous = &n;
     }
     return blob;
 }
@@ -208,8 +224,8 @@ int ReadEntries(int fd, bool top, std::vector<Entry> *out) {
         }
     }
     std::sort(out->begin(), out->end(), [](const Entry &a, const Entry &b) { return a.name < b.name; });
-    if (out->size() > static_cast<size_t>(kPositionMask)) {
-        out->resize(static_cast<size_t>(kPositionMask));
+    if (out->size() > kMaxNames) {
+        out->resize(kMaxNames);
     }
     return 0;
 }
@@ -498,7 +514,7 @@ private:
         }
         {
             Statement s;
-            if (const int code = Prepare(db.get(), "SELECT id, parent, name FROM folders", &s)) {
+            if (const int code = Prepare(db.get(), "SELECT id, parent, name, first, count FROM folders", &s)) {
                 return code;
             }
             int rc;
@@ -507,8 +523,14 @@ private:
                 f.parent = sqlite3_column_int64(s.get(), 1);
                 f.name.assign(static_cast<const char *>(sqlite3_column_blob(s.get(), 2)),
                               static_cast<size_t>(sqlite3_column_bytes(s.get(), 2)));
-                folders_.emplace(sqlite3_column_int64(s.get(), 0), std::move(f));
+                const int64_t id = sqlite3_column_int64(s.get(), 0);
+                const int64_t count = sqlite3_column_int64(s.get(), 4);
+                if (count > 0) {
+                    ranges_.push_back({sqlite3_column_int64(s.get(), 3), count, id});
+                }
+                folders_.emplace(id, std::move(f));
             }
+            std::sort(ranges_.begin(), ranges_.end());
             if (rc != SQLITE_DONE) {
                 return FileIdxCodeOf(db.get(), rc);
             }
@@ -559,7 +581,8 @@ private:
             int rc;
             while ((rc = sqlite3_step(match.get())) == SQLITE_ROW) {
                 const int64_t key = sqlite3_column_int64(match.get(), 0);
-                const auto f = folders_.find(key >> kPositionBits);
+                const Range *r = RangeOf(key);
+                const auto f = r == nullptr ? folders_.end() : folders_.find(r->id);
                 if (f != folders_.end() && f->second.relevant) {
                     keys.push_back(key);
                 }
@@ -572,19 +595,34 @@ private:
         keys.erase(std::unique(keys.begin(), keys.end()), keys.end());
         int64_t loaded = -1;
         for (const int64_t key : keys) {
-            const int64_t id = key >> kPositionBits;
+            const Range &r = *RangeOf(key);
+            const int64_t id = r.id;
             if (id != loaded) {
                 if (const int code = namesOf(id, &list)) {
                     return code;
                 }
                 loaded = id;
             }
-            const size_t position = static_cast<size_t>(key & kPositionMask);
+            const size_t position = static_cast<size_t>(key - r.first);
             if (position < list.size()) {
                 candidates_[id].emplace(static_cast<int64_t>(position), list[position]);
             }
         }
         return QUIB_ERR_NONE;
+    }
+
+    struct Range {
+        int64_t first, count, id;
+        bool operator<(const Range &o) const { return first < o.first; }
+    };
+    // The folder whose names a trigram table key stands for; null for none.
+    const Range *RangeOf(int64_t key) const {
+        auto it = std::upper_bound(ranges_.begin(), ranges_.end(), Range{key, 0, 0});
+        if (it == ranges_.begin()) {
+            return nullptr;
+        }
+        --it;
+        return key < it->first + it->count ? &*it : nullptr;
     }
 
     // The share and share-relative path of a folder, and whether the plan lets rows in it.
@@ -859,6 +897,7 @@ private:
     Plan plan_;
     std::vector<Share> shares_;
     std::unordered_map<int64_t, QueryFolder> folders_;
+    std::vector<Range> ranges_;  // by first key
     std::map<int64_t, std::map<int64_t, std::string>> candidates_;
     FileDescriptor volumeFd_;
     std::unordered_map<int64_t, FileDescriptor> fds_;
@@ -890,7 +929,7 @@ public:
     int Prepare() {
         int code = platform::Prepare(db_,
                                      "INSERT OR REPLACE INTO folders(id, parent, name, dev, ino, ctime, mtime, "
-                                     "names) VALUES(?,?,?,?,?,?,?,?)",
+                                     "first, count, names) VALUES(?,?,?,?,?,?,?,?,?,?)",
                                      &putFolder_);
         if (code == QUIB_ERR_NONE) {
             code = platform::Prepare(db_, "INSERT INTO names(rowid, name) VALUES(?, ?)", &addName_);
@@ -899,7 +938,7 @@ public:
             code = platform::Prepare(db_, "INSERT INTO names(names, rowid, name) VALUES('delete', ?, ?)", &delName_);
         }
         if (code == QUIB_ERR_NONE) {
-            code = platform::Prepare(db_, "SELECT names FROM folders WHERE id = ?", &getNames_);
+            code = platform::Prepare(db_, "SELECT first, names FROM folders WHERE id = ?", &getNames_);
         }
         if (code == QUIB_ERR_NONE) {
             code = platform::Prepare(db_, "DELETE FROM folders WHERE id = ?", &delFolder_);
@@ -909,7 +948,7 @@ public:
 
     int Load() {
         Statement s;
-        if (const int code = platform::Prepare(db_, "SELECT id, parent, name, dev, ino, ctime, mtime FROM folders",
+        if (const int code = platform::Prepare(db_, "SELECT id, parent, name, dev, ino, ctime, mtime, first + count FROM folders",
                                                &s)) {
             return code;
         }
@@ -926,6 +965,7 @@ public:
             k.mtime = sqlite3_column_int64(s.get(), 6);
             known_[id] = std::move(k);
             nextId_ = std::max(nextId_, id + 1);
+            nextKey_ = std::max<int64_t>(nextKey_, sqlite3_column_int64(s.get(), 7));
         }
         if (rc != SQLITE_DONE) {
             return FileIdxCodeOf(db_, rc);
@@ -999,11 +1039,13 @@ public:
         k.ino = static_cast<int64_t>(st.st_ino);
         k.ctime = Nanos(st.st_ctim);
         k.mtime = Nanos(st.st_mtim);
-        if (const int code = PutFolder(id, k, JoinNames(names))) {
+        const int64_t first = nextKey_;
+        nextKey_ += static_cast<int64_t>(names.size());
+        if (const int code = PutFolder(id, k, first, static_cast<int64_t>(names.size()), JoinNames(names))) {
             return code;
         }
         for (size_t i = 0; i < names.size(); ++i) {
-            if (const int code = AddName((id << kPositionBits) | static_cast<int64_t>(i), names[i])) {
+            if (const int code = AddName(first + static_cast<int64_t>(i), names[i])) {
                 return code;
             }
         }
@@ -1101,7 +1143,7 @@ public:
     bool shallow = false;  // Read leaves known sub-folders that are still the same alone
 
 private:
-    int PutFolder(int64_t id, const Known &k, const std::string &names) {
+    int PutFolder(int64_t id, const Known &k, int64_t first, int64_t count, const std::string &names) {
         sqlite3_stmt *s = putFolder_.get();
         sqlite3_reset(s);
         sqlite3_bind_int64(s, 1, id);
@@ -1111,7 +1153,9 @@ private:
         sqlite3_bind_int64(s, 5, k.ino);
         sqlite3_bind_int64(s, 6, k.ctime);
         sqlite3_bind_int64(s, 7, k.mtime);
-        sqlite3_bind_blob(s, 8, names.data(), static_cast<int>(names.size()), SQLITE_STATIC);
+        sqlite3_bind_int64(s, 8, first);
+        sqlite3_bind_int64(s, 9, count);
+        sqlite3_bind_blob(s, 10, names.data(), static_cast<int>(names.size()), SQLITE_STATIC);
         return RunToEnd(s);
     }
 
@@ -1134,13 +1178,14 @@ private:
         if (rc != SQLITE_ROW) {
             return FileIdxCodeOf(db_, rc);
         }
+        const int64_t first = sqlite3_column_int64(getNames_.get(), 0);
         const std::vector<std::string> names =
-            SplitNames(sqlite3_column_blob(getNames_.get(), 0), sqlite3_column_bytes(getNames_.get(), 0));
+            SplitNames(sqlite3_column_blob(getNames_.get(), 1), sqlite3_column_bytes(getNames_.get(), 1));
         sqlite3_reset(getNames_.get());
         for (size_t i = 0; i < names.size(); ++i) {
             const std::string text = IndexText(names[i]);
             sqlite3_reset(delName_.get());
-            sqlite3_bind_int64(delName_.get(), 1, (id << kPositionBits) | static_cast<int64_t>(i));
+            sqlite3_bind_int64(delName_.get(), 1, first + static_cast<int64_t>(i));
             sqlite3_bind_text(delName_.get(), 2, text.data(), static_cast<int>(text.size()), SQLITE_STATIC);
             if (const int code = RunToEnd(delName_.get())) {
                 return code;
@@ -1153,6 +1198,7 @@ private:
     Statement putFolder_, addName_, delName_, getNames_, delFolder_;
     std::unordered_map<int64_t, Known> known_;
     int64_t nextId_ = kRootId + 1;
+    int64_t nextKey_ = 1;  // the trigram table's next free key
 };
 
 int SetMeta(sqlite3 *db, const char *key, const std::string &value) {
@@ -1265,7 +1311,8 @@ int BuildLocked(Upkeep &u) {
             code = SetMeta(db.get(), "version", kVersion);
         }
         if (code == QUIB_ERR_NONE) {
-            code = Exec(db.get(), "COMMIT; INSERT INTO names(names) VALUES('optimize'); PRAGMA journal_mode=DELETE;");
+            // One merged trigram index, the pages it left behind given back.
+            code = Exec(db.get(), "COMMIT; INSERT INTO names(names) VALUES('optimize'); VACUUM; PRAGMA journal_mode=DELETE;");
         }
         if (code == QUIB_ERR_NONE) {
             code = CodeOfSqlite(sqlite3_close(db.release()));
@@ -1447,20 +1494,12 @@ int VolumeIndexStatus(const char *volume, FI_INDEX_STATUS *status) {
         return QUIB_ERR_NONE;
     }
     Statement s;
-    if (Prepare(db.get(), "SELECT names FROM folders", &s) != QUIB_ERR_NONE) {
+    if (Prepare(db.get(), "SELECT count(*), total(count) FROM folders", &s) != QUIB_ERR_NONE ||
+        sqlite3_step(s.get()) != SQLITE_ROW) {
         return QUIB_ERR_NONE;
     }
-    unsigned long long folders = 0, entries = 0;
-    int rc;
-    while ((rc = sqlite3_step(s.get())) == SQLITE_ROW) {
-        ++folders;
-        const char *blob = static_cast<const char *>(sqlite3_column_blob(s.get(), 0));
-        entries += static_cast<unsigned long long>(
-            std::count(blob, blob + sqlite3_column_bytes(s.get(), 0), '\0'));
-    }
-    if (rc != SQLITE_DONE) {
-        return QUIB_ERR_NONE;
-    }
+    const auto folders = static_cast<unsigned long long>(sqlite3_column_int64(s.get(), 0));
+    const auto entries = static_cast<unsigned long long>(sqlite3_column_double(s.get(), 1));
     Statement m;
     if (Prepare(db.get(), "SELECT key, value FROM meta", &m) == QUIB_ERR_NONE) {
         while (sqlite3_step(m.get()) == SQLITE_ROW) {
