@@ -109,12 +109,12 @@ std::string MatchQuery(const std::vector<std::string> &trigrams) {
 
 // A folder's names, sorted, front-coded: for each, one byte of the length it shares with the
 // one before (names are at most 255 bytes), the rest of it, and a NUL.
-std::vector<std::string> SplitNames(const void *blob, int size) {
+std::vector<std::string> SplitNames(const void *blob, int size, size_t most = SIZE_MAX) {
     std::vector<std::string> names;
     const char *p = static_cast<const char *>(blob);
     const char *end = p + (size > 0 ? size : 0);
     std::string previous;
-    while (p < end) {
+    while (p < end && names.size() < most) {
         const size_t shared = std::min(static_cast<size_t>(static_cast<unsigned char>(*p++)), previous.size());
         const char *nul = static_cast<const char *>(memchr(p, '\0', static_cast<size_t>(end - p)));
         const char *stop = nul == nullptr ? end : nul;
@@ -425,7 +425,9 @@ struct Share {
 struct QueryFolder {
     int64_t parent;
     std::string name;
-    int share = -2;                      // -2 unknown, -1 outside every share
+    int share = -2;                      // -2 not placed yet, -1 outside every share
+    bool reachable = false;              // its parents lead to the volume
+    std::vector<std::string> full;       // components below the volume
     std::vector<std::string> path;       // components below the share
     bool relevant = false;
 };
@@ -484,15 +486,14 @@ public:
         if (const int err = OpenDirNoFollow(volume_, O_PATH, &volumeFd_)) {
             return VLIBCErrFromErrno(err);
         }
-        for (const auto &[folder, names] : candidates_) {
-            for (const auto &[position, name] : names) {
-                (void)position;
-                if (const int code = Candidate(folder, name)) {
-                    return code;
-                }
-            }
-            if (fds_.size() > 1024) {
+        int64_t previous = -1;
+        for (const Candidate &c : candidates_) {
+            if (c.folder != previous && fds_.size() > 1024) {
                 fds_.clear();  // folders come in walk order: their ancestors stay useful a while
+            }
+            previous = c.folder;
+            if (const int code = Look(c.folder, c.name)) {
+                return code;
             }
         }
         return Flush();
@@ -506,64 +507,77 @@ private:
         if (const int code = OpenIndex(volume_.c_str(), &db)) {
             return code;
         }
+        const ScopeExit done([this] { folderRow_.reset(); });
         if (const int code = Exec(db.get(), "BEGIN")) {
             return code;
         }
         if (const int code = CheckReady(db.get())) {
             return code;
         }
+        // Every folder when every name is a candidate; else the key ranges only, and the
+        // folders of the candidates with their parents one by one.
         {
             Statement s;
-            if (const int code = Prepare(db.get(), "SELECT id, parent, name, first, count FROM folders", &s)) {
+            if (const int code = Prepare(db.get(),
+                                         plan_.namesKnown ? "SELECT id, 0, '', first, count FROM folders WHERE count > 0"
+                                                          : "SELECT id, parent, name, first, count FROM folders",
+                                         &s)) {
                 return code;
             }
             int rc;
             while ((rc = sqlite3_step(s.get())) == SQLITE_ROW) {
-                QueryFolder f;
-                f.parent = sqlite3_column_int64(s.get(), 1);
-                f.name.assign(static_cast<const char *>(sqlite3_column_blob(s.get(), 2)),
-                              static_cast<size_t>(sqlite3_column_bytes(s.get(), 2)));
                 const int64_t id = sqlite3_column_int64(s.get(), 0);
                 const int64_t count = sqlite3_column_int64(s.get(), 4);
                 if (count > 0) {
                     ranges_.push_back({sqlite3_column_int64(s.get(), 3), count, id});
                 }
-                folders_.emplace(id, std::move(f));
+                if (!plan_.namesKnown) {
+                    QueryFolder f;
+                    f.parent = sqlite3_column_int64(s.get(), 1);
+                    f.name.assign(static_cast<const char *>(sqlite3_column_blob(s.get(), 2)),
+                                  static_cast<size_t>(sqlite3_column_bytes(s.get(), 2)));
+                    folders_.emplace(id, std::move(f));
+                }
             }
-            std::sort(ranges_.begin(), ranges_.end());
             if (rc != SQLITE_DONE) {
                 return FileIdxCodeOf(db.get(), rc);
             }
+            std::sort(ranges_.begin(), ranges_.end());
         }
-        for (auto &[id, f] : folders_) {
-            Place(id);
+        if (const int code = Prepare(db.get(), "SELECT parent, name FROM folders WHERE id = ?", &folderRow_)) {
+            return code;
         }
         Statement names;
         if (const int code = Prepare(db.get(), "SELECT names FROM folders WHERE id = ?", &names)) {
             return code;
         }
-        auto namesOf = [&](int64_t id, std::vector<std::string> *out) -> int {
+        auto namesOf = [&](int64_t id, size_t most, std::vector<std::string> *out) -> int {
             sqlite3_reset(names.get());
             sqlite3_bind_int64(names.get(), 1, id);
             const int rc = sqlite3_step(names.get());
+            out->clear();
             if (rc == SQLITE_ROW) {
-                *out = SplitNames(sqlite3_column_blob(names.get(), 0), sqlite3_column_bytes(names.get(), 0));
+                *out = SplitNames(sqlite3_column_blob(names.get(), 0), sqlite3_column_bytes(names.get(), 0), most);
                 return QUIB_ERR_NONE;
             }
             return rc == SQLITE_DONE ? QUIB_ERR_NONE : FileIdxCodeOf(db.get(), rc);
         };
         std::vector<std::string> list;
         if (!plan_.namesKnown) {
+            std::vector<int64_t> ids;
             for (const auto &[id, f] : folders_) {
-                if (!f.relevant) {
+                ids.push_back(id);
+            }
+            std::sort(ids.begin(), ids.end());
+            for (const int64_t id : ids) {
+                if (!Placed(id).relevant) {
                     continue;
                 }
-                if (const int code = namesOf(id, &list)) {
+                if (const int code = namesOf(id, SIZE_MAX, &list)) {
                     return code;
                 }
-                auto &into = candidates_[id];
-                for (size_t i = 0; i < list.size(); ++i) {
-                    into.emplace(static_cast<int64_t>(i), std::move(list[i]));
+                for (std::string &name : list) {
+                    candidates_.push_back({id, std::move(name)});
                 }
             }
             return QUIB_ERR_NONE;
@@ -580,12 +594,7 @@ private:
             }
             int rc;
             while ((rc = sqlite3_step(match.get())) == SQLITE_ROW) {
-                const int64_t key = sqlite3_column_int64(match.get(), 0);
-                const Range *r = RangeOf(key);
-                const auto f = r == nullptr ? folders_.end() : folders_.find(r->id);
-                if (f != folders_.end() && f->second.relevant) {
-                    keys.push_back(key);
-                }
+                keys.push_back(sqlite3_column_int64(match.get(), 0));
             }
             if (rc != SQLITE_DONE) {
                 return FileIdxCodeOf(db.get(), rc);
@@ -593,22 +602,45 @@ private:
         }
         std::sort(keys.begin(), keys.end());
         keys.erase(std::unique(keys.begin(), keys.end()), keys.end());
-        int64_t loaded = -1;
-        for (const int64_t key : keys) {
-            const Range &r = *RangeOf(key);
-            const int64_t id = r.id;
-            if (id != loaded) {
-                if (const int code = namesOf(id, &list)) {
+        // Keys of one folder are consecutive: its names are read once, up to the last wanted.
+        for (size_t i = 0; i < keys.size();) {
+            const Range *r = RangeOf(keys[i]);
+            size_t j = i + 1;
+            while (j < keys.size() && r != nullptr && keys[j] < r->first + r->count) {
+                ++j;
+            }
+            if (r != nullptr && Load(r->id) && Placed(r->id).relevant) {
+                if (const int code = namesOf(r->id, static_cast<size_t>(keys[j - 1] - r->first) + 1, &list)) {
                     return code;
                 }
-                loaded = id;
+                for (size_t k = i; k < j; ++k) {
+                    const auto position = static_cast<size_t>(keys[k] - r->first);
+                    if (position < list.size()) {
+                        candidates_.push_back({r->id, list[position]});
+                    }
+                }
             }
-            const size_t position = static_cast<size_t>(key - r.first);
-            if (position < list.size()) {
-                candidates_[id].emplace(static_cast<int64_t>(position), list[position]);
-            }
+            i = j;
         }
         return QUIB_ERR_NONE;
+    }
+
+    // Reads a folder's place in the tree from the index when it is not known yet.
+    bool Load(int64_t id) {
+        if (folders_.count(id) != 0) {
+            return true;
+        }
+        sqlite3_reset(folderRow_.get());
+        sqlite3_bind_int64(folderRow_.get(), 1, id);
+        if (sqlite3_step(folderRow_.get()) != SQLITE_ROW) {
+            return false;
+        }
+        QueryFolder f;
+        f.parent = sqlite3_column_int64(folderRow_.get(), 0);
+        f.name.assign(static_cast<const char *>(sqlite3_column_blob(folderRow_.get(), 1)),
+                      static_cast<size_t>(sqlite3_column_bytes(folderRow_.get(), 1)));
+        folders_.emplace(id, std::move(f));
+        return true;
     }
 
     struct Range {
@@ -625,46 +657,39 @@ private:
         return key < it->first + it->count ? &*it : nullptr;
     }
 
-    // The share and share-relative path of a folder, and whether the plan lets rows in it.
-    void Place(int64_t id) {
-        QueryFolder &f = folders_.at(id);
+    // The folder with its share, share-relative path, and whether the plan lets rows in it.
+    const QueryFolder &Placed(int64_t id) {
+        QueryFolder &f = folders_.at(id);  // nodes stay put while the map grows
         if (f.share != -2) {
-            return;
+            return f;
         }
-        std::vector<std::string> below;  // components below the volume
-        if (id != kRootId) {
-            const auto parent = folders_.find(f.parent);
-            if (parent == folders_.end() || parent->first == id) {
-                f.share = -1;
-                return;
+        f.share = -1;
+        if (id == kRootId) {
+            f.reachable = true;
+        } else if (f.parent != id && Load(f.parent)) {
+            const QueryFolder &parent = Placed(f.parent);
+            if (parent.reachable) {
+                f.reachable = true;
+                f.full = parent.full;
+                f.full.push_back(f.name);
             }
-            Place(parent->first);
+        }
+        if (!f.reachable) {
+            return f;
         }
         // The deepest share that holds the folder.
-        std::vector<std::string> full;
-        for (int64_t at = id; at != kRootId;) {
-            const QueryFolder &g = folders_.at(at);
-            full.push_back(g.name);
-            at = g.parent;
-            if (folders_.find(at) == folders_.end()) {
-                f.share = -1;
-                return;
-            }
-        }
-        std::reverse(full.begin(), full.end());
-        f.share = -1;
         size_t depth = 0;
         for (size_t i = 0; i < shares_.size(); ++i) {
             const auto &b = shares_[i].below;
-            if (b.size() <= full.size() && b.size() > depth && std::equal(b.begin(), b.end(), full.begin())) {
+            if (b.size() <= f.full.size() && b.size() > depth && std::equal(b.begin(), b.end(), f.full.begin())) {
                 f.share = static_cast<int>(i);
                 depth = b.size();
             }
         }
         if (f.share < 0) {
-            return;
+            return f;
         }
-        f.path.assign(full.begin() + static_cast<long>(depth), full.end());
+        f.path.assign(f.full.begin() + static_cast<long>(depth), f.full.end());
         f.relevant = true;
         for (const auto &alternatives : plan_.pathOr) {
             bool any = false;
@@ -676,6 +701,7 @@ private:
         for (const auto &names : plan_.shareOr) {
             f.relevant = f.relevant && names.count(shares_[static_cast<size_t>(f.share)].name) != 0;
         }
+        return f;
     }
 
     // The folder open as O_PATH, reached from the volume one component at a time.
@@ -715,7 +741,7 @@ private:
         return it->second;
     }
 
-    int Candidate(int64_t folder, const std::string &name) {
+    int Look(int64_t folder, const std::string &name) {
         const QueryFolder &f = folders_.at(folder);
         const int fd = FolderFd(folder);
         struct statx sx;
@@ -898,7 +924,12 @@ private:
     std::vector<Share> shares_;
     std::unordered_map<int64_t, QueryFolder> folders_;
     std::vector<Range> ranges_;  // by first key
-    std::map<int64_t, std::map<int64_t, std::string>> candidates_;
+    struct Candidate {
+        int64_t folder;
+        std::string name;
+    };
+    std::vector<Candidate> candidates_;  // in folder and name order
+    Statement folderRow_;  // while the index is open
     FileDescriptor volumeFd_;
     std::unordered_map<int64_t, FileDescriptor> fds_;
     std::unordered_map<uid_t, std::string> users_;
