@@ -47,7 +47,7 @@ constexpr char kLockName[] = "fileidx.lock";
 constexpr char kVersion[] = "2";
 // The most names a folder keeps (more are left out of the index).
 constexpr size_t kMaxNames = 1 << 24;
-constexpr int kMaxDepth = 1000;  // a descriptor per level is held while walking
+constexpr int kMaxDepth = 256;  // a descriptor per level is held while walking and querying
 constexpr int kRootId = 1;
 
 constexpr char kIndexSchema[] =
@@ -372,7 +372,24 @@ struct Plan {
     std::vector<std::vector<std::string>> byName;   // the alternatives' trigrams
     std::vector<std::vector<PathPrefix>> pathOr;    // each: one of its prefixes must hold
     std::vector<std::set<std::string>> shareOr;     // each: the share is one of these
+    std::vector<Alternatives> nameOr;               // each: one of its name terms holds
 };
+
+// Whether a name satisfies every conjunct of name terms (before its status is looked at).
+bool NameMayMatch(const Plan &plan, const std::string &name) {
+    for (const Alternatives &alts : plan.nameOr) {
+        bool any = false;
+        for (size_t i = 0; !any && i < alts.size(); ++i) {
+            const std::string operand = Operand(*alts[i]);
+            any = alts[i]->op == FI_OP_LIKE ? VLIBCUnicodeUTF8LikeMatch(operand.c_str(), name.c_str(), '\\') != 0
+                                            : operand == name;
+        }
+        if (!any) {
+            return false;
+        }
+    }
+    return true;
+}
 
 void ReadPlan(const __tag_FI_SQL_COND *chain, Plan *plan) {
     std::set<const __tag_FI_SQL_COND *> seen;
@@ -386,6 +403,9 @@ void ReadPlan(const __tag_FI_SQL_COND *chain, Plan *plan) {
             names = names && c->type == FI_COND_NAME && (c->op == FI_OP_LIKE || c->op == FI_OP_EQ);
             paths = paths && c->type == FI_COND_PATH && (c->op == FI_OP_PATH_LIKE || c->op == FI_OP_EQ);
             shares = shares && c->type == FI_COND_SHARE && c->op == FI_OP_EQ;
+        }
+        if (names) {
+            plan->nameOr.push_back(alts);
         }
         if (names && !plan->namesKnown) {
             std::vector<std::vector<std::string>> byName;
@@ -488,7 +508,7 @@ public:
         }
         int64_t previous = -1;
         for (const Candidate &c : candidates_) {
-            if (c.folder != previous && fds_.size() > 1024) {
+            if (c.folder != previous && fds_.size() > 256) {
                 fds_.clear();  // folders come in walk order: their ancestors stay useful a while
             }
             previous = c.folder;
@@ -577,7 +597,9 @@ private:
                     return code;
                 }
                 for (std::string &name : list) {
-                    candidates_.push_back({id, std::move(name)});
+                    if (NameMayMatch(plan_, name)) {
+                        candidates_.push_back({id, std::move(name)});
+                    }
                 }
             }
             return QUIB_ERR_NONE;
@@ -615,7 +637,7 @@ private:
                 }
                 for (size_t k = i; k < j; ++k) {
                     const auto position = static_cast<size_t>(keys[k] - r->first);
-                    if (position < list.size()) {
+                    if (position < list.size() && NameMayMatch(plan_, list[position])) {
                         candidates_.push_back({r->id, list[position]});
                     }
                 }
