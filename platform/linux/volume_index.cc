@@ -726,7 +726,8 @@ private:
         return f;
     }
 
-    // The folder open as O_PATH, reached from the volume one component at a time.
+    // The folder open for reading, reached from the volume one component at a time, as the
+    // caller: a folder the caller may enter but not list gives nothing, as it gives a walk.
     int FolderFd(int64_t id) {
         if (id == kRootId) {
             return volumeFd_.Get();
@@ -740,7 +741,7 @@ private:
         if (parent < 0) {
             return -1;
         }
-        FileDescriptor fd(openat(parent, f.name.c_str(), O_PATH | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+        FileDescriptor fd(openat(parent, f.name.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
         const int raw = fd.Get();
         fds_.emplace(id, std::move(fd));
         return raw;
