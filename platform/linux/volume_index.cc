@@ -145,6 +145,13 @@ std::string JoinNames(const std::vector<std::string> &names) {
     return blob;
 }
 
+// Text into a record's field, cut to fit, always terminated.
+void Copy(const std::string &text, char *field, size_t size) {
+    const size_t n = std::min(text.size(), size - 1);
+    memcpy(field, text.data(), n);
+    field[n] = '\0';
+}
+
 // ---- small system helpers ----------------------------------------------------------------------
 
 int64_t Nanos(const struct timespec &t) {
@@ -449,6 +456,7 @@ struct QueryFolder {
     bool reachable = false;              // its parents lead to the volume
     std::vector<std::string> full;       // components below the volume
     std::vector<std::string> path;       // components below the share
+    std::string parentPath;              // of its entries: path joined by "/"
     bool relevant = false;
 };
 
@@ -712,6 +720,10 @@ private:
             return f;
         }
         f.path.assign(f.full.begin() + static_cast<long>(depth), f.full.end());
+        for (const std::string &c : f.path) {
+            f.parentPath += f.parentPath.empty() ? "" : "/";
+            f.parentPath += c;
+        }
         f.relevant = true;
         for (const auto &alternatives : plan_.pathOr) {
             bool any = false;
@@ -772,13 +784,9 @@ private:
             return QUIB_ERR_NONE;  // gone, or out of the caller's reach: a walk would not see it either
         }
         const Share &share = shares_[static_cast<size_t>(f.share)];
-        std::string parentPath;
-        for (const std::string &c : f.path) {
-            parentPath += parentPath.empty() ? "" : "/";
-            parentPath += c;
-        }
-        const std::string path = parentPath.empty() ? name : parentPath + "/" + name;
-        if (name.size() >= sizeof(FI_FILE_INFO_DATA::name) || path.size() >= sizeof(FI_FILE_INFO_DATA::path) ||
+        const std::string &parentPath = f.parentPath;
+        const size_t pathSize = parentPath.empty() ? name.size() : parentPath.size() + 1 + name.size();
+        if (name.size() >= sizeof(FI_FILE_INFO_DATA::name) || pathSize >= sizeof(FI_FILE_INFO_DATA::path) ||
             share.realPath.size() >= sizeof(FI_FILE_INFO_DATA::realPath)) {
             return QUIB_ERR_NONE;  // a record could not hold it; the walk cannot reach it either
         }
@@ -788,11 +796,17 @@ private:
         __tag_FI_FILE_INFO_DATA &r = *batch_[used_++];
         r.type[0] = '\0';
         const bool isDir = S_ISDIR(sx.stx_mode);
-        snprintf(r.name, sizeof r.name, "%s", name.c_str());
-        snprintf(r.realPath, sizeof r.realPath, "%s", share.realPath.c_str());
-        snprintf(r.parentPath, sizeof r.parentPath, "%s", parentPath.c_str());
-        snprintf(r.share, sizeof r.share, "%s", share.name.c_str());
-        snprintf(r.path, sizeof r.path, "%s", path.c_str());
+        Copy(name, r.name, sizeof r.name);
+        Copy(share.realPath, r.realPath, sizeof r.realPath);
+        Copy(parentPath, r.parentPath, sizeof r.parentPath);
+        Copy(share.name, r.share, sizeof r.share);
+        if (parentPath.empty()) {
+            Copy(name, r.path, sizeof r.path);
+        } else {
+            memcpy(r.path, parentPath.data(), parentPath.size());
+            r.path[parentPath.size()] = '/';
+            Copy(name, r.path + parentPath.size() + 1, sizeof r.path - parentPath.size() - 1);
+        }
         r.isDir = isDir ? 1 : 0;
         r.size = isDir ? 0 : static_cast<long long>(sx.stx_size);
         const char *dot = strrchr(r.name, '.');
@@ -817,8 +831,8 @@ private:
         r.mode = sx.stx_mode;
         r.uid = sx.stx_uid;
         r.gid = sx.stx_gid;
-        snprintf(r.userName, sizeof r.userName, "%s", NameOfUid(sx.stx_uid).c_str());
-        snprintf(r.groupName, sizeof r.groupName, "%s", NameOfGid(sx.stx_gid).c_str());
+        Copy(NameOfUid(sx.stx_uid), r.userName, sizeof r.userName);
+        Copy(NameOfGid(sx.stx_gid), r.groupName, sizeof r.groupName);
         return used_ >= kBatch ? Flush() : QUIB_ERR_NONE;
     }
 
