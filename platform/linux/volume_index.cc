@@ -1,20 +1,21 @@
 // The volume index: one row per folder (its place, its identity and times, and the names in it
 // as one blob) and a contentless FTS5 trigram table over the names. A folder's names have the
 // consecutive keys first .. first + count - 1 in the trigram table, new ones each time the folder
-// is read: dense keys keep the trigram lists' deltas small. A query takes candidates by name and folder from it and looks at each candidate
-// live, so what it returns is what a walk would find now, less what the index has not seen.
+// is read: dense keys keep the trigram lists' deltas small. A query takes candidates by name and folder from
+// it and looks at each candidate live, so what it returns is what a walk would find now, less what the index
+// has not seen.
 #include "volume_index.h"
 
 #include <dirent.h>
 #include <errno.h>
 #include <fcntl.h>
+#include <poll.h>
 #include <stdint.h>
 #include <string.h>
 #include <sys/inotify.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
 #include <time.h>
-#include <poll.h>
 #include <unistd.h>
 
 #include <unicode/uchar.h>
@@ -115,7 +116,8 @@ std::vector<std::string> SplitNames(const void *blob, int size, size_t most = SI
     const char *end = p + (size > 0 ? size : 0);
     std::string previous;
     while (p < end && names.size() < most) {
-        const size_t shared = std::min(static_cast<size_t>(static_cast<unsigned char>(*p++)), previous.size());
+        const size_t shared =
+            std::min(static_cast<size_t>(static_cast<unsigned char>(*p++)), previous.size());
         const char *nul = static_cast<const char *>(memchr(p, '\0', static_cast<size_t>(end - p)));
         const char *stop = nul == nullptr ? end : nul;
         previous.resize(shared);
@@ -175,7 +177,8 @@ int OpenDirNoFollow(const std::string &path, int flags, FileDescriptor *out) {
         if (component.empty() || component == ".") {
             continue;
         }
-        FileDescriptor next(openat(dir.Get(), component.c_str(), O_PATH | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+        FileDescriptor next(
+            openat(dir.Get(), component.c_str(), O_PATH | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
         if (!next.IsOpen()) {
             return errno;
         }
@@ -366,7 +369,8 @@ PathPrefix PrefixOf(const std::string &pattern, bool like) {
 // Whether a row in the folder at path (components below the share) may satisfy the prefix.
 bool FolderMayMatch(const std::vector<std::string> &folder, const PathPrefix &p) {
     if (p.star) {
-        return folder.size() >= p.literal.size() && std::equal(p.literal.begin(), p.literal.end(), folder.begin());
+        return folder.size() >= p.literal.size() &&
+               std::equal(p.literal.begin(), p.literal.end(), folder.begin());
     }
     return !p.literal.empty() && folder.size() + 1 == p.literal.size() &&
            std::equal(folder.begin(), folder.end(), p.literal.begin());
@@ -375,11 +379,11 @@ bool FolderMayMatch(const std::vector<std::string> &folder, const PathPrefix &p)
 // What both chains say about where and by which names candidates may lie; every part a
 // superset of the rows the chains select.
 struct Plan {
-    bool namesKnown = false;                        // else every name is a candidate
-    std::vector<std::vector<std::string>> byName;   // the alternatives' trigrams
-    std::vector<std::vector<PathPrefix>> pathOr;    // each: one of its prefixes must hold
-    std::vector<std::set<std::string>> shareOr;     // each: the share is one of these
-    std::vector<Alternatives> nameOr;               // each: one of its name terms holds
+    bool namesKnown = false;                       // else every name is a candidate
+    std::vector<std::vector<std::string>> byName;  // the alternatives' trigrams
+    std::vector<std::vector<PathPrefix>> pathOr;   // each: one of its prefixes must hold
+    std::vector<std::set<std::string>> shareOr;    // each: the share is one of these
+    std::vector<Alternatives> nameOr;              // each: one of its name terms holds
 };
 
 // Whether a name satisfies every conjunct of name terms (before its status is looked at).
@@ -388,8 +392,9 @@ bool NameMayMatch(const Plan &plan, const std::string &name) {
         bool any = false;
         for (size_t i = 0; !any && i < alts.size(); ++i) {
             const std::string operand = Operand(*alts[i]);
-            any = alts[i]->op == FI_OP_LIKE ? VLIBCUnicodeUTF8LikeMatch(operand.c_str(), name.c_str(), '\\') != 0
-                                            : operand == name;
+            any = alts[i]->op == FI_OP_LIKE
+                      ? VLIBCUnicodeUTF8LikeMatch(operand.c_str(), name.c_str(), '\\') != 0
+                      : operand == name;
         }
         if (!any) {
             return false;
@@ -445,18 +450,18 @@ void ReadPlan(const __tag_FI_SQL_COND *chain, Plan *plan) {
 
 struct Share {
     std::string name;
-    std::string realPath;               // the share's folder
-    std::vector<std::string> below;     // its components below the volume
+    std::string realPath;            // the share's folder
+    std::vector<std::string> below;  // its components below the volume
 };
 
 struct QueryFolder {
     int64_t parent;
     std::string name;
-    int share = -2;                      // -2 not placed yet, -1 outside every share
-    bool reachable = false;              // its parents lead to the volume
-    std::vector<std::string> full;       // components below the volume
-    std::vector<std::string> path;       // components below the share
-    std::string parentPath;              // of its entries: path joined by "/"
+    int share = -2;                 // -2 not placed yet, -1 outside every share
+    bool reachable = false;         // its parents lead to the volume
+    std::vector<std::string> full;  // components below the volume
+    std::vector<std::string> path;  // components below the share
+    std::string parentPath;         // of its entries: path joined by "/"
     bool relevant = false;
 };
 
@@ -494,7 +499,10 @@ class Query {
 public:
     Query(const char *volume, const __tag_FI_SQL_COND *conditions, const __tag_FI_SQL_COND *folderConditions,
           const std::function<int(const __tag_FI_FILE_INFO_DATA &)> &keep)
-        : volume_(AbsolutePath(volume)), conditions_(conditions), folderConditions_(folderConditions), keep_(keep) {}
+        : volume_(AbsolutePath(volume)),
+          conditions_(conditions),
+          folderConditions_(folderConditions),
+          keep_(keep) {}
 
     int Run() {
         ReadPlan(conditions_, &plan_);
@@ -546,10 +554,11 @@ private:
         // folders of the candidates with their parents one by one.
         {
             Statement s;
-            if (const int code = Prepare(db.get(),
-                                         plan_.namesKnown ? "SELECT id, 0, '', first, count FROM folders WHERE count > 0"
-                                                          : "SELECT id, parent, name, first, count FROM folders",
-                                         &s)) {
+            if (const int code =
+                    Prepare(db.get(),
+                            plan_.namesKnown ? "SELECT id, 0, '', first, count FROM folders WHERE count > 0"
+                                             : "SELECT id, parent, name, first, count FROM folders",
+                            &s)) {
                 return code;
             }
             int rc;
@@ -572,7 +581,8 @@ private:
             }
             std::sort(ranges_.begin(), ranges_.end());
         }
-        if (const int code = Prepare(db.get(), "SELECT parent, name FROM folders WHERE id = ?", &folderRow_)) {
+        if (const int code =
+                Prepare(db.get(), "SELECT parent, name FROM folders WHERE id = ?", &folderRow_)) {
             return code;
         }
         Statement names;
@@ -585,7 +595,8 @@ private:
             const int rc = sqlite3_step(names.get());
             out->clear();
             if (rc == SQLITE_ROW) {
-                *out = SplitNames(sqlite3_column_blob(names.get(), 0), sqlite3_column_bytes(names.get(), 0), most);
+                *out = SplitNames(sqlite3_column_blob(names.get(), 0), sqlite3_column_bytes(names.get(), 0),
+                                  most);
                 return QUIB_ERR_NONE;
             }
             return rc == SQLITE_DONE ? QUIB_ERR_NONE : FileIdxCodeOf(db.get(), rc);
@@ -711,7 +722,8 @@ private:
         size_t depth = 0;
         for (size_t i = 0; i < shares_.size(); ++i) {
             const auto &b = shares_[i].below;
-            if (b.size() <= f.full.size() && b.size() > depth && std::equal(b.begin(), b.end(), f.full.begin())) {
+            if (b.size() <= f.full.size() && b.size() > depth &&
+                std::equal(b.begin(), b.end(), f.full.begin())) {
                 f.share = static_cast<int>(i);
                 depth = b.size();
             }
@@ -763,7 +775,8 @@ private:
         auto it = users_.find(uid);
         if (it == users_.end()) {
             NssUser u;
-            it = users_.emplace(uid, FindUserById(uid, &u) == NssStatus::kFound ? u.name : std::string()).first;
+            it = users_.emplace(uid, FindUserById(uid, &u) == NssStatus::kFound ? u.name : std::string())
+                     .first;
         }
         return it->second;
     }
@@ -771,7 +784,8 @@ private:
         auto it = groups_.find(gid);
         if (it == groups_.end()) {
             NssGroup g;
-            it = groups_.emplace(gid, FindGroupById(gid, &g) == NssStatus::kFound ? g.name : std::string()).first;
+            it = groups_.emplace(gid, FindGroupById(gid, &g) == NssStatus::kFound ? g.name : std::string())
+                     .first;
         }
         return it->second;
     }
@@ -780,7 +794,8 @@ private:
         const QueryFolder &f = folders_.at(folder);
         const int fd = FolderFd(folder);
         struct statx sx;
-        if (fd < 0 || statx(fd, name.c_str(), AT_SYMLINK_NOFOLLOW, STATX_BASIC_STATS | STATX_BTIME, &sx) != 0) {
+        if (fd < 0 ||
+            statx(fd, name.c_str(), AT_SYMLINK_NOFOLLOW, STATX_BASIC_STATS | STATX_BTIME, &sx) != 0) {
             return QUIB_ERR_NONE;  // gone, or out of the caller's reach: a walk would not see it either
         }
         const Share &share = shares_[static_cast<size_t>(f.share)];
@@ -870,10 +885,11 @@ private:
         }
         for (const Alternatives &alts : direct_) {
             for (const __tag_FI_SQL_COND *c : alts) {
-                const bool ok = (c->type == FI_COND_NAME && (c->op == FI_OP_LIKE || c->op == FI_OP_EQ)) ||
-                                (c->type == FI_COND_PATH && (c->op == FI_OP_PATH_LIKE ||
-                                                             c->op == FI_OP_PATH_NOT_LIKE || c->op == FI_OP_EQ)) ||
-                                (c->type == FI_COND_SHARE && c->op == FI_OP_EQ);
+                const bool ok =
+                    (c->type == FI_COND_NAME && (c->op == FI_OP_LIKE || c->op == FI_OP_EQ)) ||
+                    (c->type == FI_COND_PATH &&
+                     (c->op == FI_OP_PATH_LIKE || c->op == FI_OP_PATH_NOT_LIKE || c->op == FI_OP_EQ)) ||
+                    (c->type == FI_COND_SHARE && c->op == FI_OP_EQ);
                 if (!ok) {
                     return false;
                 }
@@ -888,7 +904,9 @@ private:
             for (size_t i = 0; !any && i < alts.size(); ++i) {
                 const __tag_FI_SQL_COND &c = *alts[i];
                 const std::string operand = Operand(c);
-                const char *field = c.type == FI_COND_NAME ? r.name : c.type == FI_COND_PATH ? r.path : r.share;
+                const char *field = c.type == FI_COND_NAME   ? r.name
+                                    : c.type == FI_COND_PATH ? r.path
+                                                             : r.share;
                 switch (c.op) {
                     case FI_OP_LIKE:
                         any = VLIBCUnicodeUTF8LikeMatch(operand.c_str(), field, '\\') != 0;
@@ -951,7 +969,6 @@ private:
         return QUIB_ERR_NONE;
     }
 
-
     static constexpr size_t kBatch = 256;
     const std::string volume_;
     const __tag_FI_SQL_COND *conditions_;
@@ -966,7 +983,7 @@ private:
         std::string name;
     };
     std::vector<Candidate> candidates_;  // in folder and name order
-    Statement folderRow_;  // while the index is open
+    Statement folderRow_;                // while the index is open
     FileDescriptor volumeFd_;
     std::unordered_map<int64_t, FileDescriptor> fds_;
     std::unordered_map<uid_t, std::string> users_;
@@ -995,15 +1012,17 @@ public:
     explicit Writer(sqlite3 *db) : db_(db) {}
 
     int Prepare() {
-        int code = platform::Prepare(db_,
-                                     "INSERT OR REPLACE INTO folders(id, parent, name, dev, ino, ctime, mtime, "
-                                     "first, count, names) VALUES(?,?,?,?,?,?,?,?,?,?)",
-                                     &putFolder_);
+        int code =
+            platform::Prepare(db_,
+                              "INSERT OR REPLACE INTO folders(id, parent, name, dev, ino, ctime, mtime, "
+                              "first, count, names) VALUES(?,?,?,?,?,?,?,?,?,?)",
+                              &putFolder_);
         if (code == QUIB_ERR_NONE) {
             code = platform::Prepare(db_, "INSERT INTO names(rowid, name) VALUES(?, ?)", &addName_);
         }
         if (code == QUIB_ERR_NONE) {
-            code = platform::Prepare(db_, "INSERT INTO names(names, rowid, name) VALUES('delete', ?, ?)", &delName_);
+            code = platform::Prepare(db_, "INSERT INTO names(names, rowid, name) VALUES('delete', ?, ?)",
+                                     &delName_);
         }
         if (code == QUIB_ERR_NONE) {
             code = platform::Prepare(db_, "SELECT first, names FROM folders WHERE id = ?", &getNames_);
@@ -1016,8 +1035,8 @@ public:
 
     int Load() {
         Statement s;
-        if (const int code = platform::Prepare(db_, "SELECT id, parent, name, dev, ino, ctime, mtime, first + count FROM folders",
-                                               &s)) {
+        if (const int code = platform::Prepare(
+                db_, "SELECT id, parent, name, dev, ino, ctime, mtime, first + count FROM folders", &s)) {
             return code;
         }
         int rc;
@@ -1062,7 +1081,8 @@ public:
                 return code;
             }
             read = true;
-        } else if (it != known_.end() && (it->second.ctime != Nanos(st.st_ctim) || it->second.mtime != Nanos(st.st_mtim))) {
+        } else if (it != known_.end() &&
+                   (it->second.ctime != Nanos(st.st_ctim) || it->second.mtime != Nanos(st.st_mtim))) {
             read = true;
         }
         if (onFolder) {
@@ -1070,7 +1090,8 @@ public:
         }
         if (!read) {
             for (const auto &[childName, childId] : std::map<std::string, int64_t>(it->second.children)) {
-                FileDescriptor child(openat(fd, childName.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+                FileDescriptor child(
+                    openat(fd, childName.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
                 if (!child.IsOpen() || depth >= kMaxDepth) {
                     if (const int code = Drop(childId)) {
                         return code;
@@ -1380,7 +1401,9 @@ int BuildLocked(Upkeep &u) {
         }
         if (code == QUIB_ERR_NONE) {
             // One merged trigram index, the pages it left behind given back.
-            code = Exec(db.get(), "COMMIT; INSERT INTO names(names) VALUES('optimize'); VACUUM; PRAGMA journal_mode=DELETE;");
+            code = Exec(
+                db.get(),
+                "COMMIT; INSERT INTO names(names) VALUES('optimize'); VACUUM; PRAGMA journal_mode=DELETE;");
         }
         if (code == QUIB_ERR_NONE) {
             code = CodeOfSqlite(sqlite3_close(db.release()));
@@ -1466,7 +1489,8 @@ std::vector<std::string> NameTrigrams(const std::string &pattern, bool like) {
             }
             p = Decode(p, &c);
         }
-        const UChar32 folded = c < 0x80 ? (c >= 'A' && c <= 'Z' ? c + ('a' - 'A') : c) : u_foldCase(c, U_FOLD_CASE_DEFAULT);
+        const UChar32 folded =
+            c < 0x80 ? (c >= 'A' && c <= 'Z' ? c + ('a' - 'A') : c) : u_foldCase(c, U_FOLD_CASE_DEFAULT);
         if (folded > 0 && folded < 0x80) {
             run += static_cast<char>(folded);
         } else {
@@ -1641,7 +1665,8 @@ private:
         int code = OpenForUpkeep(u_, &db_);
         if (code != QUIB_ERR_NONE) {
             db_.reset();
-            if ((code = BuildLocked(u_)) != QUIB_ERR_NONE || (code = OpenForUpkeep(u_, &db_)) != QUIB_ERR_NONE) {
+            if ((code = BuildLocked(u_)) != QUIB_ERR_NONE ||
+                (code = OpenForUpkeep(u_, &db_)) != QUIB_ERR_NONE) {
                 return code;
             }
         }
@@ -1665,9 +1690,9 @@ private:
             return;
         }
         const std::string path = "/proc/self/fd/" + std::to_string(fd);
-        const int wd = inotify_add_watch(inotify_.Get(), path.c_str(),
-                                         IN_CREATE | IN_DELETE | IN_MOVED_FROM | IN_MOVED_TO | IN_ONLYDIR |
-                                             IN_EXCL_UNLINK);
+        const int wd = inotify_add_watch(
+            inotify_.Get(), path.c_str(),
+            IN_CREATE | IN_DELETE | IN_MOVED_FROM | IN_MOVED_TO | IN_ONLYDIR | IN_EXCL_UNLINK);
         if (wd >= 0) {
             wds_[wd] = id;
         } else if (errno == ENOSPC) {
