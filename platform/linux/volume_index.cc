@@ -761,7 +761,7 @@ private:
         return QUIB_ERR_NONE;
     }
 
-    static constexpr size_t kBatch = 256;
+    static constexpr size_t kBatch = 32;
     const std::string volume_;
     const __tag_FI_SQL_COND *conditions_;
     const __tag_FI_SQL_COND *folderConditions_;
