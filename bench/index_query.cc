@@ -31,11 +31,6 @@ int MayList(const char *dir, const char *, void *arg) {
     return last->allowed;
 }
 
-int Count(FI_FILE_INFO_DATA *, void *arg) {
-    ++*static_cast<unsigned long long *>(arg);
-    return 1;
-}
-
 }  // namespace
 
 int main(int argc, char **argv) {
@@ -63,7 +58,7 @@ int main(int argc, char **argv) {
     }
     unsigned long long hits = 0;
     FI_QUERY all{};
-    if (FILEIDXDBSelect(argv[4], &all, Count, &hits, nullptr, nullptr, 0) != 0) {
+    if (FILEIDXCountGet(argv[4], &all, &hits) != 0) {
         return 1;
     }
     printf("%llu\n", hits);

@@ -352,6 +352,12 @@ int FILEIDXResultGetAndTableGen(const char *volume, const __tag_FI_SQL_COND *con
         }
         std::unique_ptr<__tag_FI_OUTPUT_DB> out;
         int code = OutputOpen(context->outputDbPath, DbOwner::kCaller, &out);
+        if (code == QUIB_ERR_NONE) {
+            // One transaction, synced at the checkpoint: the copy takes a fraction of a second,
+            // and a table cut short by a crash is a search to run again, never a damaged file.
+            out->batch = INT_MAX;
+            code = Exec(out->db.get(), "PRAGMA synchronous=NORMAL");
+        }
         std::string dir;
         auto keep = [&](const __tag_FI_FILE_INFO_DATA &record) -> int {
             if (filter != nullptr) {

@@ -364,7 +364,8 @@ TEST_F(VolumeIndex, UsedOnlyWhenWholeRootsAndReachable) {
     EXPECT_EQ(FILEIDXIsIndexEnable(kVolume), 0);
     app.MakeDir("/volume1/@fileidx", "root", 0700).WriteFile("/volume1/@fileidx/fileidx.db.new", "half", "root", 0600);
     EXPECT_EQ(FILEIDXIsIndexEnable(kVolume), 0);
-    app.MakeDir("/volume1/photo/2013/x/mine", "alice", 0700).WriteFile("/volume1/photo/2013/x/mine/report.a", "", "alice");
+    // bob may pass through alice's folder but not list it.
+    app.MakeDir("/volume1/photo/2013/x/mine", "alice", 0711).WriteFile("/volume1/photo/2013/x/mine/report.a", "", "alice", 0644);
     ASSERT_EQ(FILEIDXIndexBuild(kVolume), 0);
     EXPECT_EQ(FILEIDXIsIndexEnable(kVolume), 1);
     const auto asUser = [&](const std::string &user, const std::function<int()> &fn) {
@@ -372,7 +373,7 @@ TEST_F(VolumeIndex, UsedOnlyWhenWholeRootsAndReachable) {
             return setegid(app.Gid("users")) == 0 && seteuid(app.Uid(user)) == 0 ? fn() : 99;
         });
     };
-    // bob sees none of alice's folder; the filter sees each row's folder and name.
+    // bob finds nothing in alice's folder; the filter sees each row's folder and name.
     const auto reports = [&](const std::string &user) {
         return asUser(user, [&] {
             if (FILEIDXIsIndexEnable(kVolume) != 1 || FILEIDXDBCreate("/volume1/@tmp/u.db") != 0) return -1;
