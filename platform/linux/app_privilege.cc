@@ -66,7 +66,7 @@ int HasPrivilege(const char *userName, const char *priv) {
             QUIB_SET_ERR(NssFailureCode(err));
             return 0;
     }
-    ListMatcher matcher(userName);
+    ListMatcher matcher(userName, user);
     std::string adminEntry = std::string("@") + QUIB_ADMIN_GROUP;
     if (matcher.Matches(adminEntry) == 1) {
         return 1;

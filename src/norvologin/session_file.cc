@@ -9,6 +9,10 @@
 #include <sys/sysinfo.h>
 #include <unistd.h>
 
+#ifdef __SSE2__
+#include <emmintrin.h>
+#endif
+
 #include "common/log.h"
 #include "quib_cgi.h"
 
@@ -89,32 +93,89 @@ bool ParseLine(char *line, SessionLine *out) {
     return true;
 }
 
-bool SplitPlain(std::string_view piece, PlainLine *out) {
-    if (piece.empty() || piece.back() != '\n') {
-        return false;
-    }
-    // One pass over the bytes: this runs for every line of the file at every request.
-    const char *p = piece.data();
-    const char *const end = p + piece.size() - 1;
-    const char *start = p;
+namespace {
+
+// The offsets of the first commas (up to eight) of p[0, length) into commas, and their number;
+// *bad when a CR or NUL is among those bytes. Returns the piece's length: up to its LF, else
+// length.
+#ifdef __SSE2__
+size_t FindSeparators(const char *p, size_t length, size_t (&commas)[8], int *count, bool *bad) {
+    const __m128i comma = _mm_set1_epi8(','), lf = _mm_set1_epi8('\n'), cr = _mm_set1_epi8('\r');
+    const __m128i nul = _mm_setzero_si128();
     int n = 0;
-    for (; p < end; ++p) {
-        const char c = *p;
-        if (c == ',') {
-            if (p == start || n == 7) {
-                return false;
+    unsigned badBits = 0;
+    for (size_t i = 0; i < length; i += 16) {
+        const __m128i v = _mm_loadu_si128(reinterpret_cast<const __m128i *>(p + i));
+        unsigned cm = static_cast<unsigned>(_mm_movemask_epi8(_mm_cmpeq_epi8(v, comma)));
+        unsigned nm = static_cast<unsigned>(_mm_movemask_epi8(_mm_cmpeq_epi8(v, lf)));
+        unsigned bm = static_cast<unsigned>(
+            _mm_movemask_epi8(_mm_or_si128(_mm_cmpeq_epi8(v, cr), _mm_cmpeq_epi8(v, nul))));
+        if (length - i < 16) {
+            const unsigned inside = (1u << (length - i)) - 1;  // the rest is not this piece's
+            cm &= inside, nm &= inside, bm &= inside;
+        }
+        const unsigned before = nm != 0 ? (nm & (0u - nm)) - 1 : ~0u;
+        badBits |= bm & before;
+        for (cm &= before; cm != 0; cm &= cm - 1, ++n) {
+            if (n < 8) {
+                commas[n] = i + static_cast<size_t>(__builtin_ctz(cm));
             }
-            out->field[n++] = std::string_view(start, static_cast<size_t>(p - start));
-            start = p + 1;
-        } else if (c == '\r' || c == '\0') {
-            return false;
+        }
+        if (nm != 0) {
+            *count = n, *bad = badBits != 0;
+            return i + static_cast<size_t>(__builtin_ctz(nm)) + 1;
         }
     }
-    if (p == start || n != 7) {
-        return false;
+    *count = n, *bad = badBits != 0;
+    return length;
+}
+#else
+size_t FindSeparators(const char *p, size_t length, size_t (&commas)[8], int *count, bool *bad) {
+    int n = 0;
+    *bad = false;
+    for (size_t i = 0; i < length; ++i) {
+        const char c = p[i];
+        if (c == '\n') {
+            *count = n;
+            return i + 1;
+        }
+        if (c == ',') {
+            if (n < 8) {
+                commas[n] = i;
+            }
+            ++n;
+        } else if (c == '\r' || c == '\0') {
+            *bad = true;
+        }
     }
-    out->field[7] = std::string_view(start, static_cast<size_t>(p - start));
-    return true;
+    *count = n;
+    return length;
+}
+#endif
+
+}  // namespace
+
+size_t ScanLine(const char *p, size_t avail, PlainLine *out, bool *plain) {
+    size_t commas[8];
+    int count = 0;
+    bool bad = false;
+    const size_t length =
+        FindSeparators(p, std::min(avail, static_cast<size_t>(kLineBuffer) - 1), commas, &count, &bad);
+    *plain = false;
+    if (bad || count != 7 || p[length - 1] != '\n') {
+        return length;
+    }
+    commas[7] = length - 1;
+    size_t start = 0;
+    for (int i = 0; i < 8; ++i) {
+        if (commas[i] == start) {
+            return length;  // an empty field, which strtok would not see
+        }
+        out->field[i] = std::string_view(p + start, commas[i] - start);
+        start = commas[i] + 1;
+    }
+    *plain = true;
+    return length;
 }
 
 long NumberOf(std::string_view field) {
@@ -167,8 +228,24 @@ bool Expired(const Clock &clock, long lastAccess) {
     return !clock.haveNow || lastAccess > clock.now || clock.now - lastAccess > clock.timeoutSeconds;
 }
 
-int OpenOwnFile(const char *path, bool forWriting) {
+int OpenOwnFile(const char *path, bool forWriting, off_t *size) {
     const int flags = (forWriting ? O_WRONLY | O_CREAT : O_RDONLY) | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC;
+    if (forWriting) {
+        // The scratch file is renamed away after each rewrite, so it is normally made here, new
+        // and ours: nothing left to check.
+        const int fd = open(path, flags | O_EXCL, 0600);
+        if (fd >= 0 && fchmod(fd, 0600) == 0) {
+            return fd;
+        }
+        if (fd >= 0 || errno != EEXIST) {
+            const int err = errno;
+            if (fd >= 0) {
+                close(fd);
+            }
+            errno = err;
+            return -1;
+        }
+    }
     const int fd = open(path, flags, 0600);
     if (fd < 0) {
         return -1;
@@ -181,6 +258,9 @@ int OpenOwnFile(const char *path, bool forWriting) {
         close(fd);
         errno = err;
         return -1;
+    }
+    if (size != nullptr) {
+        *size = forWriting ? 0 : st.st_size;
     }
     return fd;
 }
@@ -200,6 +280,37 @@ bool ReadAll(int fd, std::string *text) {
         }
         text->append(buf, static_cast<size_t>(got));
     }
+}
+
+bool ReadPadded(int fd, size_t sizeHint, FileText *text) {
+    // One byte over the size expected, so that a single read normally brings all of it.
+    size_t capacity = sizeHint + 1;
+    text->data.reset(new char[capacity + kScanPad]);
+    text->size = 0;
+    for (;;) {
+        if (text->size == capacity) {
+            capacity *= 2;
+            std::unique_ptr<char[]> grown(new char[capacity + kScanPad]);
+            memcpy(grown.get(), text->data.get(), text->size);
+            text->data = std::move(grown);
+        }
+        const size_t asked = capacity - text->size;
+        const ssize_t got = read(fd, text->data.get() + text->size, asked);
+        if (got < 0 && errno == EINTR) {
+            continue;
+        }
+        if (got < 0) {
+            return false;
+        }
+        text->size += static_cast<size_t>(got);
+        // A short read that brings exactly the size the file had is its end (the caller holds
+        // the file's lock); anything else reads on until read says so.
+        if (got == 0 || (static_cast<size_t>(got) < asked && text->size == sizeHint)) {
+            break;
+        }
+    }
+    memset(text->data.get() + text->size, 0, kScanPad);
+    return true;
 }
 
 }  // namespace norvo::login
