@@ -132,9 +132,12 @@ int Purge(sqlite3 *db, time_t since, time_t now) {
     return pf::RunToEnd(purge.get());
 }
 
-// Opens the database; *missing when it does not exist and create is not set.
-int Open(bool create, pf::SqliteDb *db, bool *missing) {
-    const int code = pf::OpenPrivateSqlite(QUIB_LOGIN_DIR, QUIB_AUTOBLOCK_DB_NAME, create, kSchema, db);
+// Opens the database; *missing when it does not exist and create is not set. readOnly: for a
+// question only, without the schema (every request asks; a database without the table fails
+// the question, as a damaged one would).
+int Open(bool create, pf::SqliteDb *db, bool *missing, bool readOnly = false) {
+    const int code = pf::OpenPrivateSqlite(QUIB_LOGIN_DIR, QUIB_AUTOBLOCK_DB_NAME, create,
+                                           readOnly ? nullptr : kSchema, db);
     *missing = !create && code == QUIB_ERR_NO_SUCH_FILE;
     return *missing ? QUIB_ERR_NONE : code;
 }
@@ -154,12 +157,15 @@ int QuibCgiIsDeniedIP(const char *ip) {
             return 0;
         }
         const Policy policy = ReadPolicy();
+        if (policy.attempts == 0) {
+            return 0;
+        }
         pf::SqliteDb db;
         bool missing = false;
-        if (const int code = Open(false, &db, &missing)) {
+        if (const int code = Open(false, &db, &missing, true)) {
             return Fail(code);
         }
-        if (missing || policy.attempts == 0) {
+        if (missing) {
             return 0;
         }
         long count = 0;
