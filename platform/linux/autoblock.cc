@@ -150,14 +150,22 @@ int QuibCgiIsDeniedIP(const char *ip) {
         if (!CanonicalAddress(ip, &addr)) {
             return Fail(QUIB_ERR_BAD_PARAMETER);
         }
-        // Nothing recorded yet is the usual case, and every request asks: one lstat answers it.
-        // Only root may find the database at all, so others go the whole way (and are refused).
+        // Every request asks, and mostly nothing is recorded, or nothing recent: one lstat
+        // answers that. A failure is stamped (at) before the write that records it, so a database
+        // last written before the window began holds none within it; the second of margin covers
+        // the file system's coarser clock. Only root may find the database, so others go the
+        // whole way (and are refused).
         struct stat st;
-        if (lstat(QUIB_AUTOBLOCK_DB, &st) != 0 && errno == ENOENT && geteuid() == 0) {
+        const bool found = lstat(QUIB_AUTOBLOCK_DB, &st) == 0;
+        if (!found && errno == ENOENT && geteuid() == 0) {
             return 0;
         }
         const Policy policy = ReadPolicy();
         if (policy.attempts == 0) {
+            return 0;
+        }
+        const time_t since = time(nullptr) - policy.windowSeconds;
+        if (found && S_ISREG(st.st_mode) && st.st_mtime + 1 < since && geteuid() == 0) {
             return 0;
         }
         pf::SqliteDb db;
@@ -169,7 +177,7 @@ int QuibCgiIsDeniedIP(const char *ip) {
             return 0;
         }
         long count = 0;
-        if (const int code = CountRecent(db.get(), addr, time(nullptr) - policy.windowSeconds, &count)) {
+        if (const int code = CountRecent(db.get(), addr, since, &count)) {
             return Fail(code);
         }
         return count >= policy.attempts ? 1 : 0;
