@@ -126,6 +126,15 @@ bool Output::WriteTo(int fd) const {
     return true;
 }
 
+// Equality of a line's field and a given text; most fields differ in their first byte.
+inline bool Same(std::string_view field, std::string_view text) {
+    return field.size() == text.size() && (text.empty() || field[0] == text[0]) && field == text;
+}
+// Whether a number field reads 0, as the persistent flag mostly does.
+inline bool IsZero(std::string_view field) {
+    return field == "0" || static_cast<int>(NumberOf(field)) == 0;
+}
+
 // The decision for the session's own line; false when the line is to be dropped.
 struct Verdict {
     int result;
@@ -255,9 +264,8 @@ int NorvoLogin::IsAuthorizedByPath(QUIB::WebCGI *cgi, const char *sessionId, cha
             PlainLine plain;
             bool isPlain = false;
             const size_t length = ScanLine(piece, text.size - pos, &plain, &isPlain);
-            if (isPlain && (plain.field[2] != id || plain.field[7] != cookie)) {
-                if (static_cast<int>(NumberOf(plain.field[6])) != 0 ||
-                    !Expired(clock, NumberOf(plain.field[4]))) {
+            if (isPlain && (!Same(plain.field[2], id) || plain.field[7] != cookie)) {
+                if (!IsZero(plain.field[6]) || !Expired(clock, NumberOf(plain.field[4]))) {
                     kept.Keep(pos, length);
                 }
             } else {

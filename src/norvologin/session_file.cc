@@ -3,6 +3,7 @@
 #include <arpa/inet.h>
 #include <errno.h>
 #include <fcntl.h>
+#include <stdint.h>
 #include <stdlib.h>
 #include <string.h>
 #include <sys/stat.h>
@@ -102,6 +103,35 @@ namespace {
 size_t FindSeparators(const char *p, size_t length, size_t (&commas)[8], int *count, bool *bad) {
     const __m128i comma = _mm_set1_epi8(','), lf = _mm_set1_epi8('\n'), cr = _mm_set1_epi8('\r');
     const __m128i nul = _mm_setzero_si128();
+    // Most lines end within 64 bytes: their separators come from one 64-bit mask each.
+    uint64_t cm64 = 0, nm64 = 0, bm64 = 0;
+    for (int k = 0; k < 4; ++k) {
+        const __m128i v = _mm_loadu_si128(reinterpret_cast<const __m128i *>(p + 16 * k));
+        const int shift = 16 * k;
+        cm64 |= static_cast<uint64_t>(static_cast<unsigned>(_mm_movemask_epi8(_mm_cmpeq_epi8(v, comma))))
+                << shift;
+        nm64 |= static_cast<uint64_t>(static_cast<unsigned>(_mm_movemask_epi8(_mm_cmpeq_epi8(v, lf))))
+                << shift;
+        bm64 |= static_cast<uint64_t>(static_cast<unsigned>(
+                    _mm_movemask_epi8(_mm_or_si128(_mm_cmpeq_epi8(v, cr), _mm_cmpeq_epi8(v, nul)))))
+                << shift;
+    }
+    if (length < 64) {
+        nm64 &= (uint64_t{1} << length) - 1;
+    }
+    if (nm64 != 0) {
+        const uint64_t before = (nm64 & (0 - nm64)) - 1;
+        cm64 &= before;
+        *bad = (bm64 & before) != 0;
+        int n = 0;
+        for (; cm64 != 0; cm64 &= cm64 - 1, ++n) {
+            if (n < 8) {
+                commas[n] = static_cast<size_t>(__builtin_ctzll(cm64));
+            }
+        }
+        *count = n;
+        return static_cast<size_t>(__builtin_ctzll(nm64)) + 1;
+    }
     int n = 0;
     unsigned badBits = 0;
     for (size_t i = 0; i < length; i += 16) {

@@ -69,7 +69,7 @@ void ForEachPiece(const std::string &text, int bufferSize, F &&fn) {
 }
 
 // The session file's text, followed by kScanPad zero bytes that ScanLine may look at.
-inline constexpr size_t kScanPad = 16;
+inline constexpr size_t kScanPad = 64;
 struct FileText {
     std::unique_ptr<char[]> data;
     size_t size = 0;
