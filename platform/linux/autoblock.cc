@@ -16,7 +16,6 @@
 #include "quib_paths.h"
 #include "settings_format.h"
 #include "sqlite_db.h"
-#include "vlibc_file.h"
 
 using norvo::platform::Guarded;
 namespace pf = norvo::platform;
