@@ -265,6 +265,9 @@ int OpenOwnFile(const char *path, bool forWriting, off_t *size) {
         // and ours: nothing left to check.
         const int fd = open(path, flags | O_EXCL, 0600);
         if (fd >= 0 && fchmod(fd, 0600) == 0) {
+            if (size != nullptr) {
+                *size = 0;
+            }
             return fd;
         }
         if (fd >= 0 || errno != EEXIST) {
