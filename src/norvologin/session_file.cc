@@ -100,38 +100,56 @@ namespace {
 // *bad when a CR or NUL is among those bytes. Returns the piece's length: up to its LF, else
 // length.
 #ifdef __SSE2__
-size_t FindSeparators(const char *p, size_t length, size_t (&commas)[8], int *count, bool *bad) {
+// A piece that ends within its first 64 bytes, as lines mostly do: its separators come from one
+// 64-bit mask each (the caller's padding makes the 64 bytes readable). false when it does not
+// end there.
+bool ScanShort(const char *p, size_t avail, PlainLine *out, bool *plain, size_t *length) {
     const __m128i comma = _mm_set1_epi8(','), lf = _mm_set1_epi8('\n'), cr = _mm_set1_epi8('\r');
     const __m128i nul = _mm_setzero_si128();
-    // Most lines end within 64 bytes: their separators come from one 64-bit mask each.
-    uint64_t cm64 = 0, nm64 = 0, bm64 = 0;
+    uint64_t cm = 0, nm = 0, bm = 0;
     for (int k = 0; k < 4; ++k) {
         const __m128i v = _mm_loadu_si128(reinterpret_cast<const __m128i *>(p + 16 * k));
         const int shift = 16 * k;
-        cm64 |= static_cast<uint64_t>(static_cast<unsigned>(_mm_movemask_epi8(_mm_cmpeq_epi8(v, comma))))
-                << shift;
-        nm64 |= static_cast<uint64_t>(static_cast<unsigned>(_mm_movemask_epi8(_mm_cmpeq_epi8(v, lf))))
-                << shift;
-        bm64 |= static_cast<uint64_t>(static_cast<unsigned>(
-                    _mm_movemask_epi8(_mm_or_si128(_mm_cmpeq_epi8(v, cr), _mm_cmpeq_epi8(v, nul)))))
-                << shift;
+        cm |= static_cast<uint64_t>(static_cast<unsigned>(_mm_movemask_epi8(_mm_cmpeq_epi8(v, comma))))
+              << shift;
+        nm |= static_cast<uint64_t>(static_cast<unsigned>(_mm_movemask_epi8(_mm_cmpeq_epi8(v, lf)))) << shift;
+        bm |= static_cast<uint64_t>(static_cast<unsigned>(
+                  _mm_movemask_epi8(_mm_or_si128(_mm_cmpeq_epi8(v, cr), _mm_cmpeq_epi8(v, nul)))))
+              << shift;
     }
-    if (length < 64) {
-        nm64 &= (uint64_t{1} << length) - 1;
+    if (avail < 64) {
+        nm &= (uint64_t{1} << avail) - 1;
     }
-    if (nm64 != 0) {
-        const uint64_t before = (nm64 & (0 - nm64)) - 1;
-        cm64 &= before;
-        *bad = (bm64 & before) != 0;
-        int n = 0;
-        for (; cm64 != 0; cm64 &= cm64 - 1, ++n) {
-            if (n < 8) {
-                commas[n] = static_cast<size_t>(__builtin_ctzll(cm64));
-            }
-        }
-        *count = n;
-        return static_cast<size_t>(__builtin_ctzll(nm64)) + 1;
+    if (nm == 0) {
+        return false;
     }
+    const size_t end = static_cast<size_t>(__builtin_ctzll(nm));
+    const uint64_t before = (nm & (0 - nm)) - 1;
+    *length = end + 1;
+    cm &= before;
+    // An empty field, which strtok would not see: a comma first, two together, or one last.
+    const uint64_t last = end > 0 ? uint64_t{1} << (end - 1) : 1;
+    *plain = (bm & before) == 0 && (cm & 1) == 0 && (cm & (cm >> 1)) == 0 && (cm & last) == 0;
+    size_t start = 0;
+    int k = 0;
+    for (; *plain && cm != 0 && k < 8; cm &= cm - 1, ++k) {
+        const size_t pos = static_cast<size_t>(__builtin_ctzll(cm));
+        out->field[k] = std::string_view(p + start, pos - start);
+        start = pos + 1;
+    }
+    if (k != 7 || cm != 0) {
+        *plain = false;
+    } else if (*plain) {
+        out->field[7] = std::string_view(p + start, end - start);
+    }
+    return true;
+}
+#endif
+
+#ifdef __SSE2__
+size_t FindSeparators(const char *p, size_t length, size_t (&commas)[8], int *count, bool *bad) {
+    const __m128i comma = _mm_set1_epi8(','), lf = _mm_set1_epi8('\n'), cr = _mm_set1_epi8('\r');
+    const __m128i nul = _mm_setzero_si128();
     int n = 0;
     unsigned badBits = 0;
     for (size_t i = 0; i < length; i += 16) {
@@ -186,6 +204,11 @@ size_t FindSeparators(const char *p, size_t length, size_t (&commas)[8], int *co
 }  // namespace
 
 size_t ScanLine(const char *p, size_t avail, PlainLine *out, bool *plain) {
+#ifdef __SSE2__
+    if (size_t length = 0; ScanShort(p, avail, out, plain, &length)) {
+        return length;
+    }
+#endif
     size_t commas[8];
     int count = 0;
     bool bad = false;
