@@ -231,21 +231,7 @@ size_t ScanLine(const char *p, size_t avail, PlainLine *out, bool *plain) {
     return length;
 }
 
-long NumberOf(std::string_view field) {
-    if (field.size() <= 18) {
-        long value = 0;
-        bool digits = true;
-        for (const char c : field) {
-            if (c < '0' || c > '9') {
-                digits = false;
-                break;
-            }
-            value = value * 10 + (c - '0');  // 18 digits stay below 2^63
-        }
-        if (digits) {
-            return value;
-        }
-    }
+long NumberOfText(std::string_view field) {
     char small[32];
     if (field.size() < sizeof small) {
         memcpy(small, field.data(), field.size());
@@ -273,12 +259,9 @@ Clock ReadClock() {
     return clock;
 }
 
-bool Expired(const Clock &clock, long lastAccess) {
-    if (lastAccess < 1) {
-        NVO_SET_QUIB_ERR(kModule, QUIB_ERR_BAD_PARAMETER);
-        return true;
-    }
-    return !clock.haveNow || lastAccess > clock.now || clock.now - lastAccess > clock.timeoutSeconds;
+bool ExpiredWithoutTime() {
+    NVO_SET_QUIB_ERR(kModule, QUIB_ERR_BAD_PARAMETER);
+    return true;
 }
 
 int OpenOwnFile(const char *path, bool forWriting, off_t *size) {

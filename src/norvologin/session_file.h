@@ -46,7 +46,13 @@ struct Clock {
 bool Uptime(long *now);
 Clock ReadClock();
 // A last access below 1, ahead of now (a /tmp kept across a restart) or older than the timeout.
-bool Expired(const Clock &clock, long lastAccess);
+bool ExpiredWithoutTime();  // sets the error slot
+inline bool Expired(const Clock &clock, long lastAccess) {
+    if (lastAccess < 1) {
+        return ExpiredWithoutTime();
+    }
+    return !clock.haveNow || lastAccess > clock.now || clock.now - lastAccess > clock.timeoutSeconds;
+}
 
 // Opens path without following a link and without blocking on a FIFO; anything but a regular
 // file of the effective user is refused (EACCES). forWriting: made 0600 when missing, and
@@ -88,6 +94,20 @@ struct PlainLine {
 // whose fields are then in *out. Every line of the file at every request goes through here.
 size_t ScanLine(const char *p, size_t avail, PlainLine *out, bool *plain);
 // atol of a field that is not terminated.
-long NumberOf(std::string_view field);
+long NumberOfText(std::string_view field);
+// Inline: it runs for every line of the file at every request.
+inline long NumberOf(std::string_view field) {
+    if (field.size() <= 18) {
+        long value = 0;
+        for (const char c : field) {
+            if (c < '0' || c > '9') {
+                return NumberOfText(field);
+            }
+            value = value * 10 + (c - '0');  // 18 digits stay below 2^63
+        }
+        return value;
+    }
+    return NumberOfText(field);
+}
 
 }  // namespace norvo::login
