@@ -1,6 +1,7 @@
 // The session file's lines as authorisation reads them: the pieces are those fgets gives, and a
-// line taken by the fast path (carried over byte for byte) has exactly the fields the plain
-// strtok reading gives and rewrites to the same bytes; numbers read as atol reads them.
+// line is taken by the fast path (carried over byte for byte) exactly when the plain strtok
+// reading gives eight fields that rewrite to the same bytes, with the same fields; numbers read
+// as atol reads them.
 //
 // Input: the session file's text.
 #include <stddef.h>
@@ -40,33 +41,46 @@ std::vector<std::string> FgetsPieces(const std::string &text) {
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     const std::string text(reinterpret_cast<const char *>(data), size);
-    std::vector<std::string> pieces;
-    norvo::login::ForEachPiece(text, kLineBuffer,
-                               [&](std::string_view piece) { pieces.emplace_back(piece); });
-    if (pieces != FgetsPieces(text)) {
-        abort();
-    }
+    const std::vector<std::string> pieces = FgetsPieces(text);
+    // The scanner may look kScanPad bytes past the end; they are zero as ReadPadded leaves them.
+    std::vector<char> padded(text.begin(), text.end());
+    padded.resize(text.size() + norvo::login::kScanPad, '\0');
+    size_t pos = 0;
     for (const std::string &piece : pieces) {
         norvo::login::PlainLine plain;
-        if (!norvo::login::SplitPlain(piece, &plain)) {
-            continue;
-        }
-        std::string copy = piece;
-        norvo::login::SessionLine line;
-        if (!norvo::login::ParseLine(copy.data(), &line)) {
+        bool isPlain = false;
+        if (pos >= text.size() || norvo::login::ScanLine(padded.data() + pos, text.size() - pos, &plain,
+                                                         &isPlain) != piece.size()) {
             abort();
         }
+        pos += piece.size();
+        // The reference: strtok's fields, joined again, give the piece back exactly.
+        std::string copy = piece;
+        norvo::login::SessionLine line;
         std::string again;
+        if (norvo::login::ParseLine(copy.data(), &line)) {
+            for (int i = 0; i < 8; ++i) {
+                again += std::string(line.field[i]) + (i < 7 ? "," : "\n");
+            }
+        }
+        if (isPlain != (again == piece)) {
+            abort();
+        }
+        if (!isPlain) {
+            continue;
+        }
         for (int i = 0; i < 8; ++i) {
             if (plain.field[i] != line.field[i]) {
                 abort();
             }
-            again += std::string(line.field[i]) + (i < 7 ? "," : "\n");
         }
-        if (again != piece || norvo::login::NumberOf(plain.field[4]) != atol(line.field[4]) ||
+        if (norvo::login::NumberOf(plain.field[4]) != atol(line.field[4]) ||
             norvo::login::NumberOf(plain.field[6]) != atol(line.field[6])) {
             abort();
         }
+    }
+    if (pos != text.size()) {
+        abort();
     }
     return 0;
 }

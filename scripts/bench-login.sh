@@ -2,13 +2,17 @@
 # Requests per second through the web front: lighttpd with norvo.cgi on 127.0.0.1 in a throwaway
 # appliance, one sharing-link session among 1,000 live ones, curl asking for the shared folder's
 # listing 500 times (one at a time, then 8 at once), timed by hyperfine. Also one login's time.
+# First, one authorisation in a fresh process (bench/login_once) with 100, 1,000 and 10,000 live
+# sessions against its floor in a fresh process (bench/login_floor), and the price of merely
+# starting a program that links the library (login_once load).
 #   bench-login.sh [BUILD]     (default build/, configured if missing)
 set -euo pipefail
 root=$(cd "$(dirname "$0")/.." && pwd)
 build=${1:-$root/build}
 bash "$root/scripts/deps.sh" --bench
 [ -f "$build/CMakeCache.txt" ] || cmake -S "$root" -B "$build" -DCMAKE_BUILD_TYPE=Release >/dev/null
-cmake --build "$build" --target norvo-cgi norvo-sandbox -j2 >/dev/null
+cmake -S "$root" -B "$build" -DNORVO_BUILD_BENCH=ON >/dev/null
+cmake --build "$build" --target norvo-cgi norvo-sandbox login_once login_floor -j2 >/dev/null
 build=$(cd "$build" && pwd)
 
 work=$(mktemp -d "$build/bench-login.XXXXXX")
@@ -24,6 +28,18 @@ APPLIANCE
 cat >"$work/inside.sh" <<'INSIDE'
 set -eu
 dir=$(mktemp -d /tmp/webfront.XXXXXX) && mkdir "$dir/htdocs"
+up=$(cut -d. -f1 /proc/uptime)
+for n in 100 1000 10000; do
+    for i in $(seq "$n"); do
+        [ "$i" = $((n / 2)) ] && id=SESSION0000000 || id=$(printf 'other%09d' "$i")
+        printf '192.0.2.1,alice,%s,%s,%s,2,0,L\n' "$id" "$up" "$up"
+    done >/tmp/foldersharing.current.users
+    chmod 600 /tmp/foldersharing.current.users
+    REQUEST_METHOD=GET REMOTE_ADDR=192.0.2.1 hyperfine -N --warmup 20 --runs 300 --export-json "$dir/once$n.json" \
+        "$BENCH/login_floor" "$BENCH/login_once load" "$BENCH/login_once authorize" >/dev/null
+    python3 -c "import json,sys; f,l,a=(r['mean']*1e6 for r in json.load(open(sys.argv[1]))['results']); print(f'{sys.argv[2]:>6} sessions, fresh process: floor {f:.0f} us, library loaded only {l:.0f} us, authorisation {a:.0f} us ({a/f:.2f} x floor; {a-l:.0f} us over loading)')" "$dir/once$n.json" "$n"
+done
+rm /tmp/foldersharing.current.users
 bash "$SOURCE/tools/cgi/lighttpd-conf.sh" "$dir" 18099 "$CGI" >"$dir/lighttpd.conf"
 lighttpd -D -f "$dir/lighttpd.conf" &
 while ! curl -s -o /dev/null http://127.0.0.1:18099/; do sleep 0.05; done
@@ -42,4 +58,4 @@ python3 -c "import json,sys; m=json.load(open(sys.argv[1]))['results'][0]['mean'
 grep -c . /tmp/foldersharing.current.users | sed 's/^/session lines after the run: /'
 INSIDE
 "$build/tools/sandbox/norvo-sandbox" --no-log "$work/appliance" -- \
-    /usr/bin/env SOURCE="$root" CGI="$build/tools/norvo.cgi" /bin/bash "$work/inside.sh"
+    /usr/bin/env SOURCE="$root" CGI="$build/tools/norvo.cgi" BENCH="$build/bench" /bin/bash "$work/inside.sh"

@@ -66,20 +66,18 @@ int HasPrivilege(const char *userName, const char *priv) {
             QUIB_SET_ERR(NssFailureCode(err));
             return 0;
     }
-    ListMatcher matcher(userName);
-    std::string adminEntry = std::string("@") + QUIB_ADMIN_GROUP;
-    if (matcher.Matches(adminEntry) == 1) {
-        return 1;
-    }
+    ListMatcher matcher(userName, user);
+    // The file first: a grant there makes the administrators' own lookup needless.
     static ParsedFile<std::vector<SettingsLine>> file(QUIB_APP_PRIVILEGE_CONF, ParseSettings);
     std::shared_ptr<const std::vector<SettingsLine>> lines;
     if (int readErr = file.Get(&lines); readErr != 0) {
         if (readErr != ENOENT) {
             QUIB_SET_ERR(QUIB_ERR_OPEN_FAILED);
         }
-        return 0;
+    } else if (PrivilegeVerdict(*lines, priv, &matcher) == 1) {
+        return 1;
     }
-    return PrivilegeVerdict(*lines, priv, &matcher) == 1 ? 1 : 0;
+    return matcher.Matches(std::string("@") + QUIB_ADMIN_GROUP) == 1 ? 1 : 0;
 }
 
 }  // namespace

@@ -92,9 +92,9 @@ int ListMatcher::LoadGroups() {
     if (loaded_) {
         return 0;
     }
-    NssUser user;
+    NssUser user = account_;
     int err = 0;
-    switch (FindUserByName(user_, &user, &err)) {
+    switch (haveAccount_ ? NssStatus::kFound : FindUserByName(user_, &user, &err)) {
         case NssStatus::kFound:
             if (!GroupIdsOf(user, &gids_)) {
                 QUIB_SET_ERR(QUIB_ERR_FAILED);

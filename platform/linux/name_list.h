@@ -8,6 +8,8 @@
 #include <string_view>
 #include <vector>
 
+#include "nss.h"
+
 namespace norvo::platform {
 
 // The entries of text with their quotes removed; empty entries are dropped. An unterminated
@@ -21,6 +23,9 @@ namespace norvo::platform {
 class ListMatcher {
 public:
     explicit ListMatcher(std::string user) : user_(std::move(user)) {}
+    // The user's account already found by the caller, so groups need no second lookup.
+    ListMatcher(std::string user, const NssUser &account)
+        : user_(std::move(user)), account_(account), haveAccount_(true) {}
 
     // 1 when entry names the user (ASCII case ignored) or is "@group" of a group the user
     // belongs to (primary or supplementary); 0 when not, also for an unknown user or group;
@@ -34,6 +39,8 @@ private:
     int LoadGroups();
 
     std::string user_;
+    NssUser account_;
+    bool haveAccount_ = false;
     bool loaded_ = false;
     std::vector<gid_t> gids_;
 };

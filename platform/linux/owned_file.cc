@@ -20,20 +20,12 @@ int OpenOwnFile(const char *path, int flags, FileDescriptor *fd) {
     if (strlen(path) >= PATH_MAX) {
         return QUIB_ERR_NAME_TOO_LONG;
     }
-    const std::string text(path);
-    const size_t slash = text.rfind('/');
-    const std::string dirPath = slash == 0 ? "/" : text.substr(0, slash);
-    const std::string name = text.substr(slash + 1);
-    if (name.empty() || name == "." || name == "..") {
+    const char *name = strrchr(path, '/') + 1;
+    if (name[0] == '\0' || strcmp(name, ".") == 0 || strcmp(name, "..") == 0) {
         return QUIB_ERR_BAD_PARAMETER;
     }
-    const FileDescriptor dir(open(dirPath.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-    if (!dir.IsOpen()) {
-        return VLIBCErrFromErrno(errno);
-    }
     // O_NONBLOCK: a FIFO planted under the name must not hang the open.
-    FileDescriptor file(
-        openat(dir.Get(), name.c_str(), flags | O_NOFOLLOW | O_CLOEXEC | O_NOCTTY | O_NONBLOCK, 0600));
+    FileDescriptor file(open(path, flags | O_NOFOLLOW | O_CLOEXEC | O_NOCTTY | O_NONBLOCK, 0600));
     if (!file.IsOpen()) {
         return errno == ELOOP || errno == ENXIO || errno == EISDIR ? QUIB_ERR_ACCESS_DENIED
                                                                    : VLIBCErrFromErrno(errno);

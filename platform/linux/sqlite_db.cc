@@ -28,13 +28,14 @@ int CodeOfSqlite(int rc) {
 
 int OpenSqlite(const std::string &path, const char *schema, SqliteDb *db) {
     sqlite3 *raw = nullptr;
-    const int rc = sqlite3_open_v2(path.c_str(), &raw, SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOFOLLOW, nullptr);
+    const int mode = schema != nullptr ? SQLITE_OPEN_READWRITE : SQLITE_OPEN_READONLY;
+    const int rc = sqlite3_open_v2(path.c_str(), &raw, mode | SQLITE_OPEN_NOFOLLOW, nullptr);
     db->reset(raw);
     if (rc != SQLITE_OK) {
         return CodeOfSqlite(rc);
     }
     sqlite3_busy_timeout(raw, kBusyTimeoutMs);
-    return Exec(raw, schema);
+    return schema != nullptr ? Exec(raw, schema) : QUIB_ERR_NONE;
 }
 
 int Prepare(sqlite3 *db, const char *sql, Statement *out) {

@@ -25,8 +25,9 @@ inline constexpr int kBusyTimeoutMs = 5000;
 // The one translation of SQLite result codes into platform codes.
 [[nodiscard]] int CodeOfSqlite(int rc);
 
-// Opens the database at path read-write, links refused, with the busy timeout, and runs schema.
-// 0 and *db, or a platform code (*db may hold the failed handle; it closes itself).
+// Opens the database at path read-write, links refused, with the busy timeout, and runs schema;
+// a null schema opens it read-only for readers that only ask. 0 and *db, or a platform code
+// (*db may hold the failed handle; it closes itself).
 [[nodiscard]] int OpenSqlite(const std::string &path, const char *schema, SqliteDb *db);
 
 [[nodiscard]] int Prepare(sqlite3 *db, const char *sql, Statement *out);

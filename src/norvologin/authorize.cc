@@ -1,10 +1,12 @@
 // Authorisation of a sharing-link visitor's session, which also sweeps expired lines out of the
 // session file; and the CGI record's lookup of the "id" cookie.
 #include <errno.h>
+#include <limits.h>
 #include <stdarg.h>
 #include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
+#include <sys/uio.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -57,30 +59,80 @@ bool SkipSourceCheck() {
            strcmp(value, "yes") == 0;
 }
 
-bool WriteAll(int fd, const std::string &text) {
-    for (size_t done = 0; done < text.size();) {
-        const ssize_t put = write(fd, text.data() + done, text.size() - done);
-        if (put < 0 && errno == EINTR) {
-            continue;
+// The rewritten file: runs of the text read, carried over as they are, and formatted lines.
+class Output {
+public:
+    explicit Output(const char *text) : text_(text) {}
+    void Keep(size_t offset, size_t length) {
+        if (!pieces_.empty() && !pieces_.back().formatted &&
+            pieces_.back().offset + pieces_.back().length == offset) {
+            pieces_.back().length += length;
+        } else {
+            pieces_.push_back({false, offset, length});
         }
-        if (put <= 0) {
-            return false;
-        }
-        done += static_cast<size_t>(put);
     }
-    return true;
-}
+    void Add(const char *format, ...) __attribute__((format(printf, 2, 3)));
+    // Writes it all to fd; false when any of it could not be written.
+    bool WriteTo(int fd) const;
 
-void Append(std::string *out, const char *format, ...) __attribute__((format(printf, 2, 3)));
-void Append(std::string *out, const char *format, ...) {
+private:
+    struct Piece {
+        bool formatted;  // in lines_, else in the text read
+        size_t offset, length;
+    };
+    const char *text_;
+    std::string lines_;
+    std::vector<Piece> pieces_;
+};
+
+void Output::Add(const char *format, ...) {
     char line[kLineBuffer * 2];
     va_list args;
     va_start(args, format);
     const int n = vsnprintf(line, sizeof line, format, args);
     va_end(args);
     if (n > 0) {
-        out->append(line, std::min(static_cast<size_t>(n), sizeof line - 1));
+        const size_t length = std::min(static_cast<size_t>(n), sizeof line - 1);
+        pieces_.push_back({true, lines_.size(), length});
+        lines_.append(line, length);
     }
+}
+
+bool Output::WriteTo(int fd) const {
+    std::vector<struct iovec> iov;
+    for (const Piece &piece : pieces_) {
+        const char *base = piece.formatted ? lines_.data() : text_;
+        iov.push_back({const_cast<char *>(base + piece.offset), piece.length});
+    }
+    for (size_t first = 0; first < iov.size();) {
+        const int count = static_cast<int>(std::min<size_t>(iov.size() - first, IOV_MAX));
+        ssize_t put = writev(fd, &iov[first], count);
+        if (put < 0 && errno == EINTR) {
+            continue;
+        }
+        if (put <= 0) {
+            return false;
+        }
+        // A short write: skip what went out and go on with the rest.
+        while (first < iov.size() && static_cast<size_t>(put) >= iov[first].iov_len) {
+            put -= static_cast<ssize_t>(iov[first].iov_len);
+            ++first;
+        }
+        if (first < iov.size()) {
+            iov[first].iov_base = static_cast<char *>(iov[first].iov_base) + put;
+            iov[first].iov_len -= static_cast<size_t>(put);
+        }
+    }
+    return true;
+}
+
+// Equality of a line's field and a given text; most fields differ in their first byte.
+inline bool Same(std::string_view field, std::string_view text) {
+    return field.size() == text.size() && (text.empty() || field[0] == text[0]) && field == text;
+}
+// Whether a number field reads 0, as the persistent flag mostly does.
+inline bool IsZero(std::string_view field) {
+    return field == "0" || static_cast<int>(NumberOf(field)) == 0;
 }
 
 // The decision for the session's own line; false when the line is to be dropped.
@@ -154,7 +206,8 @@ int NorvoLogin::IsAuthorizedByPath(QUIB::WebCGI *cgi, const char *sessionId, cha
         const Section section(&lock);
         // Read under the lock: a line written meanwhile would otherwise lie ahead of it.
         const Clock clock = ReadClock();
-        const int in = OpenOwnFile(SessionFile().c_str(), false);
+        off_t size = 0;
+        const int in = OpenOwnFile(SessionFile().c_str(), false, &size);
         if (in < 0) {
             NVO_SET_QUIB_ERR(kModule, QUIB_ERR_OPEN_FAILED);
             return;  // no sessions: the cookie names none
@@ -168,12 +221,12 @@ int NorvoLogin::IsAuthorizedByPath(QUIB::WebCGI *cgi, const char *sessionId, cha
             return;
         }
         Fd outOwned(&out);
-        std::string text, kept;
-        if (!ReadAll(in, &text)) {
+        FileText text;
+        if (!ReadPadded(in, static_cast<size_t>(size), &text)) {
             result = -4, known = true;
             return;
         }
-        kept.reserve(text.size() + 64);
+        Output kept(text.data.get());
         int skip = -1;  // read when first needed
         std::vector<char> copy(kLineBuffer);
         const auto judge = [&](char *buf) {
@@ -192,9 +245,9 @@ int NorvoLogin::IsAuthorizedByPath(QUIB::WebCGI *cgi, const char *sessionId, cha
                 const Verdict verdict = Judge(line, user, *policy, position, expired);
                 result = verdict.result;
                 if (verdict.keep && !verdict.asRead) {
-                    Append(&kept, "%s,%s,%s,%s,%ld,%d,%s,%s\n", line.field[0], line.field[1], line.field[2],
-                           line.field[3], policy->noRefresh != 0 ? line.LastAccess() : clock.now,
-                           static_cast<int>(position), line.field[6], line.field[7]);
+                    kept.Add("%s,%s,%s,%s,%ld,%d,%s,%s\n", line.field[0], line.field[1], line.field[2],
+                             line.field[3], policy->noRefresh != 0 ? line.LastAccess() : clock.now,
+                             static_cast<int>(position), line.field[6], line.field[7]);
                 }
                 if (!verdict.asRead) {
                     return;
@@ -202,24 +255,28 @@ int NorvoLogin::IsAuthorizedByPath(QUIB::WebCGI *cgi, const char *sessionId, cha
             } else if (expired) {
                 return;
             }
-            Append(&kept, "%s,%s,%s,%s,%s,%s,%s,%s\n", line.field[0], line.field[1], line.field[2],
-                   line.field[3], line.field[4], line.field[5], line.field[6], line.field[7]);
+            kept.Add("%s,%s,%s,%s,%s,%s,%s,%s\n", line.field[0], line.field[1], line.field[2], line.field[3],
+                     line.field[4], line.field[5], line.field[6], line.field[7]);
         };
-        ForEachPiece(text, kLineBuffer, [&](std::string_view piece) {
+        const std::string_view id(sessionId), cookie(cookieName);
+        for (size_t pos = 0; pos < text.size;) {
+            const char *piece = text.data.get() + pos;
             PlainLine plain;
-            if (SplitPlain(piece, &plain) && (plain.field[2] != sessionId || plain.field[7] != cookieName)) {
-                if (static_cast<int>(NumberOf(plain.field[6])) != 0 ||
-                    !Expired(clock, NumberOf(plain.field[4]))) {
-                    kept.append(piece);
+            bool isPlain = false;
+            const size_t length = ScanLine(piece, text.size - pos, &plain, &isPlain);
+            if (isPlain && (!Same(plain.field[2], id) || plain.field[7] != cookie)) {
+                if (!IsZero(plain.field[6]) || !Expired(clock, NumberOf(plain.field[4]))) {
+                    kept.Keep(pos, length);
                 }
-                return;
+            } else {
+                memcpy(copy.data(), piece, length);
+                copy[length] = '\0';
+                judge(copy.data());
             }
-            memcpy(copy.data(), piece.data(), piece.size());
-            copy[piece.size()] = '\0';
-            judge(copy.data());
-        });
+            pos += length;
+        }
         // A short or failed write keeps the old file: the scratch file goes, never over it.
-        const bool written = WriteAll(out, kept);
+        const bool written = kept.WriteTo(out);
         outOwned.release();
         const bool closed = close(out) == 0;
         if (!written || !closed || VLIBCSysRename(SessionScratch().c_str(), SessionFile().c_str()) != 0) {

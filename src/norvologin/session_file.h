@@ -2,8 +2,10 @@
 // client's address, the parsing of a line, the expiry test, and opening its files.
 #pragma once
 #include <string.h>
+#include <sys/types.h>
 
 #include <algorithm>
+#include <memory>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -44,11 +46,18 @@ struct Clock {
 bool Uptime(long *now);
 Clock ReadClock();
 // A last access below 1, ahead of now (a /tmp kept across a restart) or older than the timeout.
-bool Expired(const Clock &clock, long lastAccess);
+bool ExpiredWithoutTime();  // sets the error slot
+inline bool Expired(const Clock &clock, long lastAccess) {
+    if (lastAccess < 1) {
+        return ExpiredWithoutTime();
+    }
+    return !clock.haveNow || lastAccess > clock.now || clock.now - lastAccess > clock.timeoutSeconds;
+}
 
 // Opens path without following a link and without blocking on a FIFO; anything but a regular
-// file of the effective user is refused (EACCES). create: made 0600 when missing, and emptied.
-int OpenOwnFile(const char *path, bool forWriting);
+// file of the effective user is refused (EACCES). forWriting: made 0600 when missing, and
+// emptied. *size (when given) is the size of the file opened.
+int OpenOwnFile(const char *path, bool forWriting, off_t *size = nullptr);
 // The whole file of descriptor fd; false on a read error.
 bool ReadAll(int fd, std::string *text);
 // Calls fn with each piece of text that fgets with a buffer of bufferSize would give.
@@ -65,14 +74,40 @@ void ForEachPiece(const std::string &text, int bufferSize, F &&fn) {
     }
 }
 
+// The session file's text, followed by kScanPad zero bytes that ScanLine may look at.
+inline constexpr size_t kScanPad = 64;
+struct FileText {
+    std::unique_ptr<char[]> data;
+    size_t size = 0;
+};
+// The whole file of fd (of about sizeHint bytes); false on a read error.
+bool ReadPadded(int fd, size_t sizeHint, FileText *text);
+
 // A piece as the session's own writers write a line: LF-ended, eight non-empty fields, no CR
 // or NUL. Its fields are exactly what ParseLine gives, and written back unchanged it is these
 // same bytes, so the many lines an authorisation only carries over need no formatting.
 struct PlainLine {
     std::string_view field[8];
 };
-bool SplitPlain(std::string_view piece, PlainLine *out);
+// The length of the piece at p that fgets with a kLineBuffer buffer would give, of the avail
+// bytes left (kScanPad more readable after them); *plain tells whether it is a plain line,
+// whose fields are then in *out. Every line of the file at every request goes through here.
+size_t ScanLine(const char *p, size_t avail, PlainLine *out, bool *plain);
 // atol of a field that is not terminated.
-long NumberOf(std::string_view field);
+long NumberOfText(std::string_view field);
+// Inline: it runs for every line of the file at every request.
+inline long NumberOf(std::string_view field) {
+    if (field.size() <= 18) {
+        long value = 0;
+        for (const char c : field) {
+            if (c < '0' || c > '9') {
+                return NumberOfText(field);
+            }
+            value = value * 10 + (c - '0');  // 18 digits stay below 2^63
+        }
+        return value;
+    }
+    return NumberOfText(field);
+}
 
 }  // namespace norvo::login

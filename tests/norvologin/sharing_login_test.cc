@@ -114,6 +114,8 @@ TEST_F(SharingLogin, AuthorisesEachLineAsItsFieldsSay) {
         {"192.0.2.1,alice,ID,T9,T1,1\n192.0.2.1,bob,X,T9,T1\n", {}, {15, 0}, 0, -2, "192.0.2.1,alice,ID,T9,T1,1,0,0"},
         {"192.0.2.1,alice,ID,T9,T1,1", {}, {15, 0}, 0, -2, "192.0.2.1,alice,ID,T9,T1,1,0,0"},
         {"192.0.2.1,bob,X,T9,T901,1,0,L\n192.0.2.1,bob,Y,T9,T2,1,1,L", {}, {15, 0}, 0, -2, "192.0.2.1,bob,Y,T9,T2,1,1,L"},
+        {"192.0.2.1,bob,X,T9,T2,1,0,L\n192.0.2.1,alice,ID,T9,T1,1,0,L\n192.0.2.1,bob,Y,T9,T901,1,0,L\n192.0.2.1,bob,Z,T9,T3,1,0,L", {}, {15, 0}, 2, 1,
+         "192.0.2.1,bob,X,T9,T2,1,0,L\n192.0.2.1,alice,ID,T9,T0,2,0,L\n192.0.2.1,bob,Z,T9,T3,1,0,L"},
     };
     const auto expand = [](std::string text, long now) {
         std::smatch m;
