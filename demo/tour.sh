@@ -139,10 +139,11 @@ show "A task id that getUniqueID would never make reaches no path: no such task"
     search-db --user alice --volume /volume1 --task ../../etc list
 # search_as USER EXPLANATION: USER's search for txt, beach and diary in three shares, then its hits.
 search_as() {
-    show "$2" search --user "$1" --name txt,beach,diary /public /photo /archive
-    id=$("$NORVO" --json search --user "$1" --name txt,beach,diary /public /photo /archive |
-        sed 's/.*"task":"\([0-9A-F]*\)".*/\1/')
-    show "... and a later request pages $1's hits (search task $id), largest first" \
+    out=$(show "$2" search --user "$1" --name txt,beach,diary /public /photo /archive)
+    step=$((step + 1)) # show ran in a subshell
+    printf '%s\n' "$out"
+    id=$(printf '%s\n' "$out" | sed -n 's/^ *task *\([0-9A-F]*\)$/\1/p')
+    show "... and a later request pages $1's hits, largest first" \
         search-results --user "$1" --task "$id" --sort size --desc
 }
 search_as alice "alice searches three shares on two volumes (walked: no volume index yet)"
