@@ -124,6 +124,7 @@ typedef int (*FILEIDX_ROW_FILTER)(const char *dir, const char *name, void *arg);
 typedef struct __tag_FI_TABLE_GEN_CONTEXT {
     const char *outputDbPath;  // a database made by FILEIDXDBCreate
     void *filterArg;           // handed to the filter unchanged
+    int filesAndFolders;       // non-zero: rows of regular files and folders only
 } FI_TABLE_GEN_CONTEXT;
 
 // An output database open for a run of inserts (FILEIDXOutputDBOpen).
