@@ -127,7 +127,7 @@ typedef struct __tag_FI_TABLE_GEN_CONTEXT {
     int filesAndFolders;       // non-zero: rows of regular files and folders only
 } FI_TABLE_GEN_CONTEXT;
 
-// An output database open for a run of inserts (FILEIDXOutputDBOpen).
+// An output database open for a run of inserts (FILEIDXOutputDBOpen); one thread at a time.
 typedef struct __tag_FI_OUTPUT_DB FI_OUTPUT_DB;
 
 QUIB_BEGIN_C

@@ -385,12 +385,11 @@ private:
             sqlite3_reset(names.get());
             sqlite3_bind_int64(names.get(), 1, id);
             const int rc = sqlite3_step(names.get());
-            out->clear();
             if (rc == SQLITE_ROW) {
-                *out = SplitNames(sqlite3_column_blob(names.get(), 0), sqlite3_column_bytes(names.get(), 0),
-                                  most);
+                SplitNames(sqlite3_column_blob(names.get(), 0), sqlite3_column_bytes(names.get(), 0), most, out);
                 return QUIB_ERR_NONE;
             }
+            out->clear();
             return rc == SQLITE_DONE ? QUIB_ERR_NONE : FileIdxCodeOf(db.get(), rc);
         };
         std::vector<std::string> list;
@@ -676,7 +675,9 @@ private:
             }
         }
         for (const Alternatives &alts : direct_) {
+            operands_.emplace_back();
             for (const __tag_FI_SQL_COND *c : alts) {
+                operands_.back().push_back(Operand(*c));
                 const bool ok =
                     (c->type == FI_COND_NAME && (c->op == FI_OP_LIKE || c->op == FI_OP_EQ)) ||
                     (c->type == FI_COND_PATH &&
@@ -691,11 +692,12 @@ private:
     }
 
     bool Holds(const __tag_FI_FILE_INFO_DATA &r) const {
-        for (const Alternatives &alts : direct_) {
+        for (size_t k = 0; k < direct_.size(); ++k) {
+            const Alternatives &alts = direct_[k];
             bool any = false;
             for (size_t i = 0; !any && i < alts.size(); ++i) {
                 const __tag_FI_SQL_COND &c = *alts[i];
-                const std::string operand = Operand(c);
+                const std::string &operand = operands_[k][i];
                 const char *field = c.type == FI_COND_NAME   ? r.name
                                     : c.type == FI_COND_PATH ? r.path
                                                              : r.share;
@@ -783,6 +785,7 @@ private:
     std::vector<std::unique_ptr<__tag_FI_FILE_INFO_DATA>> batch_;  // reused; used_ of them hold rows
     size_t used_ = 0;
     std::vector<Alternatives> direct_;  // the chains' conjuncts when decided here, see Direct
+    std::vector<std::vector<std::string>> operands_;  // of direct_'s records, read once
     bool decided_ = false;
     FileIdxDb check_;
     Statement insert_;
@@ -795,20 +798,35 @@ private:
 // one before (names are at most 255 bytes), the rest of it, and a NUL.
 std::vector<std::string> SplitNames(const void *blob, int size, size_t most) {
     std::vector<std::string> names;
+    SplitNames(blob, size, most, &names);
+    return names;
+}
+
+void SplitNames(const void *blob, int size, size_t most, std::vector<std::string> *out) {
     const char *p = static_cast<const char *>(blob);
     const char *end = p + (size > 0 ? size : 0);
-    std::string previous;
-    while (p < end && names.size() < most) {
-        const size_t shared =
-            std::min(static_cast<size_t>(static_cast<unsigned char>(*p++)), previous.size());
+    size_t count = 0;
+    while (p < end && count < most) {
+        // Each name is built in its slot, over the slot's old text: no allocation once warm.
+        if (count == out->size()) {
+            out->emplace_back();
+        }
+        std::string &name = (*out)[count];
+        const std::string *previous = count == 0 ? nullptr : &(*out)[count - 1];
+        const size_t shared = std::min(static_cast<size_t>(static_cast<unsigned char>(*p++)),
+                                       previous == nullptr ? size_t{0} : previous->size());
         const char *nul = static_cast<const char *>(memchr(p, '\0', static_cast<size_t>(end - p)));
         const char *stop = nul == nullptr ? end : nul;
-        previous.resize(shared);
-        previous.append(p, stop);
-        names.push_back(previous);
+        if (previous != nullptr) {
+            name.assign(*previous, 0, shared);
+        } else {
+            name.clear();
+        }
+        name.append(p, stop);
+        ++count;
         p = stop + 1;
     }
-    return names;
+    out->resize(count);
 }
 
 std::string JoinNames(const std::vector<std::string> &names) {

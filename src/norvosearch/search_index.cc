@@ -41,8 +41,7 @@ struct FilterContext {
     // The answer for the folder of the rows before: rows come folder by folder.
     std::string dir;
     bool dirKept = false;
-    std::string root, rest;  // the folder's share folder and its path below it
-    size_t depth = 0;        // components of rest
+    size_t depth = 0;  // of the folder below its share's
 };
 
 // The chosen folder dir lies in (or is, with currentDirOnly); null when none.
@@ -59,15 +58,16 @@ const PathInfo *FolderOf(const FilterContext &ctx, const std::string &dir) {
 
 // Whether rows of the folder dir may be kept at all, their names aside.
 bool KeepDir(FilterContext &ctx, const std::string &dir) {
+    std::string root, rest;
     if (FolderOf(ctx, dir) == nullptr ||
-        norvo::search::SplitRealPath(dir + "/", &ctx.root, &ctx.rest) != norvo::search::SplitResult::kOk) {
+        norvo::search::SplitRealPath(dir + "/", &root, &rest) != norvo::search::SplitResult::kOk) {
         return false;
     }
-    if (!ctx.rest.empty()) {
-        ctx.rest.pop_back();
+    if (!rest.empty()) {
+        rest.pop_back();
     }
-    ctx.depth = ctx.rest.empty() ? 0 : 1 + static_cast<size_t>(std::count(ctx.rest.begin(), ctx.rest.end(), '/'));
-    return !norvo::search::OutOfSight(ctx.root, ctx.rest) && ctx.privileges.findDirPrivilege(dir + "/");
+    ctx.depth = rest.empty() ? 0 : 1 + static_cast<size_t>(std::count(rest.begin(), rest.end(), '/'));
+    return !norvo::search::OutOfSight(root, rest) && ctx.privileges.findDirPrivilege(dir + "/");
 }
 
 // The platform hands only rows it has just looked at as the caller, in a folder it opened from
@@ -85,10 +85,12 @@ int KeepRow(const char *dir, const char *name, void *arg) {
         if (!ctx.dirKept || QUIBEAIsHiddenFile(name) != 0) {
             return 0;
         }
-        const std::string rest = ctx.rest.empty() ? std::string(name) : ctx.rest + "/" + name;
         // A bin is a share's top folder, or a home's one level deeper.
-        if (ctx.depth < 2 && QUIBShareIsShareRecycle((ctx.root + "/" + rest).c_str()) == 1) {
-            return 0;
+        if (ctx.depth < 2) {
+            const std::string bin = ctx.dir + "/" + name;
+            if (QUIBShareIsShareRecycle(bin.c_str()) == 1) {
+                return 0;
+            }
         }
         if (ctx.extra.empty()) {
             return 1;
