@@ -170,7 +170,8 @@ public:
                            real_.c_str(), strerror(err), VLIBCErrGet());
                 return false;
             }
-            const std::string entryName(name);
+            entry_.assign(name);  // reused: no allocation per entry
+            const std::string &entryName = entry_;
             if (visit.pre != nullptr && !(*visit.pre)(user_, basePath_, real_, entryName, st, extra_)) {
                 return false;
             }
@@ -292,6 +293,7 @@ private:
     const std::string *const extra_;
     std::string real_;
     std::string user_;
+    std::string entry_;  // the name of the entry being visited
     std::vector<std::unique_ptr<Level>> levels_;
 };
 
