@@ -149,14 +149,17 @@ public:
                 continue;
             }
             const char *name = level.names.c_str() + level.next;
-            level.next += strlen(name) + 1;
+            const size_t length = strlen(name);
+            level.next += length + 1;
             if (QUIBEAIsHiddenFile(name) != 0) {
                 continue;
             }
             real_.resize(level.realLength);
             user_.resize(level.userLength);
-            real_.append("/").append(name);
-            user_.append("/").append(name);
+            real_.push_back('/');
+            real_.append(name, length);
+            user_.push_back('/');
+            user_.append(name, length);
             if (visit.skipRecycle && QUIBShareIsShareRecycle(real_.c_str()) == 1) {
                 continue;
             }
@@ -170,7 +173,7 @@ public:
                            real_.c_str(), strerror(err), VLIBCErrGet());
                 return false;
             }
-            entry_.assign(name);  // reused: no allocation per entry
+            entry_.assign(name, length);  // reused: no allocation per entry
             const std::string &entryName = entry_;
             if (visit.pre != nullptr && !(*visit.pre)(user_, basePath_, real_, entryName, st, extra_)) {
                 return false;
