@@ -54,21 +54,9 @@ inline const uint8_t *Decode(const uint8_t *text, UChar32 *c) {
     return text;
 }
 
-// Decode when every byte of both texts is below 0x80 (kAscii): each byte is its own character,
-// which is what Decode makes of it too, without the tests.
-template <bool kAscii>
-inline const uint8_t *Next(const uint8_t *text, UChar32 *c) {
-    if (kAscii) {
-        *c = *text;
-        return text + 1;
-    }
-    return Decode(text, c);
-}
-
-template <bool kAscii>
 inline const uint8_t *Skip(const uint8_t *text) {
     UChar32 ignored;
-    return Next<kAscii>(text, &ignored);
+    return Decode(text, &ignored);
 }
 
 // A pattern element: a star, a one-character wildcard, a literal (folded), or the end of the
@@ -84,13 +72,12 @@ struct Element {
 
 // Star and question mark are recognised before the escape character, so an escape character
 // of '*' or '?' acts as the wildcard (intended: that is the order in which they are tested).
-template <bool kAscii>
 inline Element Read(const uint8_t *pattern, UChar32 esc) {
     if (*pattern == 0) {
         return {Kind::kEnd, 0, pattern};
     }
     UChar32 c;
-    const uint8_t *next = Next<kAscii>(pattern, &c);
+    const uint8_t *next = Decode(pattern, &c);
     if (c == kMatchAll) {
         return {Kind::kAll, 0, next};
     }
@@ -101,7 +88,7 @@ inline Element Read(const uint8_t *pattern, UChar32 esc) {
         if (*next == 0) {
             return {Kind::kEscapedEnd, 0, next};
         }
-        next = Next<kAscii>(next, &c);
+        next = Decode(next, &c);
     }
     return {Kind::kLiteral, Fold(c), next};
 }
@@ -111,9 +98,8 @@ inline Element Read(const uint8_t *pattern, UChar32 esc) {
 // ASCII letter folds as that letter does in the pattern. Above ASCII only U+017F and U+212A fold
 // into ASCII (case folding is stable across Unicode versions; a test checks the linked ICU), so
 // most comparisons of names with an ASCII pattern need no call.
-template <bool kAscii>
 inline bool FoldsTo(const uint8_t *s, UChar32 literal, const uint8_t **next) {
-    if (kAscii || *s < 0x80) {
+    if (*s < 0x80) {
         *next = s + 1;
         return kAsciiFold.to[*s] == literal;
     }
@@ -129,11 +115,10 @@ inline bool FoldsTo(const uint8_t *s, UChar32 literal, const uint8_t **next) {
 }
 
 // Past the first character from s on that folds to literal; null when the subject ends first.
-template <bool kAscii>
 inline const uint8_t *SeekPast(const uint8_t *s, UChar32 literal) {
     while (*s != 0) {
         const uint8_t *next;
-        if (FoldsTo<kAscii>(s, literal, &next)) {
+        if (FoldsTo(s, literal, &next)) {
             return next;
         }
         s = next;
@@ -141,7 +126,6 @@ inline const uint8_t *SeekPast(const uint8_t *s, UChar32 literal) {
     return nullptr;
 }
 
-template <bool kAscii>
 int Match(const uint8_t *pattern, const uint8_t *subject, UChar32 esc) {
     const uint8_t *p = pattern;
     const uint8_t *s = subject;
@@ -153,7 +137,7 @@ int Match(const uint8_t *pattern, const uint8_t *subject, UChar32 esc) {
     const uint8_t *starPattern = nullptr;
     const uint8_t *starResume = nullptr;
     for (;;) {
-        const Element e = Read<kAscii>(p, esc);
+        const Element e = Read(p, esc);
         bool advanced = false;
         switch (e.kind) {
             case Kind::kEnd:
@@ -170,7 +154,7 @@ int Match(const uint8_t *pattern, const uint8_t *subject, UChar32 esc) {
                         return 1;
                     }
                     UChar32 c;
-                    const uint8_t *next = Next<kAscii>(p, &c);
+                    const uint8_t *next = Decode(p, &c);
                     if (c != kMatchAll && c != kMatchOne) {
                         break;
                     }
@@ -178,14 +162,14 @@ int Match(const uint8_t *pattern, const uint8_t *subject, UChar32 esc) {
                         if (*s == 0) {
                             return 0;
                         }
-                        s = Skip<kAscii>(s);
+                        s = Skip(s);
                     }
                     p = next;
                 }
                 // The rest is tried at each character of the subject, never at its end; so an
                 // escape character that ends the pattern here can never match.
-                const Element first = Read<kAscii>(p, esc);
-                starResume = first.kind == Kind::kLiteral ? SeekPast<kAscii>(s, first.folded) : nullptr;
+                const Element first = Read(p, esc);
+                starResume = first.kind == Kind::kLiteral ? SeekPast(s, first.folded) : nullptr;
                 if (starResume == nullptr) {
                     return 0;
                 }
@@ -199,7 +183,7 @@ int Match(const uint8_t *pattern, const uint8_t *subject, UChar32 esc) {
             }
             case Kind::kOne:
                 if (*s != 0) {
-                    s = Skip<kAscii>(s);
+                    s = Skip(s);
                     p = e.next;
                     advanced = true;
                 }
@@ -207,7 +191,7 @@ int Match(const uint8_t *pattern, const uint8_t *subject, UChar32 esc) {
             case Kind::kLiteral:
                 if (*s != 0) {
                     const uint8_t *next;
-                    if (FoldsTo<kAscii>(s, e.folded, &next)) {
+                    if (FoldsTo(s, e.folded, &next)) {
                         s = next;
                         p = e.next;
                         advanced = true;
@@ -219,20 +203,12 @@ int Match(const uint8_t *pattern, const uint8_t *subject, UChar32 esc) {
             continue;
         }
         // Try the piece after the star one character further on.
-        if (!star || (starResume = SeekPast<kAscii>(starResume, starLiteral)) == nullptr) {
+        if (!star || (starResume = SeekPast(starResume, starLiteral)) == nullptr) {
             return 0;
         }
         s = starResume;
         p = starPattern;
     }
-}
-
-inline bool Ascii(const uint8_t *text) {
-    uint8_t any = 0;
-    for (; *text != 0; ++text) {
-        any |= *text;
-    }
-    return any < 0x80;
 }
 
 }  // namespace
@@ -241,8 +217,5 @@ int VLIBCUnicodeUTF8LikeMatch(const char *pattern, const char *subject, int esc)
     if (pattern == nullptr || subject == nullptr) {
         return 0;
     }
-    const auto *p = reinterpret_cast<const uint8_t *>(pattern);
-    const auto *s = reinterpret_cast<const uint8_t *>(subject);
-    // Most names and patterns are ASCII: a byte then is a character, and folds by the table.
-    return Ascii(p) && Ascii(s) ? Match<true>(p, s, esc) : Match<false>(p, s, esc);
+    return Match(reinterpret_cast<const uint8_t *>(pattern), reinterpret_cast<const uint8_t *>(subject), esc);
 }
