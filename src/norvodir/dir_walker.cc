@@ -71,6 +71,7 @@ int ReadNames(int fd, Level *level) {
         if (got == 0) {
             return 0;
         }
+        level->names.reserve(level->names.size() + static_cast<size_t>(got));  // names never outgrow records
         for (ssize_t at = 0; at < got;) {
             const auto *entry = reinterpret_cast<const struct dirent64 *>(buffer.get() + at);
             level->names.append(entry->d_name, strlen(entry->d_name) + 1);
