@@ -173,15 +173,8 @@ private:
     std::set<const __tag_FI_SQL_COND *> seen_;
 };
 
-// FI_OP_PATH_LIKE: components of the pattern against those of the path; a lone "*" is one or
-// more components, "\" makes the next byte literal elsewhere.
-struct PatternPart {
-    bool star;
-    std::string literal;
-};
-
-std::vector<PatternPart> SplitPattern(std::string_view pattern) {
-    std::vector<PatternPart> parts(1);
+std::vector<FileIdxPathPart> SplitPattern(std::string_view pattern) {
+    std::vector<FileIdxPathPart> parts(1);
     bool escaped = false;
     bool anyEscape = false;
     for (const char c : pattern) {
@@ -202,24 +195,22 @@ std::vector<PatternPart> SplitPattern(std::string_view pattern) {
     return parts;
 }
 
-std::vector<std::string_view> SplitPath(std::string_view path) {
-    std::vector<std::string_view> parts;
+void SplitPath(std::string_view path, std::vector<std::string_view> *parts) {
+    parts->clear();
     size_t from = 0;
     for (;;) {
         const size_t slash = path.find('/', from);
-        parts.push_back(
+        parts->push_back(
             path.substr(from, slash == std::string_view::npos ? std::string_view::npos : slash - from));
         if (slash == std::string_view::npos) {
-            return parts;
+            return;
         }
         from = slash + 1;
     }
 }
 
 // A star is one component followed by any number, so only the last star ever backtracks.
-bool PathLikeMatch(std::string_view pattern, std::string_view path) {
-    const std::vector<PatternPart> p = SplitPattern(pattern);
-    const std::vector<std::string_view> s = SplitPath(path);
+bool PathLikeMatch(const std::vector<FileIdxPathPart> &p, const std::vector<std::string_view> &s) {
     size_t i = 0;
     size_t j = 0;
     size_t starAt = SIZE_MAX;
@@ -239,6 +230,12 @@ bool PathLikeMatch(std::string_view pattern, std::string_view path) {
         }
     }
     return i == p.size();
+}
+
+bool PathLikeMatch(std::string_view pattern, std::string_view path) {
+    std::vector<std::string_view> parts;
+    SplitPath(path, &parts);
+    return PathLikeMatch(SplitPattern(pattern), parts);
 }
 
 std::string_view TextOf(sqlite3_value *value) {
@@ -403,6 +400,13 @@ int Open(const char *path, FileIdxDb *db) {
 
 bool FileIdxPathLike(std::string_view pattern, std::string_view path) {
     return PathLikeMatch(pattern, path);
+}
+
+FileIdxPathPattern::FileIdxPathPattern(std::string_view pattern) : parts_(SplitPattern(pattern)) {}
+
+bool FileIdxPathPattern::Matches(std::string_view path) {
+    SplitPath(path, &path_);
+    return PathLikeMatch(parts_, path_);
 }
 
 const char kFileIdxColumns[] =

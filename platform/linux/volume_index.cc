@@ -707,7 +707,10 @@ private:
         for (const Alternatives &alts : direct_) {
             operands_.emplace_back();
             for (const __tag_FI_SQL_COND *c : alts) {
-                operands_.back().push_back(Operand(*c));
+                const std::string text = Operand(*c);
+                operands_.back().push_back(
+                    {text, c->type == FI_COND_PATH && c->op != FI_OP_EQ ? std::make_unique<FileIdxPathPattern>(text)
+                                                                         : nullptr});
                 const bool ok =
                     (c->type == FI_COND_NAME && (c->op == FI_OP_LIKE || c->op == FI_OP_EQ)) ||
                     (c->type == FI_COND_PATH &&
@@ -721,13 +724,14 @@ private:
         return true;
     }
 
-    bool Holds(const __tag_FI_FILE_INFO_DATA &r) const {
+    bool Holds(const __tag_FI_FILE_INFO_DATA &r) {
         for (size_t k = 0; k < direct_.size(); ++k) {
             const Alternatives &alts = direct_[k];
             bool any = false;
             for (size_t i = 0; !any && i < alts.size(); ++i) {
                 const __tag_FI_SQL_COND &c = *alts[i];
-                const std::string &operand = operands_[k][i];
+                DirectOperand &o = operands_[k][i];
+                const std::string &operand = o.text;
                 const char *field = c.type == FI_COND_NAME   ? r.name
                                     : c.type == FI_COND_PATH ? r.path
                                                              : r.share;
@@ -736,10 +740,10 @@ private:
                         any = VLIBCUnicodeUTF8LikeMatch(operand.c_str(), field, '\\') != 0;
                         break;
                     case FI_OP_PATH_LIKE:
-                        any = FileIdxPathLike(operand, field);
+                        any = o.path->Matches(field);
                         break;
                     case FI_OP_PATH_NOT_LIKE:
-                        any = !FileIdxPathLike(operand, field);
+                        any = !o.path->Matches(field);
                         break;
                     default:
                         any = operand == field;
@@ -815,7 +819,11 @@ private:
     std::vector<std::unique_ptr<__tag_FI_FILE_INFO_DATA>> batch_;  // reused; used_ of them hold rows
     size_t used_ = 0;
     std::vector<Alternatives> direct_;  // the chains' conjuncts when decided here, see Direct
-    std::vector<std::vector<std::string>> operands_;  // of direct_'s records, read once
+    struct DirectOperand {
+        std::string text;
+        std::unique_ptr<FileIdxPathPattern> path;  // split once, for the path patterns
+    };
+    std::vector<std::vector<DirectOperand>> operands_;  // of direct_'s records, read once
     bool decided_ = false;
     FileIdxDb check_;
     Statement insert_;
