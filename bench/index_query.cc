@@ -50,7 +50,7 @@ int main(int argc, char **argv) {
     name.type = FI_COND_NAME;
     name.op = FI_OP_LIKE;
     Folder last;
-    const FI_TABLE_GEN_CONTEXT context{argv[4], &last};
+    const FI_TABLE_GEN_CONTEXT context{argv[4], &last, 0};
     if (FILEIDXIsIndexEnable(argv[1]) != 1 || FILEIDXDBCreate(argv[4]) != 0 ||
         FILEIDXResultGetAndTableGen(argv[1], &name, nullptr, MayList, &context) != 0) {
         fprintf(stderr, "index_query: failed, platform error 0x%04X\n", static_cast<unsigned>(VLIBCErrGet()));

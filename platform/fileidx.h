@@ -124,9 +124,10 @@ typedef int (*FILEIDX_ROW_FILTER)(const char *dir, const char *name, void *arg);
 typedef struct __tag_FI_TABLE_GEN_CONTEXT {
     const char *outputDbPath;  // a database made by FILEIDXDBCreate
     void *filterArg;           // handed to the filter unchanged
+    int filesAndFolders;       // non-zero: rows of regular files and folders only
 } FI_TABLE_GEN_CONTEXT;
 
-// An output database open for a run of inserts (FILEIDXOutputDBOpen).
+// An output database open for a run of inserts (FILEIDXOutputDBOpen); one thread at a time.
 typedef struct __tag_FI_OUTPUT_DB FI_OUTPUT_DB;
 
 QUIB_BEGIN_C

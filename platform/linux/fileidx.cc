@@ -360,6 +360,9 @@ int FILEIDXResultGetAndTableGen(const char *volume, const __tag_FI_SQL_COND *con
         }
         std::string dir;
         auto keep = [&](const __tag_FI_FILE_INFO_DATA &record) -> int {
+            if (context->filesAndFolders != 0 && !S_ISREG(record.mode) && !S_ISDIR(record.mode)) {
+                return QUIB_ERR_NONE;
+            }
             if (filter != nullptr) {
                 dir = record.realPath;
                 if (record.parentPath[0] != '\0') {

@@ -58,6 +58,24 @@ struct SqlText {
 // FI_OP_PATH_LIKE of pattern against path, as the SQL function does it.
 [[nodiscard]] bool FileIdxPathLike(std::string_view pattern, std::string_view path);
 
+// A component of an FI_OP_PATH_LIKE pattern: a lone "*" (one or more components), or a literal
+// ("\" makes the next byte literal).
+struct FileIdxPathPart {
+    bool star = false;
+    std::string literal;
+};
+
+// FileIdxPathLike with the pattern split once, for a pattern asked of many paths.
+class FileIdxPathPattern {
+public:
+    explicit FileIdxPathPattern(std::string_view pattern);
+    [[nodiscard]] bool Matches(std::string_view path);
+
+private:
+    std::vector<FileIdxPathPart> parts_;
+    std::vector<std::string_view> path_;  // reused
+};
+
 // The columns of a hit in storage order, for SELECT and INSERT.
 extern const char kFileIdxColumns[];
 // Binds record's fields to parameters 1..18 of an INSERT of kFileIdxColumns. 0 or a code.

@@ -204,6 +204,11 @@ int QUIBShareIsShareRecycle(const char *realPath) {
         return NORVO_FAIL_ERRNO(err);
     }
     // Lexical: a real path holds no link, and a share's folder is configured by its real path.
+    // Normalising only drops components: without the name anywhere it can't end the path.
+    // Walks ask this of every entry.
+    if (strstr(realPath, "#recycle") == nullptr) {
+        return 0;
+    }
     return np::Guarded(-1, [&] { return np::IsRecycleBin(np::NormalizePath(realPath)); });
 }
 

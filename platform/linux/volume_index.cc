@@ -183,10 +183,15 @@ bool NameMayMatch(const Plan &plan, const std::string &name) {
     for (const Alternatives &alts : plan.nameOr) {
         bool any = false;
         for (size_t i = 0; !any && i < alts.size(); ++i) {
-            const std::string operand = Operand(*alts[i]);
-            any = alts[i]->op == FI_OP_LIKE
-                      ? VLIBCUnicodeUTF8LikeMatch(operand.c_str(), name.c_str(), '\\') != 0
-                      : operand == name;
+            const char *value = alts[i]->value;
+            const size_t size = strnlen(value, sizeof alts[i]->value);
+            if (alts[i]->op != FI_OP_LIKE) {
+                any = name.compare(0, std::string::npos, value, size) == 0;
+            } else if (size < sizeof alts[i]->value) {  // terminated: matched in place
+                any = VLIBCUnicodeUTF8LikeMatch(value, name.c_str(), '\\') != 0;
+            } else {
+                any = VLIBCUnicodeUTF8LikeMatch(Operand(*alts[i]).c_str(), name.c_str(), '\\') != 0;
+            }
         }
         if (!any) {
             return false;
@@ -287,6 +292,28 @@ int ReadShares(const std::string &volume, std::vector<Share> *out) {
     return rc < 0 ? QUIB_ERR_OPEN_FAILED : QUIB_ERR_NONE;
 }
 
+}  // namespace
+
+// Calls visit(position, name) for each of the first most names of a folder's list (see
+// SplitNames); name is one buffer, rewritten for each.
+template <typename Visit>
+void VisitNames(const void *blob, int size, size_t most, Visit &&visit) {
+    const char *p = static_cast<const char *>(blob);
+    const char *end = p + (size > 0 ? size : 0);
+    std::string name;
+    for (size_t position = 0; p < end && position < most; ++position) {
+        const size_t shared = std::min(static_cast<size_t>(static_cast<unsigned char>(*p++)), name.size());
+        const char *nul = static_cast<const char *>(memchr(p, '\0', static_cast<size_t>(end - p)));
+        const char *stop = nul == nullptr ? end : nul;
+        name.resize(shared);
+        name.append(p, stop);
+        visit(position, static_cast<const std::string &>(name));
+        p = stop + 1;
+    }
+}
+
+namespace {
+
 class Query {
 public:
     Query(const char *volume, const __tag_FI_SQL_COND *conditions, const __tag_FI_SQL_COND *folderConditions,
@@ -381,19 +408,17 @@ private:
         if (const int code = Prepare(db.get(), "SELECT names FROM folders WHERE id = ?", &names)) {
             return code;
         }
-        auto namesOf = [&](int64_t id, size_t most, std::vector<std::string> *out) -> int {
+        // Calls visit(position, name) for the first most names of folder id.
+        auto namesOf = [&](int64_t id, size_t most, auto &&visit) -> int {
             sqlite3_reset(names.get());
             sqlite3_bind_int64(names.get(), 1, id);
             const int rc = sqlite3_step(names.get());
-            out->clear();
             if (rc == SQLITE_ROW) {
-                *out = SplitNames(sqlite3_column_blob(names.get(), 0), sqlite3_column_bytes(names.get(), 0),
-                                  most);
+                VisitNames(sqlite3_column_blob(names.get(), 0), sqlite3_column_bytes(names.get(), 0), most, visit);
                 return QUIB_ERR_NONE;
             }
             return rc == SQLITE_DONE ? QUIB_ERR_NONE : FileIdxCodeOf(db.get(), rc);
         };
-        std::vector<std::string> list;
         if (!plan_.namesKnown) {
             std::vector<int64_t> ids;
             for (const auto &[id, f] : folders_) {
@@ -404,13 +429,13 @@ private:
                 if (!Placed(id).relevant) {
                     continue;
                 }
-                if (const int code = namesOf(id, SIZE_MAX, &list)) {
-                    return code;
-                }
-                for (std::string &name : list) {
+                const int code = namesOf(id, SIZE_MAX, [&](size_t, const std::string &name) {
                     if (NameMayMatch(plan_, name)) {
-                        candidates_.push_back({id, std::move(name)});
+                        candidates_.push_back({id, name});
                     }
+                });
+                if (code != QUIB_ERR_NONE) {
+                    return code;
                 }
             }
             return QUIB_ERR_NONE;
@@ -443,14 +468,18 @@ private:
                 ++j;
             }
             if (r != nullptr && Load(r->id) && Placed(r->id).relevant) {
-                if (const int code = namesOf(r->id, static_cast<size_t>(keys[j - 1] - r->first) + 1, &list)) {
+                size_t k = i;  // the next wanted key
+                const int code = namesOf(r->id, static_cast<size_t>(keys[j - 1] - r->first) + 1,
+                                         [&](size_t position, const std::string &name) {
+                                             if (k < j && static_cast<size_t>(keys[k] - r->first) == position) {
+                                                 ++k;
+                                                 if (NameMayMatch(plan_, name)) {
+                                                     candidates_.push_back({r->id, name});
+                                                 }
+                                             }
+                                         });
+                if (code != QUIB_ERR_NONE) {
                     return code;
-                }
-                for (size_t k = i; k < j; ++k) {
-                    const auto position = static_cast<size_t>(keys[k] - r->first);
-                    if (position < list.size() && NameMayMatch(plan_, list[position])) {
-                        candidates_.push_back({r->id, list[position]});
-                    }
                 }
             }
             i = j;
@@ -676,7 +705,12 @@ private:
             }
         }
         for (const Alternatives &alts : direct_) {
+            operands_.emplace_back();
             for (const __tag_FI_SQL_COND *c : alts) {
+                const std::string text = Operand(*c);
+                operands_.back().push_back(
+                    {text, c->type == FI_COND_PATH && c->op != FI_OP_EQ ? std::make_unique<FileIdxPathPattern>(text)
+                                                                         : nullptr});
                 const bool ok =
                     (c->type == FI_COND_NAME && (c->op == FI_OP_LIKE || c->op == FI_OP_EQ)) ||
                     (c->type == FI_COND_PATH &&
@@ -690,12 +724,14 @@ private:
         return true;
     }
 
-    bool Holds(const __tag_FI_FILE_INFO_DATA &r) const {
-        for (const Alternatives &alts : direct_) {
+    bool Holds(const __tag_FI_FILE_INFO_DATA &r) {
+        for (size_t k = 0; k < direct_.size(); ++k) {
+            const Alternatives &alts = direct_[k];
             bool any = false;
             for (size_t i = 0; !any && i < alts.size(); ++i) {
                 const __tag_FI_SQL_COND &c = *alts[i];
-                const std::string operand = Operand(c);
+                DirectOperand &o = operands_[k][i];
+                const std::string &operand = o.text;
                 const char *field = c.type == FI_COND_NAME   ? r.name
                                     : c.type == FI_COND_PATH ? r.path
                                                              : r.share;
@@ -704,10 +740,10 @@ private:
                         any = VLIBCUnicodeUTF8LikeMatch(operand.c_str(), field, '\\') != 0;
                         break;
                     case FI_OP_PATH_LIKE:
-                        any = FileIdxPathLike(operand, field);
+                        any = o.path->Matches(field);
                         break;
                     case FI_OP_PATH_NOT_LIKE:
-                        any = !FileIdxPathLike(operand, field);
+                        any = !o.path->Matches(field);
                         break;
                     default:
                         any = operand == field;
@@ -783,6 +819,11 @@ private:
     std::vector<std::unique_ptr<__tag_FI_FILE_INFO_DATA>> batch_;  // reused; used_ of them hold rows
     size_t used_ = 0;
     std::vector<Alternatives> direct_;  // the chains' conjuncts when decided here, see Direct
+    struct DirectOperand {
+        std::string text;
+        std::unique_ptr<FileIdxPathPattern> path;  // split once, for the path patterns
+    };
+    std::vector<std::vector<DirectOperand>> operands_;  // of direct_'s records, read once
     bool decided_ = false;
     FileIdxDb check_;
     Statement insert_;
@@ -795,19 +836,7 @@ private:
 // one before (names are at most 255 bytes), the rest of it, and a NUL.
 std::vector<std::string> SplitNames(const void *blob, int size, size_t most) {
     std::vector<std::string> names;
-    const char *p = static_cast<const char *>(blob);
-    const char *end = p + (size > 0 ? size : 0);
-    std::string previous;
-    while (p < end && names.size() < most) {
-        const size_t shared =
-            std::min(static_cast<size_t>(static_cast<unsigned char>(*p++)), previous.size());
-        const char *nul = static_cast<const char *>(memchr(p, '\0', static_cast<size_t>(end - p)));
-        const char *stop = nul == nullptr ? end : nul;
-        previous.resize(shared);
-        previous.append(p, stop);
-        names.push_back(previous);
-        p = stop + 1;
-    }
+    VisitNames(blob, size, most, [&](size_t, const std::string &name) { names.push_back(name); });
     return names;
 }
 

@@ -48,6 +48,8 @@ inline constexpr int kRootId = 1;
 // A folder's names, sorted, front-coded: for each, one byte of the length it shares with the
 // one before (names are at most 255 bytes), the rest of it, and a NUL. most: stop after so many.
 [[nodiscard]] std::vector<std::string> SplitNames(const void *blob, int size, size_t most = SIZE_MAX);
+// The same into out, whose strings are reused.
+void SplitNames(const void *blob, int size, size_t most, std::vector<std::string> *out);
 [[nodiscard]] std::string JoinNames(const std::vector<std::string> &names);
 
 // Opens an absolute or relative directory path from "/" (or ".") without following a link;

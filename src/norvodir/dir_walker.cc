@@ -71,6 +71,7 @@ int ReadNames(int fd, Level *level) {
         if (got == 0) {
             return 0;
         }
+        level->names.reserve(level->names.size() + static_cast<size_t>(got));  // names never outgrow records
         for (ssize_t at = 0; at < got;) {
             const auto *entry = reinterpret_cast<const struct dirent64 *>(buffer.get() + at);
             level->names.append(entry->d_name, strlen(entry->d_name) + 1);
@@ -149,14 +150,17 @@ public:
                 continue;
             }
             const char *name = level.names.c_str() + level.next;
-            level.next += strlen(name) + 1;
+            const size_t length = strlen(name);
+            level.next += length + 1;
             if (QUIBEAIsHiddenFile(name) != 0) {
                 continue;
             }
             real_.resize(level.realLength);
             user_.resize(level.userLength);
-            real_.append("/").append(name);
-            user_.append("/").append(name);
+            real_.push_back('/');
+            real_.append(name, length);
+            user_.push_back('/');
+            user_.append(name, length);
             if (visit.skipRecycle && QUIBShareIsShareRecycle(real_.c_str()) == 1) {
                 continue;
             }
@@ -170,7 +174,8 @@ public:
                            real_.c_str(), strerror(err), VLIBCErrGet());
                 return false;
             }
-            const std::string entryName(name);
+            entry_.assign(name, length);  // reused: no allocation per entry
+            const std::string &entryName = entry_;
             if (visit.pre != nullptr && !(*visit.pre)(user_, basePath_, real_, entryName, st, extra_)) {
                 return false;
             }
@@ -292,6 +297,7 @@ private:
     const std::string *const extra_;
     std::string real_;
     std::string user_;
+    std::string entry_;  // the name of the entry being visited
     std::vector<std::unique_ptr<Level>> levels_;
 };
 

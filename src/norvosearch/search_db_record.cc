@@ -1,9 +1,10 @@
 #include "norvosearch/search_db_record.h"
 
 #include <ctype.h>
-#include <stdio.h>
 #include <string.h>
 #include <sys/stat.h>
+
+#include <algorithm>
 
 #include "norvo/norvodir.h"
 #include "norvo/norvomisc.h"
@@ -41,25 +42,31 @@ std::string TypeText(const char *name, bool isDir) {
     return ext;
 }
 
+void CopyText(char *field, size_t size, const char *text, size_t length) {
+    length = std::min(length, size - 1);
+    memcpy(field, text, length);
+    field[length] = '\0';
+}
+
 void FillHit(const std::string &share, const std::string &root, const std::string &rest,
              const _tag_QUIBSTAT_ &st, FI_FILE_INFO_DATA *r) {
+    // Copies, not snprintf: a hit of a walk is stored for every match.
     const size_t slash = rest.rfind('/');
-    const std::string name = slash == std::string::npos ? rest : rest.substr(slash + 1);
+    const size_t nameAt = slash == std::string::npos ? 0 : slash + 1;
     const bool isDir = S_ISDIR(st.st_mode);
-    snprintf(r->name, sizeof r->name, "%s", name.c_str());
-    snprintf(r->realPath, sizeof r->realPath, "%s", root.c_str());
-    snprintf(r->parentPath, sizeof r->parentPath, "%s",
-             slash == std::string::npos ? "" : rest.substr(0, slash).c_str());
-    snprintf(r->share, sizeof r->share, "%s", share.c_str());
-    snprintf(r->path, sizeof r->path, "%s", rest.c_str());
-    snprintf(r->type, sizeof r->type, "%s", TypeText(name.c_str(), isDir).c_str());
+    CopyText(r->name, sizeof r->name, rest.c_str() + nameAt, strlen(rest.c_str() + nameAt));
+    CopyText(r->realPath, sizeof r->realPath, root);
+    CopyText(r->parentPath, sizeof r->parentPath, rest.c_str(), slash == std::string::npos ? 0 : slash);
+    CopyText(r->share, sizeof r->share, share);
+    CopyText(r->path, sizeof r->path, rest);
+    CopyText(r->type, sizeof r->type, TypeText(rest.c_str() + nameAt, isDir));
     r->isDir = isDir ? 1 : 0;
     r->size = isDir ? 0 : st.st_size;
     r->crtime = st.st_crtim.tv_sec;
     r->ctime = st.st_ctim.tv_sec;
     r->atime = st.st_atim.tv_sec;
     r->mtime = st.st_mtim.tv_sec;
-    snprintf(r->posix, 10, "%s", GetPrivilegeStr(st.st_mode).c_str());
+    CopyText(r->posix, 10, GetPrivilegeStr(st.st_mode));
     r->mode = st.st_mode;
     r->uid = st.st_uid;
     r->gid = st.st_gid;

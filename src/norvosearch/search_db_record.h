@@ -1,6 +1,8 @@
 // The hit record of a task's database, and the checks that stand between a request's values
 // and a path.
 #pragma once
+#include <string.h>
+
 #include <string>
 
 #include "fileidx.h"
@@ -15,6 +17,12 @@ SplitResult SplitRealPath(const std::string &path, std::string *root, std::strin
 
 // "homes" for a name IsDirUserHome takes for the user's home, else share.
 std::string KeyShare(const std::string &share);
+
+// Copies text into field, as snprintf(field, size, "%s") would.
+void CopyText(char *field, size_t size, const char *text, size_t length);
+inline void CopyText(char *field, size_t size, const std::string &text) {
+    CopyText(field, size, text.c_str(), strlen(text.c_str()));
+}
 
 // Fills *r for the entry at rest below the share folder root (share: the key's share name).
 // Directories are stored with size 0, as the in-memory size test counts them.

@@ -6,15 +6,12 @@
 // to, and still meet every condition on the file's current status (the index may be older
 // than the file; an access time it can't know at all).
 #include <errno.h>
-#include <limits.h>
-#include <stdlib.h>
 #include <string.h>
 #include <sys/stat.h>
 
 #include <algorithm>
 #include <deque>
 #include <map>
-#include <memory>
 #include <string>
 #include <vector>
 
@@ -24,6 +21,8 @@
 #include "norvo/searchwalker.h"
 #include "norvosearch/search_db_record.h"
 #include "norvosearch/search_scope.h"
+#include "quib_fs.h"
+#include "quib_share.h"
 #include "quib_stat.h"
 #include "quib_user.h"
 #include "vlibc_err.h"
@@ -35,19 +34,15 @@ namespace {
 
 struct FilterContext {
     DirPrivilegeMap privileges;
-    std::vector<FindComp *> recheck;  // the search's conditions and the access-time extras
-    bool logStat = false;             // extras given: a row that can't be read is logged
+    std::vector<FindATimeComp *> extra;  // decided on the file's status now, read per row
     const std::vector<PathInfo> *folders = nullptr;
     bool currentDirOnly = false;
-    bool admin = false;                  // told, but an administrator sees what they may list too
-    std::map<std::string, bool> direct;  // folder: reached from its share without a link
-    std::map<std::string, std::string> shareReal;
+    bool admin = false;  // told, but an administrator sees what they may list too
+    // The answer for the folder of the rows before: rows come folder by folder.
+    std::string dir;
+    bool dirKept = false;
+    size_t depth = 0;  // of the folder below its share's
 };
-
-std::string Resolved(const std::string &path) {
-    std::unique_ptr<char, decltype(&free)> real(realpath(path.c_str(), nullptr), &free);
-    return real ? std::string(real.get()) : std::string();
-}
 
 // The chosen folder dir lies in (or is, with currentDirOnly); null when none.
 const PathInfo *FolderOf(const FilterContext &ctx, const std::string &dir) {
@@ -61,48 +56,56 @@ const PathInfo *FolderOf(const FilterContext &ctx, const std::string &dir) {
     return nullptr;
 }
 
-// Whether dir is the folder its path names below the share, no link on the way.
-bool Direct(FilterContext &ctx, const PathInfo &folder, const std::string &dir) {
-    const auto found = ctx.direct.find(dir);
-    if (found != ctx.direct.end()) {
-        return found->second;
+// Whether rows of the folder dir may be kept at all, their names aside.
+bool KeepDir(FilterContext &ctx, const std::string &dir) {
+    std::string root, rest;
+    if (FolderOf(ctx, dir) == nullptr ||
+        norvo::search::SplitRealPath(dir + "/", &root, &rest) != norvo::search::SplitResult::kOk) {
+        return false;
     }
-    auto share = ctx.shareReal.find(folder.sharePath);
-    if (share == ctx.shareReal.end()) {
-        share = ctx.shareReal.emplace(folder.sharePath, Resolved(folder.sharePath)).first;
+    if (!rest.empty()) {
+        rest.pop_back();
     }
-    const bool direct = !share->second.empty() &&
-                        dir.compare(0, folder.sharePath.size(), folder.sharePath) == 0 &&
-                        Resolved(dir) == share->second + dir.substr(folder.sharePath.size());
-    ctx.direct.emplace(dir, direct);
-    return direct;
+    ctx.depth = rest.empty() ? 0 : 1 + static_cast<size_t>(std::count(rest.begin(), rest.end(), '/'));
+    return !norvo::search::OutOfSight(root, rest) && ctx.privileges.findDirPrivilege(dir + "/");
 }
 
+// The platform hands only rows it has just looked at as the caller, in a folder it opened from
+// the volume one component at a time without following a link, that meet the whole chain on
+// that status and, with conditions, are regular files or folders. What it can't know is
+// checked here: the chosen folders by share, hidden names and bins, the user's list privilege
+// (once per folder), and the access-time extras on the file's status read again.
 int KeepRow(const char *dir, const char *name, void *arg) {
     return norvo::Guarded(0, [&] {
         FilterContext &ctx = *static_cast<FilterContext *>(arg);
-        const std::string folderPath(dir);
-        const std::string path = folderPath + "/" + name;
-        const PathInfo *folder = FolderOf(ctx, folderPath);
-        std::string root, rest;
-        if (folder == nullptr ||
-            norvo::search::SplitRealPath(path, &root, &rest) != norvo::search::SplitResult::kOk ||
-            norvo::search::OutOfSight(root, rest) || !Direct(ctx, *folder, folderPath) ||
-            !ctx.privileges.findDirPrivilege(path)) {
+        if (ctx.dir != dir) {
+            ctx.dir = dir;
+            ctx.dirKept = KeepDir(ctx, ctx.dir);
+        }
+        if (!ctx.dirKept || QUIBEAIsHiddenFile(name) != 0) {
             return 0;
         }
+        // A bin is a share's top folder, or a home's one level deeper.
+        if (ctx.depth < 2) {
+            const std::string bin = ctx.dir + "/" + name;
+            if (QUIBShareIsShareRecycle(bin.c_str()) == 1) {
+                return 0;
+            }
+        }
+        if (ctx.extra.empty()) {
+            return 1;
+        }
+        const std::string path = ctx.dir + "/" + name;
         _tag_QUIBSTAT_ st{};
         if (VLIBCFileLStat(path.c_str(), QUIB_STAT_BASIC | QUIB_STAT_CRTIME, &st) != 0) {
-            if (ctx.logStat) {
-                NVO_LOG(kNorvoSearch, "%s:%d VLIBCFileLStat: (%s), %s, [%x].", path.c_str(), strerror(errno),
-                        static_cast<unsigned>(VLIBCErrGet()));
-            }
+            NVO_LOG(kNorvoSearch, "%s:%d VLIBCFileLStat: (%s), %s, [%x].", path.c_str(), strerror(errno),
+                    static_cast<unsigned>(VLIBCErrGet()));
             return 0;
         }
-        if (!ctx.recheck.empty() && !S_ISREG(st.st_mode) && !S_ISDIR(st.st_mode)) {
+        if (!S_ISREG(st.st_mode) && !S_ISDIR(st.st_mode)) {
             return 0;
         }
-        for (FindComp *cond : ctx.recheck) {
+        for (FindATimeComp *cond : ctx.extra) {
             if (!(*cond)(path.c_str(), st)) {
                 return 0;
             }
@@ -173,20 +176,21 @@ bool NvoSearchWalker::WalkDB(const std::string &volume, const std::vector<PathIn
             folderConds[i - 1].orNext = &folderConds[i];
         }
         FilterContext ctx;
-        ctx.recheck = conds;
-        for (FindATimeComp *cond : extra) {
-            if (std::find(ctx.recheck.begin(), ctx.recheck.end(), cond) == ctx.recheck.end()) {
-                ctx.recheck.push_back(cond);
+        ctx.extra = extra;
+        for (FindComp *cond : conds) {  // the index leaves access times to the filter
+            auto *atime = dynamic_cast<FindATimeComp *>(cond);
+            if (atime != nullptr && std::find(ctx.extra.begin(), ctx.extra.end(), atime) == ctx.extra.end()) {
+                ctx.extra.push_back(atime);
             }
         }
-        ctx.logStat = !extra.empty();
         ctx.folders = &folders;
         ctx.currentDirOnly = searchCurrentDir;
         ctx.admin = admin == 1;
         std::deque<__tag_FI_SQL_COND> indexConds;
         std::map<const __tag_FI_SQL_COND *, __tag_FI_SQL_COND *> copied;
         const __tag_FI_SQL_COND *where = WithoutAccessTimes(firstCond, &indexConds, &copied);
-        const FI_TABLE_GEN_CONTEXT table{dbPath.c_str(), &ctx};
+        // A search with conditions reports regular files and folders only, as a walk does.
+        const FI_TABLE_GEN_CONTEXT table{dbPath.c_str(), &ctx, conds.empty() && extra.empty() ? 0 : 1};
         if (FILEIDXResultGetAndTableGen(volume.c_str(), where,
                                         folderConds.empty() ? nullptr : &folderConds.front(), KeepRow,
                                         &table) < 0) {

@@ -69,10 +69,10 @@ bool NvoSearchCallBack::operator()(const std::string &, const std::string &, con
         norvo::search::FillHit(
             extra != nullptr ? *extra : norvo::search::KeyShare(root.substr(root.rfind('/') + 1)), root, rest,
             st, record.get());
-        snprintf(record->userName, sizeof record->userName, "%s",
-                 NameOf<QUIBUSER>(userNames, st.st_uid, QUIBUserGetByUID, QUIBUserFree).c_str());
-        snprintf(record->groupName, sizeof record->groupName, "%s",
-                 NameOf<QUIBGROUP>(groupNames, st.st_gid, QUIBGroupGetByGID, QUIBGroupFree).c_str());
+        norvo::search::CopyText(record->userName, sizeof record->userName,
+                                NameOf<QUIBUSER>(userNames, st.st_uid, QUIBUserGetByUID, QUIBUserFree));
+        norvo::search::CopyText(record->groupName, sizeof record->groupName,
+                                NameOf<QUIBGROUP>(groupNames, st.st_gid, QUIBGroupGetByGID, QUIBGroupFree));
         if (FILEIDXOutputDBInsert(output.get(), record.get()) != 0) {
             failed = true;
             return false;

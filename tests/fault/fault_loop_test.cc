@@ -556,7 +556,7 @@ const Op kOps[] = {
      [] {
          __tag_FI_SQL_COND name{};
          FileSearch::setSqlCond(name, FI_COND_NAME, FI_OP_LIKE, std::string("*.IDXQ"), nullptr, nullptr);
-         FI_TABLE_GEN_CONTEXT context{kIndexDb, nullptr};
+         FI_TABLE_GEN_CONTEXT context{kIndexDb, nullptr, 0};
          const bool ok = FILEIDXResultGetAndTableGen("/volume1", &name, nullptr, nullptr, &context) == 0;
          return Expect(ok, IndexedHits() == 2);
      },

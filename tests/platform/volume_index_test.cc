@@ -189,7 +189,7 @@ protected:
                                      FILEIDX_ROW_FILTER filter = nullptr, void *arg = nullptr) {
         unlink(kOut.c_str());
         EXPECT_EQ(FILEIDXDBCreate(kOut.c_str()), 0);
-        FI_TABLE_GEN_CONTEXT context{kOut.c_str(), arg};
+        FI_TABLE_GEN_CONTEXT context{kOut.c_str(), arg, 0};
         EXPECT_EQ(FILEIDXResultGetAndTableGen(kVolume, conditions, folders, filter, &context), 0)
             << std::hex << VLIBCErrGet();
         std::vector<std::string> rows = Rows(kOut);
@@ -378,7 +378,7 @@ TEST_F(VolumeIndex, UsedOnlyWhenWholeRootsAndReachable) {
         return asUser(user, [&] {
             if (FILEIDXIsIndexEnable(kVolume) != 1 || FILEIDXDBCreate("/volume1/@tmp/u.db") != 0) return -1;
             __tag_FI_SQL_COND name = Cond(FI_COND_NAME, FI_OP_LIKE, "report.*");
-            FI_TABLE_GEN_CONTEXT context{"/volume1/@tmp/u.db", nullptr};
+            FI_TABLE_GEN_CONTEXT context{"/volume1/@tmp/u.db", nullptr, 0};
             const auto filter = [](const char *dir, const char *file, void *) {
                 return strcmp(dir, "/volume1/photo/2013/x/mine") == 0 && strcmp(file, "report.a") == 0 ? 1 : 0;
             };
@@ -404,7 +404,7 @@ TEST_F(VolumeIndex, UsedOnlyWhenWholeRootsAndReachable) {
         damage << "not a database at all";
     }
     EXPECT_EQ(FILEIDXIsIndexEnable(kVolume), 0);
-    FI_TABLE_GEN_CONTEXT context{kOut.c_str(), nullptr};
+    FI_TABLE_GEN_CONTEXT context{kOut.c_str(), nullptr, 0};
     ASSERT_EQ(FILEIDXDBCreate(kOut.c_str()), 0);
     EXPECT_EQ(OUTCOME(FILEIDXResultGetAndTableGen(kVolume, nullptr, nullptr, nullptr, &context)), Failed(QUIB_ERR_FAILED));
     FI_INDEX_STATUS status;
