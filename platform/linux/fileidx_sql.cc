@@ -385,8 +385,8 @@ int Open(const char *path, FileIdxDb *db) {
     // NOFOLLOW: SQLite refuses a link in any component of the name it opens. NOMUTEX: a
     // connection serves one call, or one output handle used by one thread at a time; the
     // per-call locking was a tenth of the time of a copy into a result database.
-    const int rc = sqlite3_open_v2(path, &raw, SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOFOLLOW | SQLITE_OPEN_NOMUTEX,
-                                   nullptr);
+    const int rc = sqlite3_open_v2(
+        path, &raw, SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOFOLLOW | SQLITE_OPEN_NOMUTEX, nullptr);
     db->reset(raw);
     if (rc != SQLITE_OK) {
         return sqlite3_extended_errcode(raw) == SQLITE_CANTOPEN_SYMLINK ? QUIB_ERR_ACCESS_DENIED
@@ -479,8 +479,8 @@ int OpenFileIdxDb(const char *path, DbOwner owner, FileIdxDb *db) {
 
 int OpenMemoryFileIdxDb(FileIdxDb *db) {
     sqlite3 *raw = nullptr;
-    const int rc =
-        sqlite3_open_v2(":memory:", &raw, SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE | SQLITE_OPEN_NOMUTEX, nullptr);
+    const int rc = sqlite3_open_v2(":memory:", &raw,
+                                   SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE | SQLITE_OPEN_NOMUTEX, nullptr);
     db->reset(raw);
     if (rc != SQLITE_OK) {
         return FileIdxCodeOf(raw, rc);

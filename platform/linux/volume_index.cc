@@ -414,7 +414,8 @@ private:
             sqlite3_bind_int64(names.get(), 1, id);
             const int rc = sqlite3_step(names.get());
             if (rc == SQLITE_ROW) {
-                VisitNames(sqlite3_column_blob(names.get(), 0), sqlite3_column_bytes(names.get(), 0), most, visit);
+                VisitNames(sqlite3_column_blob(names.get(), 0), sqlite3_column_bytes(names.get(), 0), most,
+                           visit);
                 return QUIB_ERR_NONE;
             }
             return rc == SQLITE_DONE ? QUIB_ERR_NONE : FileIdxCodeOf(db.get(), rc);
@@ -469,15 +470,16 @@ private:
             }
             if (r != nullptr && Load(r->id) && Placed(r->id).relevant) {
                 size_t k = i;  // the next wanted key
-                const int code = namesOf(r->id, static_cast<size_t>(keys[j - 1] - r->first) + 1,
-                                         [&](size_t position, const std::string &name) {
-                                             if (k < j && static_cast<size_t>(keys[k] - r->first) == position) {
-                                                 ++k;
-                                                 if (NameMayMatch(plan_, name)) {
-                                                     candidates_.push_back({r->id, name});
-                                                 }
-                                             }
-                                         });
+                const int code =
+                    namesOf(r->id, static_cast<size_t>(keys[j - 1] - r->first) + 1,
+                            [&](size_t position, const std::string &name) {
+                                if (k < j && static_cast<size_t>(keys[k] - r->first) == position) {
+                                    ++k;
+                                    if (NameMayMatch(plan_, name)) {
+                                        candidates_.push_back({r->id, name});
+                                    }
+                                }
+                            });
                 if (code != QUIB_ERR_NONE) {
                     return code;
                 }
@@ -708,9 +710,9 @@ private:
             operands_.emplace_back();
             for (const __tag_FI_SQL_COND *c : alts) {
                 const std::string text = Operand(*c);
-                operands_.back().push_back(
-                    {text, c->type == FI_COND_PATH && c->op != FI_OP_EQ ? std::make_unique<FileIdxPathPattern>(text)
-                                                                         : nullptr});
+                operands_.back().push_back({text, c->type == FI_COND_PATH && c->op != FI_OP_EQ
+                                                      ? std::make_unique<FileIdxPathPattern>(text)
+                                                      : nullptr});
                 const bool ok =
                     (c->type == FI_COND_NAME && (c->op == FI_OP_LIKE || c->op == FI_OP_EQ)) ||
                     (c->type == FI_COND_PATH &&
