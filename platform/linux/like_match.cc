@@ -13,6 +13,7 @@
 #include <unicode/uchar.h>
 #include <unicode/utf8.h>
 
+#include "like_decode.h"
 #include "vlibc_unicode.h"
 
 namespace {
@@ -35,23 +36,8 @@ inline UChar32 Fold(UChar32 c) {
     return c < 128 ? kAsciiFold.to[c] : u_foldCase(c, U_FOLD_CASE_DEFAULT);
 }
 
-// One character at *text. A byte 0xC0..0xF4 leads as many trail bytes as ICU's trail-byte table
-// gives (0xC0 and 0xC1 count one, as the older table had it; newer ICU no longer calls them lead
-// bytes), taken unvalidated; any other byte stands alone. A sequence cut short by the terminating
-// NUL ends there, so nothing past it is ever read. Returns the byte after the character.
 inline const uint8_t *Decode(const uint8_t *text, UChar32 *c) {
-    UChar32 value = *text++;
-    if (value < 0xC0 || value > 0xF4) {
-        *c = value;
-        return text;
-    }
-    const int trail = value >= 0xC2 ? U8_COUNT_TRAIL_BYTES(value) : 1;
-    value &= (1 << (6 - trail)) - 1;
-    for (int i = 0; i < trail && *text != 0; ++i) {
-        value = (value << 6) | (*text++ & 0x3F);
-    }
-    *c = value;
-    return text;
+    return norvo::platform::DecodeLikeChar(text, c);
 }
 
 inline const uint8_t *Skip(const uint8_t *text) {

@@ -25,6 +25,7 @@
 #include "api_guard.h"
 #include "fileidx_sql.h"
 #include "fs_path.h"
+#include "like_decode.h"
 #include "locked_file.h"
 #include "nss.h"
 #include "private_dir.h"
@@ -36,23 +37,6 @@ namespace norvo::platform {
 namespace {
 
 // ---- names and trigrams ----------------------------------------------------------------------
-
-// Decodes one character as VLIBCUnicodeUTF8LikeMatch does (like_match.cc): the trail bytes
-// counted from the lead byte, unvalidated, cut at the terminating NUL.
-const uint8_t *Decode(const uint8_t *text, UChar32 *c) {
-    UChar32 value = *text++;
-    if (value < 0xC0 || value > 0xF4) {
-        *c = value;
-        return text;
-    }
-    const int trail = value >= 0xC2 ? U8_COUNT_TRAIL_BYTES(value) : 1;
-    value &= (1 << (6 - trail)) - 1;
-    for (int i = 0; i < trail && *text != 0; ++i) {
-        value = (value << 6) | (*text++ & 0x3F);
-    }
-    *c = value;
-    return text;
-}
 
 // The folded ASCII a subject character matches, or 0x01 for one that matches no ASCII literal
 // (above ASCII only U+017F and U+212A fold into it).
@@ -935,7 +919,7 @@ std::string IndexText(const std::string &name) {
     const uint8_t *t = reinterpret_cast<const uint8_t *>(name.c_str());
     while (*t != 0) {
         UChar32 c;
-        t = Decode(t, &c);
+        t = DecodeLikeChar(t, &c);
         out += IndexChar(c);
     }
     return out;
@@ -953,7 +937,7 @@ std::vector<std::string> NameTrigrams(const std::string &pattern, bool like) {
     const uint8_t *p = reinterpret_cast<const uint8_t *>(pattern.c_str());
     while (*p != 0) {
         UChar32 c;
-        p = Decode(p, &c);
+        p = DecodeLikeChar(p, &c);
         if (c == '*' || c == '?') {
             AddTrigrams(run, &trigrams);
             run.clear();
@@ -963,7 +947,7 @@ std::vector<std::string> NameTrigrams(const std::string &pattern, bool like) {
             if (*p == 0) {
                 break;
             }
-            p = Decode(p, &c);
+            p = DecodeLikeChar(p, &c);
         }
         const UChar32 folded =
             c < 0x80 ? (c >= 'A' && c <= 'Z' ? c + ('a' - 'A') : c) : u_foldCase(c, U_FOLD_CASE_DEFAULT);

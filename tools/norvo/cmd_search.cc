@@ -76,12 +76,12 @@ bool SplitOp(const std::string &text, const std::vector<std::string> &ops, std::
 
 // The conditions of the options, in a fixed order; false after reporting the failure.
 bool BuildConditions(const Invocation &inv, Conditions *conds, int *status) {
-    struct Spec {
-        const char *option;
+    struct Option {
+        const char *name;
         FindFactory::_tag_FIND_FIELD_ field;
         std::vector<std::string> ops;  // empty: the value is the operand as it is
     };
-    const Spec specs[] = {
+    const Option options[] = {
         {"name", FindFactory::FIND_FIELD_NAME, {}},
         {"ext", FindFactory::FIND_FIELD_EXT, {}},
         {"type", FindFactory::FIND_FIELD_TYPE, {}},
@@ -91,27 +91,27 @@ bool BuildConditions(const Invocation &inv, Conditions *conds, int *status) {
         {"size", FindFactory::FIND_FIELD_SIZE, {"equal", "less", "greater"}},
         {"atime", FindFactory::FIND_FIELD_ATIME, {"before", "after"}},
     };
-    for (const Spec &spec : specs) {
-        if (!inv.Has(spec.option)) {
+    for (const Option &option : options) {
+        if (!inv.Has(option.name)) {
             continue;
         }
-        std::string op, value = *inv.Value(spec.option);
-        if (spec.field == FindFactory::FIND_FIELD_TYPE) {
+        std::string op, value = *inv.Value(option.name);
+        if (option.field == FindFactory::FIND_FIELD_TYPE) {
             if (value != "file" && value != "dir") {
                 *status = ReportUsageError(inv.command, "--type wants file or dir, not " + value);
                 return false;
             }
             op = value;
-        } else if (!spec.ops.empty() && !SplitOp(value, spec.ops, &op, &value)) {
-            *status = ReportUsageError(inv.command, std::string("--") + spec.option +
-                                                        " wants OP:NUMBER, not " + *inv.Value(spec.option));
+        } else if (!option.ops.empty() && !SplitOp(value, option.ops, &op, &value)) {
+            *status = ReportUsageError(inv.command, std::string("--") + option.name +
+                                                        " wants OP:NUMBER, not " + *inv.Value(option.name));
             return false;
         }
-        if (!FindFactory::createFindOp(spec.field, op.c_str(), value.c_str(), conds->list)) {
-            *status = ReportFailure(inv, NvoLibGetErr(), std::string("--") + spec.option + " " + value);
+        if (!FindFactory::createFindOp(option.field, op.c_str(), value.c_str(), conds->list)) {
+            *status = ReportFailure(inv, NvoLibGetErr(), std::string("--") + option.name + " " + value);
             return false;
         }
-        if (spec.field == FindFactory::FIND_FIELD_ATIME) {
+        if (option.field == FindFactory::FIND_FIELD_ATIME) {
             conds->accessTimes.push_back(static_cast<FileSearch::FindATimeComp *>(conds->list.back()));
         }
     }
