@@ -19,6 +19,20 @@ UserRecord RequireUser(const Invocation &inv, const std::string &name, int *stat
     return user;
 }
 
+std::unique_ptr<UserIdentity> ActAsUser(const Invocation &inv, const std::string &name, int refusal,
+                                        int *status) {
+    const UserRecord user = RequireUser(inv, name, status);
+    if (!user) {
+        return nullptr;
+    }
+    std::string error;
+    std::unique_ptr<UserIdentity> identity = UserIdentity::Assume(*user, &error);
+    if (!identity) {
+        *status = ReportFailure(inv, refusal, error);
+    }
+    return identity;
+}
+
 void WarnIfUnknownUser(const std::string &name) {
     if (!LookUpUser(name.c_str()) && VLIBCErrGet() == QUIB_ERR_NO_SUCH_USER) {
         std::cerr << "norvo: warning: no account named " << TerminalSafe(name) << '\n';

@@ -178,14 +178,9 @@ int RunSearch(const Invocation &inv) {
 int RunSearchResults(const Invocation &inv) {
     const std::string userName = *inv.Value("user");
     int status = kExitFailure;
-    UserRecord user = RequireUser(inv, userName, &status);
-    if (!user) {
-        return status;
-    }
-    std::string error;
-    std::unique_ptr<UserIdentity> identity = UserIdentity::Assume(*user, &error);
+    const std::unique_ptr<UserIdentity> identity = ActAsUser(inv, userName, 401, &status);
     if (!identity) {
-        return ReportFailure(inv, 401, error);
+        return status;
     }
     const std::string id = *inv.Value("task");
     OBX::TaskMgr mgr(userName.c_str());

@@ -81,15 +81,10 @@ int RunSubdirs(const Invocation &inv) {
     const std::string &userName = *inv.Value("user");
     const std::string &path = inv.arguments[0];
     int status = kExitFailure;
-    UserRecord user = RequireUser(inv, userName, &status);
-    if (!user) {
-        return status;
-    }
     // As the user: the folder must be one the user may enter and read.
-    std::string error;
-    std::unique_ptr<UserIdentity> identity = UserIdentity::Assume(*user, &error);
+    std::unique_ptr<UserIdentity> identity = ActAsUser(inv, userName, NVO_ERR_SYSTEM, &status);
     if (!identity) {
-        return ReportFailure(inv, NVO_ERR_SYSTEM, error);
+        return status;
     }
     std::vector<_tag_SUBDIR_ENTRY_INFO_> folders;
     const int listed = NvoLibEnumSubDir(path, folders);
